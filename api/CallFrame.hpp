@@ -1,0 +1,81 @@
+// The one shape of the exported functions: no exception passes, and each is recorded where its
+// function says.
+#ifndef BRENIXCODER_API_CALLFRAME_HPP
+#define BRENIXCODER_API_CALLFRAME_HPP
+
+#include "brenixcoder/coder.h"
+#include "channel/Channel.hpp"
+#include "channel/Exceptions.hpp"
+#include "util/Arguments.hpp"
+
+namespace brenixcoder
+{
+
+/// Runs the body. On an exception runs `onFailure` inside the handler and returns 0, else 1.
+template <typename Body, typename OnFailure>
+int guarded(Body&& body, OnFailure&& onFailure) noexcept
+{
+    try {
+        body();
+        return 1;
+    } catch (...) {
+        onFailure();
+        return 0;
+    }
+}
+
+/// Runs the body with the channel and records an exception as its last error. A null channel fails
+/// and nothing else.
+template <typename Body>
+int callKeepingLastError(void* handle, Body&& body) noexcept
+{
+    auto* const channel = static_cast<Channel*>(handle);
+    if (channel == nullptr) {
+        return 0;
+    }
+    return guarded([&] { body(*channel); }, [&] { channel->recordLastError(); });
+}
+
+/// The call frame: clears the channel's last error first.
+template <typename Body>
+int callChannel(void* handle, Body&& body) noexcept
+{
+    if (handle != nullptr) {
+        static_cast<Channel*>(handle)->clearLastError();
+    }
+    return callKeepingLastError(handle, body);
+}
+
+/// The call frame on the channel that owns a stream.
+template <typename Body>
+int callStream(void* handle, Body&& body) noexcept
+{
+    auto* const stream = static_cast<Stream*>(handle);
+    return callChannel(stream == nullptr ? nullptr : &stream->getChannel(),
+                       [&](Channel&) { body(*stream); });
+}
+
+/// The call frame for a query, whose answer is written only when there is one.
+template <typename Value, typename Query>
+int queryStream(void* handle, Value* answer, const char* argument, Query query) noexcept
+{
+    return callStream(handle, [&](Stream& stream) {
+        requireArgument(answer, argument);
+        *answer = static_cast<Value>((stream.*query)());
+    });
+}
+
+/// A stream handle as one of the direction that the function needs.
+template <typename Directed, StreamDirection direction>
+Directed& directed(Stream& stream)
+{
+    auto* const found = dynamic_cast<Directed*>(&stream);
+    if (found == nullptr) {
+        throwNotSupported(direction);
+    }
+    return *found;
+}
+
+} // namespace brenixcoder
+
+#endif

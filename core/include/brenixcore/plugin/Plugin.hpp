@@ -1,0 +1,144 @@
+/// @file
+/// What a plug-in implements. A plug-in is one shared library that defines one device, converter or
+/// filter and exports it with one of the macros at the end:
+///
+///     class Silence : public brenixcore::plugin::Device { ... };
+///     BRENIXCORE_EXPORT_DEVICE(Silence)
+///
+/// It is built with hidden visibility, C++17 or later, and links neither brenixcore nor
+/// brenixcoder. Any operation may throw a std::exception; its text reaches the caller, or, from a
+/// thread of the core, becomes an "error" event.
+#ifndef BRENIXCORE_PLUGIN_PLUGIN_HPP
+#define BRENIXCORE_PLUGIN_PLUGIN_HPP
+
+#include "brenixcore/plugin/Packet.hpp"
+#include "brenixplugin/Property.hpp"
+
+#include <cstdint>
+#include <optional>
+#include <stdexcept>
+#include <string>
+
+#define BRENIXCORE_PLUGIN_SHARED __attribute__((visibility("default")))
+
+namespace brenixcore::plugin
+{
+
+/// The version of everything in this file. A plug-in made for another version is not loaded.
+constexpr std::uint32_t abiVersion = 1;
+
+/// How a device reports to its channel, from any thread, from its init() to its term().
+class BRENIXCORE_PLUGIN_SHARED DeviceHost
+{
+public:
+    /// Raises an event. `name` is "error", "warning" or "trace". On the thread that is inside an
+    /// operation of the channel, an error throws, and the exception must pass through the device.
+    virtual void raise(const char* name, const char* identifier, const char* message) = 0;
+
+    /// Gives a property that init() delivered a new value.
+    virtual void updateProperty(brenixplugin::OwnedProperty property) = 0;
+
+protected:
+    ~DeviceHost() = default;
+};
+
+/// The streams as a device's worker thread sees them.
+class BRENIXCORE_PLUGIN_SHARED DeviceStreams
+{
+public:
+    /// Puts a packet of at least one count into the input stream, waiting while there is no room.
+    /// Returns false when the channel is closing and the packet was dropped: run() should return,
+    /// or, if the device has output, go on with pull().
+    virtual bool push(Packet packet) = 0;
+
+    /// Takes the next packet from the output stream, waiting for one. Returns nothing when the
+    /// channel is closing and all output was taken: run() must return.
+    virtual std::optional<Packet> pull() = 0;
+
+protected:
+    ~DeviceStreams() = default;
+};
+
+/// What a device has in one direction.
+struct StreamInfo {
+    std::uint64_t countDimension = 1; ///< the dimension of the data along which it counts
+};
+
+struct DeviceInfo {
+    std::optional<StreamInfo> input;
+    std::optional<StreamInfo> output;
+};
+
+/// A device. All operations but run() are called on the thread that uses the channel.
+class BRENIXCORE_PLUGIN_SHARED Device
+{
+public:
+    virtual ~Device() = default;
+
+    /// Prepares the device and tells which streams it has. Puts its properties, one object under
+    /// each name, into `properties`, which takes them over. The options are to be read during the
+    /// call, as everywhere; `host` is valid until term() returns.
+    virtual DeviceInfo init(const brenixplugin::PropertyMap& options,
+                            brenixplugin::PropertyMap& properties, DeviceHost& host) = 0;
+
+    /// Before run().
+    virtual void open(const brenixplugin::PropertyMap& /*options*/) {}
+
+    /// Moves the data, on a thread of the core. When it returns or throws, the device is done.
+    virtual void run(DeviceStreams& streams) = 0;
+
+    /// Runs a command, possibly while run() is busy.
+    virtual void execute(const std::string& command, const brenixplugin::PropertyMap& /*options*/)
+    {
+        throw std::invalid_argument("Unknown command: " + command);
+    }
+
+    /// After run() has returned.
+    virtual void close() {}
+
+    /// Releases what init() prepared; may be followed by another init().
+    virtual void term() {}
+};
+
+/// Converts between the device's packets and the caller's fields, on the thread that uses the
+/// channel.
+class BRENIXCORE_PLUGIN_SHARED Converter
+{
+public:
+    virtual ~Converter() = default;
+    virtual void convertInput(Packet& packet) = 0;
+    virtual void convertOutput(Packet& packet) = 0;
+};
+
+/// Changes packets on their way: of an input stream on the device's thread, of an output stream on
+/// the thread that uses the channel. Its operations are never called at the same time.
+class BRENIXCORE_PLUGIN_SHARED Filter
+{
+public:
+    virtual ~Filter() = default;
+
+    /// Called with the options that the filter is added with, and again whenever it is tuned.
+    virtual void tune(const brenixplugin::PropertyMap& options) = 0;
+
+    /// May change fields and counts; a packet that is left without counts is dropped.
+    virtual void apply(Packet& packet) = 0;
+};
+
+} // namespace brenixcore::plugin
+
+/// Exports the plug-in's class, which has a default constructor.
+#define BRENIXCORE_EXPORT_DEVICE(Class) BRENIXCORE_EXPORT_PLUGIN(Device, Class)
+#define BRENIXCORE_EXPORT_CONVERTER(Class) BRENIXCORE_EXPORT_PLUGIN(Converter, Class)
+#define BRENIXCORE_EXPORT_FILTER(Class) BRENIXCORE_EXPORT_PLUGIN(Filter, Class)
+
+#define BRENIXCORE_EXPORT_PLUGIN(Kind, Class)                                                      \
+    extern "C" BRENIXCORE_PLUGIN_SHARED std::uint32_t brenixcorePluginAbiVersion()                 \
+    {                                                                                              \
+        return brenixcore::plugin::abiVersion;                                                     \
+    }                                                                                              \
+    extern "C" BRENIXCORE_PLUGIN_SHARED brenixcore::plugin::Kind* brenixcoreCreate##Kind()         \
+    {                                                                                              \
+        return new Class;                                                                          \
+    }
+
+#endif

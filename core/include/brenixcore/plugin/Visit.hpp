@@ -1,0 +1,68 @@
+/// @file
+/// From a property object to its concrete class.
+#ifndef BRENIXCORE_PLUGIN_VISIT_HPP
+#define BRENIXCORE_PLUGIN_VISIT_HPP
+
+#include "brenixplugin/Property.hpp"
+
+#include <string>
+
+namespace brenixcore::plugin
+{
+
+namespace detail
+{
+
+template <typename Property, typename Visitor>
+bool visitAs(brenixplugin::interfaces::IPropertyInfo* property, Visitor& visitor)
+{
+    auto* const concrete = dynamic_cast<Property*>(property);
+    if (concrete == nullptr) {
+        return false;
+    }
+    visitor(*concrete);
+    return true;
+}
+
+template <typename T, typename Visitor>
+bool visitElement(brenixplugin::interfaces::IPropertyInfo* property, Visitor& visitor)
+{
+    using namespace brenixplugin::kit;
+    return visitAs<coderconverter::TPointerProperty<T>>(property, visitor) ||
+           visitAs<device::TScalarProperty<T>>(property, visitor) ||
+           visitAs<device::TVectorProperty<T>>(property, visitor);
+}
+
+template <typename... T>
+struct Elements {
+    template <typename Visitor>
+    static bool visit(brenixplugin::interfaces::IPropertyInfo* property, Visitor& visitor)
+    {
+        return (visitElement<T>(property, visitor) || ...);
+    }
+};
+
+using Numbers = Elements<double, float, unsigned long, long, unsigned int, int, unsigned short,
+                         short, unsigned char, signed char>;
+using Others = Elements<bool, std::u16string, std::string>;
+
+} // namespace detail
+
+/// Calls the visitor with a numeric property as its concrete class: a TPointerProperty<T>,
+/// TScalarProperty<T> or TVectorProperty<T>. Returns whether it is one; null is none.
+template <typename Visitor>
+bool visitNumbers(brenixplugin::interfaces::IPropertyInfo* property, Visitor&& visitor)
+{
+    return detail::Numbers::visit(property, visitor);
+}
+
+/// The same for every class: numbers, bool, std::u16string and std::string.
+template <typename Visitor>
+bool visitProperty(brenixplugin::interfaces::IPropertyInfo* property, Visitor&& visitor)
+{
+    return detail::Numbers::visit(property, visitor) || detail::Others::visit(property, visitor);
+}
+
+} // namespace brenixcore::plugin
+
+#endif

@@ -1,0 +1,14 @@
+#include "Converter.hpp"
+
+namespace brenixcore
+{
+
+Converter::Converter(const std::string& converterPath)
+    : impl(new Impl{loadPlugin<plugin::Converter, CouldNotLoadConverter, CouldNotCreateConverter>(
+          converterPath, "brenixcoreCreateConverter")})
+{
+}
+
+Converter::~Converter() = default;
+
+} // namespace brenixcore

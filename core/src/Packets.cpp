@@ -1,0 +1,107 @@
+#include "Packets.hpp"
+
+#include "brenixcore/plugin/Visit.hpp"
+
+#include <algorithm>
+#include <memory>
+#include <stdexcept>
+#include <string>
+
+namespace brenixcore
+{
+
+namespace
+{
+
+using namespace brenixplugin;
+using brenixplugin::kit::coderconverter::TPointerProperty;
+using brenixplugin::kit::device::TScalarProperty;
+using brenixplugin::kit::device::TVectorProperty;
+
+/// The elements of count `first` to `first + length` of a property that holds `counts` counts, or
+/// all of them where they do not divide.
+struct Range {
+    Range(std::uint64_t first, std::uint64_t length, std::uint64_t counts, std::uint64_t elements)
+        : size(elements)
+    {
+        if (elements % counts == 0) {
+            begin = elements / counts * first;
+            size = elements / counts * length;
+        }
+    }
+    std::uint64_t begin = 0;
+    std::uint64_t size;
+};
+
+struct Slicer {
+    std::uint64_t first;
+    std::uint64_t length;
+    std::uint64_t counts;
+    OwnedProperty result;
+    std::uint64_t elements = 0; ///< in the whole property
+
+    template <typename T>
+    void operator()(const TScalarProperty<T>& scalar)
+    {
+        elements = 1;
+        result.reset(new TScalarProperty<T>(scalar.name, scalar.value));
+    }
+
+    template <typename T>
+    void operator()(const TPointerProperty<T>& array)
+    {
+        elements = array.count;
+        const Range range(first, length, counts, array.count);
+        std::unique_ptr<T[]> copy(new T[range.size]);
+        std::copy_n(array.data + range.begin, range.size, copy.get());
+        result.reset(new TPointerProperty<T>(array.name, copy.get(), range.size));
+        copy.release();
+    }
+
+    template <typename T>
+    void operator()(const TVectorProperty<T>& vector)
+    {
+        elements = vector.values.size();
+        const Range range(first, length, counts, elements);
+        auto copy = std::make_unique<TVectorProperty<T>>(vector.name, range.size);
+        std::copy_n(vector.values.begin() + static_cast<std::ptrdiff_t>(range.begin), range.size,
+                    copy->values.begin());
+        result.reset(copy.release());
+    }
+};
+
+Slicer sliceField(const std::string& name, void* property, Slicer slicer)
+{
+    if (!plugin::visitProperty(asProperty(property), slicer)) {
+        throw std::runtime_error("Field " + name + " is of a class that cannot be copied.");
+    }
+    return slicer;
+}
+
+} // namespace
+
+plugin::Packet slice(const plugin::Packet& packet, std::uint64_t first, std::uint64_t length)
+{
+    plugin::Packet part;
+    part.counts = length;
+    for (const auto& [name, property] : *packet.fields) {
+        Slicer slicer = sliceField(name, property, {first, length, packet.counts, nullptr});
+        storeProperty(*part.fields, name, std::move(slicer.result));
+    }
+    return part;
+}
+
+plugin::Packet copyFields(const PropertyMap& fields)
+{
+    plugin::Packet copy;
+    for (const auto& [name, property] : fields) {
+        Slicer slicer = sliceField(name, property, {0, 1, 1, nullptr});
+        storeProperty(*copy.fields, name, std::move(slicer.result));
+        if (copy.counts == 0) {
+            copy.counts = slicer.elements;
+        }
+    }
+    return copy;
+}
+
+} // namespace brenixcore

@@ -1,0 +1,83 @@
+#include "Plugin.hpp"
+
+#include <dlfcn.h>
+
+#include <cstdint>
+#include <stdexcept>
+
+namespace brenixcore
+{
+
+namespace
+{
+
+/// The folder of the plug-ins, beside this library.
+std::string pluginFolder()
+{
+    Dl_info info{};
+    if (dladdr(reinterpret_cast<const void*>(&pluginFolder), &info) == 0) {
+        throw std::runtime_error("the folder of this library is not known");
+    }
+    const std::string library = info.dli_fname;
+    return library.substr(0, library.rfind('/') + 1) + "brenix-plugins/";
+}
+
+std::string loaderError()
+{
+    const char* const text = dlerror();
+    return text == nullptr ? "the reason is not known" : text;
+}
+
+std::string pluginPath(const std::string& name)
+{
+    return name.find('/') != std::string::npos ? name : pluginFolder() + name + ".so";
+}
+
+} // namespace
+
+void PluginLibrary::Unload::operator()(void* library) const noexcept
+{
+    dlclose(library);
+}
+
+PluginLibrary::PluginLibrary(const std::string& name) : path(pluginPath(name))
+{
+    // dlopen is declared not to throw, but a static object of the plug-in may, and then the
+    // exception must find its way.
+    void* (*const volatile open)(const char*, int) = dlopen;
+    handle.reset(open(path.c_str(), RTLD_NOW | RTLD_LOCAL));
+    if (!handle) {
+        throw std::runtime_error(loaderError());
+    }
+}
+
+void PluginLibrary::requireAbiVersion() const
+{
+    const std::uint32_t version = function<std::uint32_t()>("brenixcorePluginAbiVersion")();
+    if (version != plugin::abiVersion) {
+        throw std::runtime_error("it has plug-in ABI version " + std::to_string(version) +
+                                 ", needed is " + std::to_string(plugin::abiVersion));
+    }
+}
+
+void* PluginLibrary::address(const char* symbol) const
+{
+    void* const found = dlsym(handle.get(), symbol);
+    if (found == nullptr) {
+        throw std::runtime_error(loaderError());
+    }
+    return found;
+}
+
+std::string currentExceptionText()
+{
+    try {
+        throw;
+    } catch (const std::exception& exception) {
+        return exception.what();
+    } catch (...) {
+        return "Unrecognized error.";
+    }
+}
+
+} // namespace brenixcore

@@ -1,0 +1,88 @@
+// Loading of plug-ins.
+#ifndef BRENIXCORE_SRC_PLUGIN_HPP
+#define BRENIXCORE_SRC_PLUGIN_HPP
+
+#include "brenixcore/Exceptions.hpp"
+#include "brenixcore/plugin/Plugin.hpp"
+
+#include <exception>
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+
+/// For the implementations of exported classes, which are not exported themselves.
+#define BRENIXCORE_INTERNAL __attribute__((visibility("hidden")))
+
+namespace brenixcore
+{
+
+/// A loaded shared library; unloads it.
+class PluginLibrary
+{
+public:
+    /// Loads the plug-in named by a path with a slash, or by a bare name in the plug-in folder.
+    /// Throws std::runtime_error with the reason.
+    explicit PluginLibrary(const std::string& name);
+
+    /// Throws std::runtime_error with both versions when the plug-in was made for another.
+    void requireAbiVersion() const;
+
+    /// An exported function; throws std::runtime_error when there is none of that name.
+    template <typename Function>
+    Function* function(const char* symbol) const
+    {
+        return reinterpret_cast<Function*>(address(symbol));
+    }
+
+    const std::string& getPath() const { return path; }
+
+private:
+    struct Unload {
+        void operator()(void* library) const noexcept;
+    };
+
+    void* address(const char* symbol) const;
+
+    std::string path;
+    std::unique_ptr<void, Unload> handle;
+};
+
+/// The object of a plug-in, and its library, which must outlive all that the object made.
+template <typename Interface>
+struct LoadedPlugin {
+    PluginLibrary library;
+    std::unique_ptr<Interface> object;
+};
+
+/// Text of the exception in flight. Only inside a catch handler, while the module that threw is
+/// loaded.
+std::string currentExceptionText();
+
+/// Loads a plug-in and makes its object. Whatever goes wrong becomes one of the two exceptions
+/// while the library, to which an exception may belong, is still loaded.
+template <typename Interface, typename LoadError, typename CreateError>
+LoadedPlugin<Interface> loadPlugin(const std::string& name, const char* factory)
+{
+    std::optional<PluginLibrary> library;
+    try {
+        library.emplace(name);
+        library->requireAbiVersion();
+    } catch (...) {
+        throw LoadError("Could not load " + name + ": " + currentExceptionText());
+    }
+    std::unique_ptr<Interface> object;
+    try {
+        object.reset(library->template function<Interface*()>(factory)());
+        if (!object) {
+            throw std::runtime_error("the factory returned nothing");
+        }
+    } catch (...) {
+        throw CreateError("Could not create " + library->getPath() + ": " + currentExceptionText());
+    }
+    return {*std::move(library), std::move(object)};
+}
+
+} // namespace brenixcore
+
+#endif

@@ -1,0 +1,372 @@
+#include "Stream.hpp"
+
+#include "Packets.hpp"
+
+#include <algorithm>
+#include <stdexcept>
+#include <string>
+#include <utility>
+
+namespace brenixcore
+{
+
+using brenixplugin::PropertyMap;
+
+// --- The queue ---
+
+void Stream::Impl::setPhase(Phase newPhase)
+{
+    const std::lock_guard lock(mutex);
+    phase = newPhase;
+    if (phase == Phase::Open) {
+        deviceDone = false;
+    }
+    changed.notify_all();
+}
+
+void Stream::Impl::setDeviceDone()
+{
+    const std::lock_guard lock(mutex);
+    deviceDone = true;
+    changed.notify_all();
+}
+
+void Stream::Impl::setTimeout(double seconds)
+{
+    using namespace std::chrono;
+    constexpr double longest = 1e9; // more than a clock's range is as good as for ever
+    const std::lock_guard lock(mutex);
+    timeout.reset();
+    if (seconds < longest) {
+        timeout = duration_cast<steady_clock::duration>(duration<double>(seconds));
+    }
+}
+
+bool Stream::Impl::push(plugin::Packet packet)
+{
+    const std::uint64_t size = packet.counts;
+    for (std::uint64_t pushed = 0; pushed < size;) {
+        const std::uint64_t rest = size - pushed;
+        // Room for a part is used only where waiting for more would never end: by a packet beyond
+        // the limit, or while a read waits for more counts than are there.
+        const auto fitsPartly = [&] { return counts < limit && (counts == 0 || wanted > counts); };
+        std::unique_lock lock(mutex);
+        changed.wait(lock, [&] { return fits(rest) || fitsPartly() || phase != Phase::Open; });
+        if (phase == Phase::Stopping || (!fits(rest) && !fitsPartly())) {
+            return false;
+        }
+        changed.notify_all();
+        if (pushed == 0 && fits(size)) {
+            packets.push_back({std::move(packet)});
+            counts += size;
+            return true;
+        }
+        const std::uint64_t part = std::min(rest, limit - counts);
+        packets.push_back({slice(packet, pushed, part)});
+        pushed += part;
+        counts += part;
+    }
+    return true;
+}
+
+std::optional<plugin::Packet> Stream::Impl::pull()
+{
+    std::unique_lock lock(mutex);
+    changed.wait(lock, [&] { return !packets.empty() || phase != Phase::Open; });
+    if (packets.empty() || phase == Phase::Stopping) {
+        return std::nullopt;
+    }
+    plugin::Packet packet = std::move(packets.front().packet);
+    packets.pop_front();
+    counts -= packet.counts;
+    changed.notify_all();
+    return packet;
+}
+
+Stream::Impl::Packets Stream::Impl::take(std::uint64_t count)
+{
+    Packets result;
+    try {
+        for (std::uint64_t missing = count; missing > 0;) {
+            QueuedPacket& front = packets.front();
+            const std::uint64_t part = std::min(missing, front.counts());
+            if (part < front.packet.counts) {
+                result.push_back({slice(front.packet, front.taken, part), 0, front.converted});
+                front.taken += part;
+                if (front.counts() == 0) {
+                    packets.pop_front();
+                }
+            } else {
+                result.splice(result.end(), packets, packets.begin());
+            }
+            missing -= part;
+        }
+    } catch (...) {
+        packets.splice(packets.begin(), result);
+        throw;
+    }
+    counts -= count;
+    return result;
+}
+
+void Stream::Impl::putBack(Packets& taken) noexcept
+{
+    const std::lock_guard lock(mutex);
+    for (const QueuedPacket& queued : taken) {
+        counts += queued.counts();
+    }
+    packets.splice(packets.begin(), taken);
+}
+
+Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
+{
+    std::unique_lock lock(mutex);
+    const auto refuse = [&](const std::string& why) {
+        throw SynchronousInputNotPossible("Cannot read " + std::to_string(count) +
+                                          " counts: " + why + ".");
+    };
+    if (count > limit) {
+        refuse("the limit is " + std::to_string(limit));
+    }
+    wanted = count;
+    changed.notify_all();
+    wait(lock, [&] { return counts >= count; });
+    wanted = 0;
+    if (counts < count) {
+        refuse("there are " + std::to_string(counts) + " and " + reason());
+    }
+    Packets taken = take(count);
+    changed.notify_all();
+    return taken;
+}
+
+const char* Stream::Impl::reason() const
+{
+    if (phase != Phase::Open) {
+        return "the channel is not open";
+    }
+    return deviceDone ? "the device is done" : "the time is over";
+}
+
+// --- Filters ---
+
+void Stream::Impl::addFilter(const std::string& name, const PropertyMap& options)
+{
+    if (const std::lock_guard lock(mutex); phase != Phase::Closed) {
+        throw CannotAddFilterWhileOpen("Cannot add filter " + name + " while the channel is open.");
+    }
+    auto loaded = loadPlugin<plugin::Filter, CouldNotLoadFilter, CouldNotCreateFilter>(
+        name, "brenixcoreCreateFilter");
+    libraries.push_back(std::move(loaded.library));
+    loaded.object->tune(options);
+    const std::lock_guard lock(filterMutex);
+    filters.push_back(std::move(loaded.object));
+}
+
+void Stream::Impl::tuneFilters(const PropertyMap& options)
+{
+    const std::lock_guard lock(filterMutex);
+    for (const auto& filter : filters) {
+        filter->tune(options);
+    }
+}
+
+void Stream::Impl::applyFilters(plugin::Packet& packet)
+{
+    const std::lock_guard lock(filterMutex);
+    for (const auto& filter : filters) {
+        if (packet.counts > 0) {
+            filter->apply(packet);
+        }
+    }
+}
+
+// --- Both directions ---
+
+Stream::Stream(std::unique_ptr<Impl> state) : impl(std::move(state)) {}
+
+Stream::~Stream() = default;
+
+bool Stream::isInput() const
+{
+    return false;
+}
+
+void Stream::addFilter(const std::string& filterName, const PropertyMap& options)
+{
+    const OwnedOptions owned(options);
+    impl->addFilter(filterName, options);
+}
+
+void Stream::tuneFilters(const PropertyMap& options)
+{
+    const OwnedOptions owned(options);
+    impl->tuneFilters(options);
+}
+
+void Stream::flush()
+{
+    Impl::Packets discarded;
+    const std::lock_guard lock(impl->mutex);
+    discarded.swap(impl->packets);
+    impl->counts = 0;
+    impl->changed.notify_all();
+}
+
+bool Stream::isOpen() const
+{
+    const std::lock_guard lock(impl->mutex);
+    return impl->phase != Phase::Closed;
+}
+
+bool Stream::isUnlimited() const
+{
+    return impl->limit == UINT64_MAX;
+}
+
+unsigned long Stream::getDataAvailable() const
+{
+    const std::lock_guard lock(impl->mutex);
+    return impl->counts;
+}
+
+unsigned long Stream::getSpaceAvailable() const
+{
+    const std::lock_guard lock(impl->mutex);
+    return impl->limit - std::min(impl->limit, impl->counts);
+}
+
+// --- Input ---
+
+InputStream::InputStream(std::unique_ptr<Impl> state) : Stream(std::move(state)) {}
+
+InputStream::~InputStream() = default;
+
+bool InputStream::isInput() const
+{
+    return true;
+}
+
+bool InputStream::isDeviceDone() const
+{
+    const std::lock_guard lock(impl->mutex);
+    return impl->deviceDone;
+}
+
+unsigned long InputStream::getCountDimension() const
+{
+    return impl->info.countDimension;
+}
+
+void InputStream::peekCounts(unsigned long limit, unsigned long& total,
+                             std::vector<unsigned long>& counts)
+{
+    const std::lock_guard lock(impl->mutex);
+    total = 0;
+    for (const QueuedPacket& queued : impl->packets) {
+        if (total == limit) {
+            break;
+        }
+        counts.push_back(std::min(limit - total, queued.counts()));
+        total += counts.back();
+    }
+}
+
+void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigned long& countRead)
+{
+    Impl& stream = *impl;
+    // Whatever is not delivered below goes back to where it was.
+    struct Taken {
+        ~Taken()
+        {
+            if (!packets.empty()) {
+                stream.putBack(packets);
+            }
+        }
+        Impl& stream;
+        Impl::Packets packets;
+    } taken{stream, stream.takeInTime(count)};
+
+    buffers.reserve(taken.packets.size());
+    for (auto current = taken.packets.begin(); current != taken.packets.end(); ++current) {
+        if (current->converted) {
+            continue;
+        }
+        try {
+            stream.converter.convertInput(current->packet);
+            current->converted = true;
+        } catch (...) {
+            const std::string reason = currentExceptionText();
+            taken.packets.erase(current);
+            throw CouldNotConvertInputData(reason);
+        }
+    }
+    for (QueuedPacket& queued : taken.packets) {
+        buffers.push_back(queued.packet.fields.release());
+    }
+    taken.packets.clear();
+    countRead = count;
+}
+
+// --- Output ---
+
+OutputStream::OutputStream(std::unique_ptr<Impl> state) : Stream(std::move(state)) {}
+
+OutputStream::~OutputStream() = default;
+
+bool OutputStream::isInput() const
+{
+    return false;
+}
+
+bool OutputStream::isDeviceDone() const
+{
+    const std::lock_guard lock(impl->mutex);
+    return impl->deviceDone;
+}
+
+unsigned long OutputStream::getCountDimension() const
+{
+    return impl->info.countDimension;
+}
+
+unsigned long OutputStream::write(const std::vector<void*>& dataList)
+{
+    Impl& stream = *impl;
+    Impl::Packets outgoing;
+    std::uint64_t written = 0; // counts as the caller wrote them
+    std::uint64_t size = 0;    // counts as they leave the converter and the filters
+    for (const void* buffer : dataList) {
+        plugin::Packet packet = copyFields(*static_cast<const PropertyMap*>(buffer));
+        written += packet.counts;
+        try {
+            stream.converter.convertOutput(packet);
+            stream.applyFilters(packet);
+        } catch (...) {
+            throw CouldNotConvertOutputData(currentExceptionText());
+        }
+        size += packet.counts;
+        if (packet.counts > 0) {
+            outgoing.push_back({std::move(packet)});
+        }
+    }
+
+    std::unique_lock lock(stream.mutex);
+    const auto refuse = [&](const std::string& why) {
+        throw SynchronousOutputNotPossible("Cannot write " + std::to_string(size) +
+                                           " counts: " + why + ".");
+    };
+    if (size > stream.limit) {
+        refuse("the limit is " + std::to_string(stream.limit));
+    }
+    stream.wait(lock, [&] { return stream.fits(size); });
+    if (stream.deviceDone || !stream.fits(size)) {
+        refuse(std::string("there is no room and ") + stream.reason());
+    }
+    stream.packets.splice(stream.packets.end(), outgoing);
+    stream.counts += size;
+    stream.changed.notify_all();
+    return written;
+}
+
+} // namespace brenixcore

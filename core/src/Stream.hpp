@@ -1,0 +1,124 @@
+#ifndef BRENIXCORE_SRC_STREAM_HPP
+#define BRENIXCORE_SRC_STREAM_HPP
+
+#include "Plugin.hpp"
+#include "brenixcore/Stream.hpp"
+
+#include <chrono>
+#include <condition_variable>
+#include <cstdint>
+#include <list>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace brenixcore
+{
+
+/// What a stream is doing. Data waits in every phase.
+enum class Phase {
+    Closed,   ///< the device is not there: nothing waits
+    Open,     ///< both sides wait for each other
+    Draining, ///< closing: the device takes what is left, and nothing waits
+    Stopping  ///< closing: the device gets and delivers nothing more
+};
+
+/// A waiting packet of which the first `taken` counts are gone.
+struct QueuedPacket {
+    plugin::Packet packet;
+    std::uint64_t taken = 0;
+    bool converted = false;
+
+    std::uint64_t counts() const { return packet.counts - taken; }
+};
+
+/// Releases the option objects that an operation of the core takes over.
+struct OwnedOptions {
+    explicit OwnedOptions(const brenixplugin::PropertyMap& optionMap) : options(optionMap) {}
+    OwnedOptions(const OwnedOptions&) = delete;
+    OwnedOptions& operator=(const OwnedOptions&) = delete;
+    ~OwnedOptions() { brenixplugin::releaseProperties(options); }
+
+    const brenixplugin::PropertyMap& options;
+};
+
+/// The queue of packets between a device's thread and the caller's, which both streams are. Packets
+/// are list nodes, so that moving them from one list to another cannot fail.
+struct BRENIXCORE_INTERNAL Stream::Impl {
+    using Packets = std::list<QueuedPacket>;
+
+    Impl(plugin::Converter& streamConverter, std::list<PluginLibrary>& pluginLibraries,
+         std::uint64_t countLimit, plugin::StreamInfo streamInfo)
+        : converter(streamConverter), libraries(pluginLibraries), limit(countLimit),
+          info(streamInfo)
+    {
+    }
+
+    /// Starts a phase and wakes whoever waits. A device that starts is not done.
+    void setPhase(Phase newPhase);
+    void setDeviceDone();
+
+    /// How long read and write wait: seconds, infinity for ever.
+    void setTimeout(double seconds);
+
+    /// For the device's thread; see plugin::DeviceStreams.
+    bool push(plugin::Packet packet);
+    std::optional<plugin::Packet> pull();
+
+    void addFilter(const std::string& name, const brenixplugin::PropertyMap& options);
+    void tuneFilters(const brenixplugin::PropertyMap& options);
+    void applyFilters(plugin::Packet& packet);
+
+    /// Whether the other side may still take or bring data. Under the mutex.
+    bool isFlowing() const { return phase == Phase::Open && !deviceDone; }
+
+    /// Whether `more` counts have room. Under the mutex.
+    bool fits(std::uint64_t more) const { return counts <= limit && more <= limit - counts; }
+
+    /// Waits until the condition holds or, by phase, device or time, will not. Under the mutex.
+    template <typename Condition>
+    void wait(std::unique_lock<std::mutex>& lock, const Condition& condition)
+    {
+        const auto over = [&] { return condition() || !isFlowing(); };
+        if (timeout) {
+            changed.wait_for(lock, *timeout, over);
+        } else {
+            changed.wait(lock, over);
+        }
+    }
+
+    /// Takes the `count` oldest counts: waits for them, or throws SynchronousInputNotPossible.
+    Packets takeInTime(std::uint64_t count);
+
+    /// Takes the `count` oldest counts, which are there. Under the mutex.
+    Packets take(std::uint64_t count);
+
+    /// Puts packets that were taken back in their place.
+    void putBack(Packets& taken) noexcept;
+
+    /// Why a wait ended without what it waited for. Under the mutex.
+    const char* reason() const;
+
+    plugin::Converter& converter;
+    std::list<PluginLibrary>& libraries; ///< outlive every packet that a filter touched
+    const std::uint64_t limit;
+    const plugin::StreamInfo info;
+
+    std::mutex filterMutex; ///< guards the filters
+    std::vector<std::unique_ptr<plugin::Filter>> filters;
+
+    mutable std::mutex mutex; ///< guards what follows
+    std::condition_variable changed;
+    Phase phase = Phase::Closed;
+    bool deviceDone = false;
+    std::optional<std::chrono::steady_clock::duration> timeout;
+    Packets packets;
+    std::uint64_t counts = 0; ///< in `packets`
+    std::uint64_t wanted = 0; ///< that a read is waiting for
+};
+
+} // namespace brenixcore
+
+#endif

@@ -1,0 +1,232 @@
+// Device `audiofile`: reads a sound file into the input stream, or writes one from the output
+// stream. A count is a frame: one sample of each channel, interleaved in the field "data" as
+// double, full scale from -1 to 1.
+
+#include "brenixcore/plugin/Options.hpp"
+#include "brenixcore/plugin/Plugin.hpp"
+
+#include <sndfile.h>
+
+#include <algorithm>
+#include <array>
+#include <cctype>
+#include <memory>
+#include <stdexcept>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+namespace
+{
+
+using namespace brenixcore::plugin;
+using brenixplugin::OwnedProperty;
+using brenixplugin::PropertyMap;
+using brenixplugin::kit::coderconverter::TPointerProperty;
+using brenixplugin::kit::device::TScalarProperty;
+
+struct SampleFormat {
+    std::string_view name;
+    int subtype;
+};
+
+constexpr std::array sampleFormats = {
+    SampleFormat{"PCM_S8", SF_FORMAT_PCM_S8}, SampleFormat{"PCM_U8", SF_FORMAT_PCM_U8},
+    SampleFormat{"PCM_16", SF_FORMAT_PCM_16}, SampleFormat{"PCM_24", SF_FORMAT_PCM_24},
+    SampleFormat{"PCM_32", SF_FORMAT_PCM_32}, SampleFormat{"FLOAT", SF_FORMAT_FLOAT},
+    SampleFormat{"DOUBLE", SF_FORMAT_DOUBLE}, SampleFormat{"ULAW", SF_FORMAT_ULAW},
+    SampleFormat{"ALAW", SF_FORMAT_ALAW},     SampleFormat{"VORBIS", SF_FORMAT_VORBIS},
+    SampleFormat{"OPUS", SF_FORMAT_OPUS},
+};
+
+/// The container format of a file name's ending; 0 when there is none for it.
+int containerOf(const std::string& fileName)
+{
+    std::string ending = fileName.substr(fileName.rfind('.') + 1);
+    std::transform(ending.begin(), ending.end(), ending.begin(),
+                   [](unsigned char letter) { return static_cast<char>(std::tolower(letter)); });
+    int formats = 0;
+    sf_command(nullptr, SFC_GET_FORMAT_MAJOR_COUNT, &formats, sizeof formats);
+    for (int i = 0; i < formats; ++i) {
+        SF_FORMAT_INFO info{};
+        info.format = i;
+        sf_command(nullptr, SFC_GET_FORMAT_MAJOR, &info, sizeof info);
+        if (info.extension != nullptr && ending == info.extension) {
+            return info.format & SF_FORMAT_TYPEMASK;
+        }
+    }
+    return 0;
+}
+
+class AudioFile : public Device
+{
+public:
+    DeviceInfo init(const PropertyMap& optionMap, PropertyMap& properties,
+                    DeviceHost& host) override
+    {
+        Options options(optionMap);
+        fileName = options.text("FileName").value_or("");
+        if (fileName.empty()) {
+            Options::fail("FileName", "must name a sound file");
+        }
+        const std::string mode = options.text("Mode").value_or("read");
+        if (mode != "read" && mode != "write") {
+            Options::fail("Mode", "must be read or write, not " + mode);
+        }
+        writes = mode == "write";
+        if (writes) {
+            readWriteOptions(options);
+        } else {
+            blockSize = options.wholeNumber("BlockSize", 1, 1L << 24).value_or(1024);
+        }
+        options.requireAllKnown();
+
+        deviceHost = &host;
+        if (!writes) {
+            openFile(); // tells what is in it, and whether it can be read
+        }
+        publish(properties, "SampleRate", static_cast<double>(format.samplerate));
+        publish(properties, "Channels", static_cast<unsigned int>(format.channels));
+        publish(properties, "Frames", static_cast<long>(format.frames));
+        return writes ? DeviceInfo{std::nullopt, StreamInfo{}}
+                      : DeviceInfo{StreamInfo{}, std::nullopt};
+    }
+
+    void open(const PropertyMap& options) override
+    {
+        Options(options).requireAllKnown();
+        openFile();
+    }
+
+    void run(DeviceStreams& streams) override
+    {
+        if (writes) {
+            write(streams);
+        } else {
+            read(streams);
+        }
+    }
+
+    void close() override
+    {
+        if (const int error = sf_close(file.release()); error != SF_ERR_NO_ERROR) {
+            throw std::runtime_error("Could not close " + fileName + ": " + sf_error_number(error));
+        }
+    }
+
+    void term() override { file.reset(); }
+
+private:
+    void readWriteOptions(Options& options)
+    {
+        format = {};
+        format.samplerate =
+            static_cast<int>(options.wholeNumber("SampleRate", 1, 655350).value_or(48000));
+        format.channels = static_cast<int>(options.wholeNumber("Channels", 1, 1024).value_or(1));
+        const std::string name = options.text("SampleFormat").value_or("PCM_16");
+        const auto* const found =
+            std::find_if(sampleFormats.begin(), sampleFormats.end(),
+                         [&](const SampleFormat& candidate) { return candidate.name == name; });
+        if (found == sampleFormats.end()) {
+            Options::fail("SampleFormat", "is not known: " + name);
+        }
+        const int container = containerOf(fileName);
+        if (container == 0) {
+            Options::fail("FileName", "has an ending that names no sound file format: " + fileName);
+        }
+        format.format = container | found->subtype;
+        if (sf_format_check(&format) == 0) {
+            Options::fail("SampleFormat", name + " with this number of channels and this sample " +
+                                              "rate is not possible in " + fileName);
+        }
+    }
+
+    void openFile()
+    {
+        if (!writes) {
+            format = {};
+        }
+        file.reset(sf_open(fileName.c_str(), writes ? SFM_WRITE : SFM_READ, &format));
+        if (!file) {
+            throw std::runtime_error("Could not open " + fileName + ": " + sf_strerror(nullptr));
+        }
+    }
+
+    template <typename T>
+    static void publish(PropertyMap& properties, const std::string& name, T value)
+    {
+        storeProperty(properties, name, OwnedProperty(new TScalarProperty<T>(name, value)));
+    }
+
+    void read(DeviceStreams& streams)
+    {
+        const auto channels = static_cast<std::uint64_t>(format.channels);
+        for (;;) {
+            std::unique_ptr<double[]> samples(
+                new double[static_cast<std::uint64_t>(blockSize) * channels]);
+            const sf_count_t frames = sf_readf_double(file.get(), samples.get(), blockSize);
+            if (const int error = sf_error(file.get()); error != SF_ERR_NO_ERROR) {
+                throw std::runtime_error("Could not read " + fileName + ": " +
+                                         sf_error_number(error));
+            }
+            if (frames <= 0) {
+                return;
+            }
+            Packet packet;
+            packet.counts = static_cast<std::uint64_t>(frames);
+            OwnedProperty data(
+                new TPointerProperty<double>(dataField, samples.get(), packet.counts * channels));
+            samples.release();
+            setField(packet, std::move(data));
+            if (!streams.push(std::move(packet))) {
+                return;
+            }
+        }
+    }
+
+    void write(DeviceStreams& streams)
+    {
+        const auto channels = static_cast<std::uint64_t>(format.channels);
+        std::vector<double> samples; // a frame may be spread over packets
+        while (auto packet = streams.pull()) {
+            const auto data = takeField(*packet, dataField);
+            const auto* const array = dynamic_cast<const TPointerProperty<double>*>(data.get());
+            if (array == nullptr) {
+                deviceHost->raise("error", "brenix:Device:wrongType",
+                                  "Samples to write must be double.");
+                continue;
+            }
+            samples.insert(samples.end(), array->data, array->data + array->count);
+            const std::uint64_t frames = samples.size() / channels;
+            const auto written =
+                sf_writef_double(file.get(), samples.data(), static_cast<sf_count_t>(frames));
+            if (written != static_cast<sf_count_t>(frames)) {
+                throw std::runtime_error("Could not write " + fileName + ": " +
+                                         sf_strerror(file.get()));
+            }
+            samples.erase(samples.begin(),
+                          samples.begin() + static_cast<std::ptrdiff_t>(frames * channels));
+        }
+        if (!samples.empty()) {
+            throw std::runtime_error("The last frame for " + fileName + " has " +
+                                     std::to_string(samples.size()) + " of " +
+                                     std::to_string(channels) + " samples and was not written.");
+        }
+    }
+
+    struct CloseFile {
+        void operator()(SNDFILE* open) const noexcept { sf_close(open); }
+    };
+
+    std::string fileName;
+    bool writes = false;
+    sf_count_t blockSize = 0;
+    SF_INFO format{};
+    std::unique_ptr<SNDFILE, CloseFile> file;
+    DeviceHost* deviceHost = nullptr;
+};
+
+} // namespace
+
+BRENIXCORE_EXPORT_DEVICE(AudioFile)

@@ -1,0 +1,17 @@
+// Converter `identity`: data passes as it is.
+
+#include "brenixcore/plugin/Plugin.hpp"
+
+namespace
+{
+
+class Identity : public brenixcore::plugin::Converter
+{
+public:
+    void convertInput(brenixcore::plugin::Packet& /*packet*/) override {}
+    void convertOutput(brenixcore::plugin::Packet& /*packet*/) override {}
+};
+
+} // namespace
+
+BRENIXCORE_EXPORT_CONVERTER(Identity)

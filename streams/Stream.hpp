@@ -1,0 +1,68 @@
+#ifndef BRENIXCODER_STREAMS_STREAM_HPP
+#define BRENIXCODER_STREAMS_STREAM_HPP
+
+#include "brenixcore/Stream.hpp"
+
+#include <cstdarg>
+#include <cstdint>
+#include <string>
+
+namespace brenixcoder
+{
+
+class Channel;
+
+enum class StreamDirection : int32_t { Input = 0, Output = 1 };
+
+/// The object behind a stream handle. It exists also when the channel has no stream of its
+/// direction; then every operation that needs one throws InputStreamNotSupported or
+/// OutputStreamNotSupported.
+class Stream
+{
+public:
+    Stream(const Stream&) = delete;
+    Stream& operator=(const Stream&) = delete;
+    virtual ~Stream() = default;
+
+    Channel& getChannel() const noexcept { return *channel; }
+    bool isSupported() const noexcept { return coreStream != nullptr; }
+
+    /// Leaves the stream without its core stream, as if the channel had none.
+    void detach() noexcept { coreStream = nullptr; }
+
+    bool isDeviceDone() const;
+    bool isOpen() const;
+    double getCountDimension() const;
+    double getDataAvailable() const;
+    /// Positive infinity for an unlimited stream.
+    double getSpaceAvailable() const;
+    void flush();
+
+    /// The options are `optionCount` groups as buildOptionMap() reads them.
+    void addFilter(const std::string& filterName, uint64_t optionCount, va_list* options);
+    void tuneFilters(uint64_t optionCount, va_list* options);
+
+protected:
+    Stream(brenixcore::Stream* stream, StreamDirection streamDirection, Channel& owner) noexcept
+        : coreStream(stream), direction(streamDirection), channel(&owner)
+    {
+    }
+
+    /// Throws unless there is a core stream; the first step of everything that uses it.
+    void checkSupported() const;
+
+    /// The core stream as that of one direction, after checkSupported().
+    brenixcore::InputStream& coreInput() const;
+    brenixcore::OutputStream& coreOutput() const;
+
+private:
+    brenixcore::Stream* coreStream;
+    StreamDirection direction;
+    Channel* channel;
+};
+
+[[noreturn]] void throwNotSupported(StreamDirection direction);
+
+} // namespace brenixcoder
+
+#endif

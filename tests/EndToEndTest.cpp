@@ -1,0 +1,555 @@
+// The built libraries with real plug-ins: what the embedded core promises, seen through the C
+// functions.
+
+#include "brenixcoder/coder.h"
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <cstdint>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <limits>
+#include <numeric>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace
+{
+
+using namespace std::string_literals;
+using Numbers = std::vector<double>;
+
+constexpr double infinity = std::numeric_limits<double>::infinity();
+const std::string plugins = TEST_PLUGINS "/";
+const std::string unexpected = "brenix:Channel:unexpectedException|";
+
+std::string create(void*& channel, const std::string& device, const std::string& converter,
+                   double inputLimit = infinity, double outputLimit = infinity)
+{
+    char id[CODER_ERROR_SIZE] = "";
+    char message[CODER_ERROR_SIZE] = "";
+    channel =
+        coderChannelCreate(device.c_str(), converter.c_str(), id, message, inputLimit, outputLimit);
+    return id + "|"s + message;
+}
+
+/// A channel, driven as generated code would.
+class Channel
+{
+public:
+    explicit Channel(const std::string& device, double inputLimit = infinity,
+                     double outputLimit = infinity, const std::string& converter = "identity")
+    {
+        EXPECT_EQ(create(handle, device, converter, inputLimit, outputLimit), "|");
+    }
+    Channel(const Channel&) = delete;
+    Channel& operator=(const Channel&) = delete;
+    ~Channel() { coderChannelDestroy(handle); }
+
+    /// Initialises a probe device.
+    int init(const std::string& streams, const std::vector<int>& packets = {},
+             const std::string& failIn = "", const std::string& raiseIn = "")
+    {
+        const int result = coderChannelInit(
+            handle, packets.empty() ? 3 : 4, CODER_OPTION("Streams", "char", 9, streams.c_str()),
+            CODER_OPTION("FailIn", "char", 9, failIn.c_str()),
+            CODER_OPTION("RaiseIn", "char", 9, raiseIn.c_str()),
+            CODER_OPTION("Packets", "int32", packets.size(), packets.data()));
+        if (result == 1) {
+            takeStreams();
+        }
+        return result;
+    }
+
+    void takeStreams()
+    {
+        input = coderChannelGetInputStream(handle);
+        output = coderChannelGetOutputStream(handle);
+    }
+
+    int open(double timeout = 10)
+    {
+        return coderChannelOpen(handle, 1, CODER_OPTION("Timeout", "double", 1, &timeout));
+    }
+
+    std::string error(int (*query)(void*, char*, char*) noexcept = coderChannelGetLastError) const
+    {
+        char id[CODER_ERROR_SIZE];
+        char message[CODER_ERROR_SIZE];
+        EXPECT_EQ(query(handle, id, message), 1);
+        return id + "|"s + message;
+    }
+
+    /// Waits for the asynchronous error.
+    std::string asyncError() const
+    {
+        uint8_t has = 0;
+        waitUntil([&] { return coderChannelHasAsyncError(handle, &has) == 1 && has == 1; });
+        return error(coderChannelGetLastAsyncError);
+    }
+
+    void waitForEnd() const
+    {
+        uint8_t done = 0;
+        waitUntil([&] { return coderStreamIsDeviceDone(input, &done) == 1 && done == 1; });
+    }
+
+    template <typename Condition>
+    static void waitUntil(Condition condition)
+    {
+        const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+        while (!condition()) {
+            ASSERT_LT(std::chrono::steady_clock::now(), end) << "waited in vain";
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        }
+    }
+
+    Numbers peek(double limit = infinity) const
+    {
+        Numbers counts(16);
+        double buffers = 16;
+        double total = 0;
+        EXPECT_EQ(coderInputStreamPeek(input, &total, counts.data(), &buffers, limit), 1);
+        counts.resize(static_cast<std::size_t>(buffers));
+        EXPECT_EQ(std::accumulate(counts.begin(), counts.end(), 0.0), total);
+        return counts;
+    }
+
+    /// Reads counts that arrive in so many buffers; the values of all, or empty when it fails.
+    Numbers read(double counts, double buffers, const char* field = "data") const
+    {
+        Numbers all;
+        if (coderInputStreamReadBuffers(input, counts, buffers) == 1) {
+            for (int32_t index = 1; index <= static_cast<int32_t>(buffers); ++index) {
+                Numbers values(4096, std::numeric_limits<double>::quiet_NaN());
+                EXPECT_EQ(coderInputStreamReadBufferData(input, index, 0, field, "double", 4096,
+                                                         values.data()),
+                          1)
+                    << error();
+                for (std::size_t i = 0; values[i] == values[i]; ++i) {
+                    all.push_back(values[i]);
+                }
+            }
+        }
+        return all;
+    }
+
+    /// Writes one buffer; the counts written.
+    double write(const Numbers& values) const
+    {
+        double written = -1;
+        const int result = coderOutputStreamWriteTypedDataOld(
+            output, &written, 1, "double", CODER_BUFFER(values.size(), values.data()));
+        EXPECT_EQ(result == 1, error() == "|");
+        return written;
+    }
+
+    double ask(int (*query)(void*, double*) noexcept, void* stream) const
+    {
+        double answer = -1;
+        EXPECT_EQ(query(stream, &answer), 1) << error();
+        return answer;
+    }
+
+    void* handle = nullptr;
+    void* input = nullptr;
+    void* output = nullptr;
+};
+
+Numbers range(double first, double end)
+{
+    Numbers numbers(static_cast<std::size_t>(end - first));
+    std::iota(numbers.begin(), numbers.end(), first);
+    return numbers;
+}
+
+const std::string probe = plugins + "probe.so";
+const std::string noInput = "brenix:InputStream:synchronousInputNotPossible|";
+const std::string noOutput = "brenix:OutputStream:synchronousOutputNotPossible|";
+
+} // namespace
+
+TEST(LoadTest, FailuresHaveTheirIdentifiers)
+{
+    const std::filesystem::path folder = testing::TempDir();
+    std::ofstream(folder / "text.so") << "not a library";
+    std::ofstream(folder / "empty.so") << "";
+    const std::string load = "brenix:Channel:couldNotLoadDevice|";
+    const std::string make = "brenix:Channel:couldNotCreateDevice|";
+    const std::pair<std::string, std::string> devices[] = {
+        {"no such device", load},
+        {"./no-such-device.so", load},
+        {folder, load},
+        {folder / "text.so", load},
+        {folder / "empty.so", load},
+        {"", load},
+        {plugins + "throwsWhileLoading.so", load},
+        {plugins + "otherAbiVersion.so", load},
+        {plugins + "noFactory.so", make},
+        {plugins + "throwingFactory.so", make},
+        {plugins + "throwingInt.so", make},
+        {plugins + "nullFactory.so", make},
+        {"identity", make}, // a converter is no device
+    };
+    for (const auto& [device, error] : devices) {
+        SCOPED_TRACE(device);
+        void* channel = nullptr;
+        EXPECT_EQ(create(channel, device, "identity"), error);
+        EXPECT_EQ(channel, nullptr);
+    }
+    void* channel = nullptr;
+    EXPECT_EQ(create(channel, "no such device", "no such converter"),
+              "brenix:Channel:couldNotLoadConverter|");
+    EXPECT_EQ(create(channel, "no such device", "loopback"),
+              "brenix:Channel:couldNotCreateConverter|");
+    Channel works(probe); // after all that
+}
+
+TEST(StateTest, OperationsOutOfOrderNameOperationAndState)
+{
+    const auto run = [](void* channel, char operation) {
+        switch (operation) {
+        case 'i':
+            return coderChannelInit(channel, 0);
+        case 'o':
+            return coderChannelOpen(channel, 0);
+        case 'c':
+            return coderChannelClose(channel);
+        case 't':
+            return coderChannelTerm(channel);
+        default:
+            return coderChannelExecute(channel, "updateFromThread", 0);
+        }
+    };
+    const std::pair<std::string, const char*> names[] = {
+        {"i", "init"}, {"o", "open"}, {"x", "execute"}, {"c", "close"}, {"t", "term"}};
+    const struct {
+        std::string way, state, allowed;
+    } rows[] = {{"", "created", "i"},
+                {"i", "initialised", "ioxt"},
+                {"io", "open", "xc"},
+                {"ioc", "closed", "ioxt"},
+                {"iocoi", "open", "xc"},
+                {"it", "terminated", "i"},
+                {"ioctii", "initialised", "ioxt"}};
+    for (const auto& row : rows) {
+        for (const auto& [operation, name] : names) {
+            SCOPED_TRACE(row.way + " " + name);
+            Channel channel(probe);
+            for (const char step : row.way) {
+                run(channel.handle, step);
+            }
+            const bool allowed = row.allowed.find(operation) != std::string::npos;
+            EXPECT_EQ(run(channel.handle, operation[0]), allowed);
+            EXPECT_EQ(channel.error(), allowed ? "|"
+                                               : unexpected + "Operation " + name +
+                                                     " is not possible: the channel is " +
+                                                     row.state + ".");
+        }
+    }
+    Channel channel(probe);
+    channel.init("i");
+    EXPECT_EQ(coderChannelExecute(channel.handle, nullptr, 0), 0);
+    EXPECT_EQ(channel.error(), unexpected + "The command to execute must not be null.");
+    EXPECT_EQ(coderChannelExecute(channel.handle, "dance", 0), 0);
+    EXPECT_EQ(channel.error(), unexpected + "Unknown command: dance");
+}
+
+TEST(StateTest, FailuresAndErrorsOfEachOperationReachTheCaller)
+{
+    for (const std::string last : {"init", "open", "execute", "close", "term"}) {
+        for (const bool raises : {false, true}) {
+            SCOPED_TRACE(last);
+            Channel channel(probe);
+            const std::function<int()> steps[] = {
+                [&] { return channel.init("i", {}, raises ? "" : last, raises ? last : ""); },
+                [&] { return channel.open(); },
+                [&] { return coderChannelExecute(channel.handle, "updateFromThread", 0); },
+                [&] { return coderChannelClose(channel.handle); },
+                [&] { return coderChannelTerm(channel.handle); },
+            };
+            const auto* step = std::begin(steps);
+            while (step != std::end(steps) && (*step)() == 1) {
+                ++step;
+            }
+            EXPECT_EQ(channel.error(), raises ? "|" : unexpected + "failed in " + last);
+            EXPECT_EQ(channel.error(coderChannelGetLastSyncError),
+                      raises ? "probe:raised|" + last : "|");
+        }
+    }
+}
+
+TEST(StreamTest, PeekListsWhatReadDelivers)
+{
+    Channel channel(probe);
+    ASSERT_EQ(channel.init("i", {10, 10, 10, 5}), 1);
+    EXPECT_EQ(channel.ask(coderStreamGetSpaceAvailable, channel.input), infinity);
+    ASSERT_EQ(channel.open(), 1);
+    channel.waitForEnd();
+    EXPECT_EQ(channel.ask(coderStreamGetDataAvailable, channel.input), 35);
+    EXPECT_EQ(channel.peek(25), (Numbers{10, 10, 5}));
+    EXPECT_EQ(channel.read(25, 3), range(0, 25));
+    EXPECT_EQ(channel.peek(), (Numbers{5, 5}));
+    EXPECT_EQ(channel.read(2, 1), range(25, 27));
+    EXPECT_EQ(channel.read(1, 1, "Stamp"), Numbers{30}); // repeated in each part
+    EXPECT_EQ(channel.read(8, 2), Numbers{});            // 7 are left
+    EXPECT_EQ(channel.error(), noInput);
+    EXPECT_EQ(coderChannelClose(channel.handle), 1);
+    EXPECT_EQ(channel.read(7, 2), range(28, 35)); // also after close
+    EXPECT_EQ(channel.peek(), Numbers{});
+    EXPECT_EQ(coderInputStreamReadBuffers(channel.input, 0, 0), 1);
+}
+
+TEST(StreamTest, AnInputLimitNeitherLosesNorBlocks)
+{
+    Channel channel(probe, 4);
+    ASSERT_EQ(channel.init("i", {3, 3, 10}), 1);
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(channel.read(5, 1), Numbers{});
+    EXPECT_EQ(channel.error(), noInput); // beyond the limit: at once
+    EXPECT_EQ(channel.read(4, 2), range(0, 4));
+    for (double next = 4; next < 16; next += 2) {
+        Channel::waitUntil([&] {
+            const Numbers waiting = channel.peek(2);
+            return std::accumulate(waiting.begin(), waiting.end(), 0.0) == 2;
+        });
+        EXPECT_LE(channel.ask(coderStreamGetDataAvailable, channel.input), 4);
+        EXPECT_EQ(channel.read(2, static_cast<double>(channel.peek(2).size())),
+                  range(next, next + 2));
+    }
+}
+
+TEST(StreamTest, EveryWaitEnds)
+{
+    Channel slow(probe);
+    ASSERT_EQ(slow.init("io", {1, 1}), 1);
+    ASSERT_EQ(slow.open(0.05), 1);
+    EXPECT_EQ(slow.read(3, 1), Numbers{});
+    EXPECT_EQ(slow.error(), noInput);
+    EXPECT_EQ(slow.read(2, 2), range(0, 2));
+
+    Channel full(probe, 1); // the device waits for room, and close ends it
+    ASSERT_EQ(full.init("i", {1, 1}), 1);
+    ASSERT_EQ(full.open(), 1);
+    Channel::waitUntil([&] { return full.peek().size() == 1; });
+    EXPECT_EQ(coderChannelClose(full.handle), 1);
+    EXPECT_EQ(full.asyncError(), "probe:push|refused");
+    EXPECT_EQ(full.read(1, 1), Numbers{0});
+
+    Channel destroyed(probe, 1); // or the end of the channel does
+    ASSERT_EQ(destroyed.init("io", {1, 1}), 1);
+    ASSERT_EQ(destroyed.open(infinity), 1);
+}
+
+TEST(StreamTest, WritesAreTakenWholeOrNotAtAll)
+{
+    Channel channel("loopback", infinity, 5);
+    ASSERT_EQ(coderChannelInit(channel.handle, 0), 1);
+    channel.takeStreams();
+    EXPECT_EQ(channel.write(range(0, 6)), 0);
+    EXPECT_EQ(channel.error(), noOutput);
+    EXPECT_EQ(channel.write(range(0, 3)), 3); // before open, up to the limit
+    EXPECT_EQ(channel.write(range(3, 6)), 0);
+    EXPECT_EQ(channel.error(), noOutput);
+    EXPECT_EQ(channel.ask(coderStreamGetDataAvailable, channel.output), 3);
+    EXPECT_EQ(channel.ask(coderStreamGetSpaceAvailable, channel.output), 2);
+    EXPECT_EQ(coderStreamFlush(channel.output), 1);
+    EXPECT_EQ(channel.write(range(0, 5)), 5);
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(channel.write(range(5, 10)), 5); // waits for room
+    EXPECT_EQ(coderChannelClose(channel.handle), 1);
+    EXPECT_EQ(channel.read(10, 2), range(0, 10)); // close let the device take all of it
+    uint8_t done = 0;
+    EXPECT_EQ(coderStreamIsDeviceDone(channel.output, &done), 1);
+    EXPECT_EQ(done, 1);
+}
+
+TEST(StreamTest, DevicesMayLackStreams)
+{
+    Channel channel(probe);
+    ASSERT_EQ(channel.init("o"), 1);
+    EXPECT_EQ(channel.read(1, 1), Numbers{});
+    EXPECT_EQ(channel.error(), "brenix:InputStream:notSupported|");
+    EXPECT_EQ(channel.ask(coderStreamGetCountDimension, channel.output), 2);
+    ASSERT_EQ(channel.init("i"), 1);
+    EXPECT_EQ(channel.write({1}), 0);
+    EXPECT_EQ(channel.error(), "brenix:OutputStream:notSupported|");
+}
+
+TEST(EventTest, AFailureOfTheDevicesThreadIsAnError)
+{
+    Channel channel(probe);
+    ASSERT_EQ(channel.init("i", {4, 4}, "run"), 1);
+    ASSERT_EQ(channel.open(infinity), 1);
+    EXPECT_EQ(channel.read(1, 1), Numbers{}); // the device's end ends the wait
+    EXPECT_EQ(channel.error(), noInput);
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|failed in run");
+    EXPECT_EQ(coderChannelClose(channel.handle), 1);
+}
+
+TEST(EventTest, PropertiesFollowTheDevice)
+{
+    Channel channel(probe);
+    for (int round = 0; round < 2; ++round) { // the second init replaces the property
+        double level = 0;
+        ASSERT_EQ(channel.init("i"), 1);
+        EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Level", "double", 1, &level), 1);
+        EXPECT_EQ(level, 1);
+        EXPECT_EQ(coderChannelExecute(channel.handle, "updateFromThread", 0), 1);
+        EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Level", "double", 1, &level), 1);
+        EXPECT_EQ(level, 2);
+        EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Other", "int32", 1, &level), 0);
+        EXPECT_EQ(channel.asyncError(), "probe:thread|from a thread");
+    }
+}
+
+TEST(ConversionTest, AFailureLosesOnePacketAtMost)
+{
+    Channel channel(probe, infinity, infinity, plugins + "pickyConverter.so");
+    ASSERT_EQ(channel.init("io", {10, 10, 10}), 1);
+    EXPECT_EQ(channel.write({1, 13}), 0);
+    EXPECT_EQ(channel.error(), "brenix:OutputStream:couldNotConvertOutputData|");
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(channel.read(30, 3), Numbers{});
+    EXPECT_EQ(channel.error(), "brenix:InputStream:couldNotConvertInputData|");
+    EXPECT_EQ(channel.peek(), (Numbers{10, 10}));
+    Numbers rest = range(0, 10);
+    const Numbers third = range(20, 30);
+    rest.insert(rest.end(), third.begin(), third.end());
+    EXPECT_EQ(channel.read(20, 2), rest);
+}
+
+TEST(FilterTest, FiltersApplyInOrderAndAreTuned)
+{
+    const std::string filter = plugins + "pickyFilter.so";
+    Channel channel("loopback");
+    ASSERT_EQ(coderChannelInit(channel.handle, 0), 1);
+    channel.takeStreams();
+    double factor = 2;
+    const auto add = [&](void* stream, const std::string& name) {
+        coderStreamAddFilter(stream, name.c_str(), 1, CODER_OPTION("Factor", "double", 1, &factor));
+        return channel.error();
+    };
+    EXPECT_EQ(add(channel.input, filter), "|");
+    EXPECT_EQ(add(channel.output, filter), "|");
+    EXPECT_EQ(add(channel.output, "./none"), "brenix:Stream:couldNotLoadFilter|");
+    EXPECT_EQ(add(channel.output, "loopback"), "brenix:Stream:couldNotCreateFilter|");
+    EXPECT_EQ(coderStreamAddFilter(channel.input, filter.c_str(), 1,
+                                   CODER_OPTION("Factr", "double", 1, &factor)),
+              0);
+    EXPECT_EQ(channel.error(), unexpected + "Option Factr: is not known.");
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(add(channel.input, filter), "brenix:Stream:cannotAddFilterWhileOpen|");
+
+    EXPECT_EQ(channel.write({1, 2}), 2);
+    EXPECT_EQ(channel.read(2, 1), (Numbers{4, 8}));
+    EXPECT_EQ(channel.write({13}), 0);
+    EXPECT_EQ(channel.error(), "brenix:OutputStream:couldNotConvertOutputData|");
+    EXPECT_EQ(channel.write({6.5}), 1); // 13 for the second filter
+    EXPECT_EQ(channel.asyncError(), "brenix:Stream:filterFailed|13 is refused");
+
+    factor = 0; // drops all output
+    EXPECT_EQ(
+        coderStreamTuneFilters(channel.output, 1, CODER_OPTION("Factor", "double", 1, &factor)), 1);
+    EXPECT_EQ(channel.write({1}), 1);
+    factor = 5;
+    EXPECT_EQ(
+        coderStreamTuneFilters(channel.output, 1, CODER_OPTION("Factor", "double", 1, &factor)), 1);
+    EXPECT_EQ(channel.write({3}), 1);
+    EXPECT_EQ(channel.read(1, 1), Numbers{30});
+}
+
+TEST(AudioFileTest, WhatIsWrittenIsReadBack)
+{
+    const std::string file = testing::TempDir() + "t\xC3\xB6ne.wav";
+    const double rate = 44100;
+    const int channels = 2;
+    const Numbers samples = {0.5, -0.25, 0.125, -1, 0.75, 0.1};
+    {
+        Channel writer("audiofile");
+        ASSERT_EQ(coderChannelInit(writer.handle, 5,
+                                   CODER_OPTION("FileName", "char", 4096, file.c_str()),
+                                   CODER_OPTION("Mode", "char", 9, "write"),
+                                   CODER_OPTION("SampleRate", "double", 1, &rate),
+                                   CODER_OPTION("Channels", "int32", 1, &channels),
+                                   CODER_OPTION("SampleFormat", "char", 9, "DOUBLE")),
+                  1)
+            << writer.error();
+        writer.takeStreams();
+        ASSERT_EQ(writer.open(), 1);
+        EXPECT_EQ(writer.write({samples.begin(), samples.begin() + 3}), 3); // in mid-frame
+        EXPECT_EQ(writer.write({samples.begin() + 3, samples.end()}), 3);
+        EXPECT_EQ(coderChannelClose(writer.handle), 1) << writer.error();
+        ASSERT_EQ(writer.open(), 1) << writer.error();
+    }
+    {
+        Channel writer("audiofile");
+        ASSERT_EQ(coderChannelInit(writer.handle, 4,
+                                   CODER_OPTION("FileName", "char", 4096, file.c_str()),
+                                   CODER_OPTION("Mode", "char", 9, "write"),
+                                   CODER_OPTION("Channels", "int32", 1, &channels),
+                                   CODER_OPTION("SampleFormat", "char", 9, "DOUBLE")),
+                  1);
+        writer.takeStreams();
+        ASSERT_EQ(writer.open(), 1);
+        EXPECT_EQ(writer.write(samples), 6);
+        EXPECT_EQ(writer.write({1}), 1);
+        EXPECT_EQ(coderChannelClose(writer.handle), 1);
+        EXPECT_NE(writer.asyncError().find("has 1 of 2 samples"), std::string::npos);
+    }
+    Channel reader("audiofile", infinity, infinity, "columns");
+    const int block = 2;
+    ASSERT_EQ(coderChannelInit(reader.handle, 2,
+                               CODER_OPTION("FileName", "char", 4096, file.c_str()),
+                               CODER_OPTION("BlockSize", "int32", 1, &block)),
+              1)
+        << reader.error();
+    reader.takeStreams();
+    int64_t frames = 0;
+    EXPECT_EQ(coderChannelGetPropertyValue(reader.handle, "Frames", "int64", 1, &frames), 1);
+    EXPECT_EQ(frames, 3);
+    for (int round = 0; round < 2; ++round) { // opening again starts from the first frame
+        ASSERT_EQ(reader.open(), 1);
+        reader.waitForEnd();
+        EXPECT_EQ(reader.peek(), (Numbers{2, 1}));
+        EXPECT_EQ(reader.read(3, 2, "Data1"), (Numbers{0.5, 0.125, 0.75}));
+        double second[2] = {};
+        EXPECT_EQ(coderInputStreamReadBufferData(reader.input, 1, 2, "Data", "double", 2, second),
+                  1);
+        EXPECT_EQ(second[1], -1);
+        EXPECT_EQ(coderChannelClose(reader.handle), 1);
+    }
+}
+
+TEST(AudioFileTest, BadOptionsAreNamed)
+{
+    const double zero = 0;
+    const std::string rows[][4] = {
+        {"FileName", "", "x", "Option FileName: must name a sound file."},
+        {"FileName", "/no/such.wav", "x", "Could not open /no/such.wav: "},
+        {"Mode", "play", "x", "Option Mode: must be read or write, not play."},
+        {"Mode", "write", "x",
+         "Option FileName: has an ending that names no sound file format: a.x"},
+        {"SampleFormat", "PCM_16", "x", "Option SampleFormat: is not known."},
+        {"BlokSize", "1", "x", "Option BlokSize: is not known."},
+        {"BlockSize", "", "n", "Option BlockSize: must be a whole number from 1 to 16777216."},
+        {"BlockSize", "1", "x", "Option BlockSize: must be one number."},
+        {"Mode", "", "n", "Option Mode: must be a text."},
+        {"Timeout", "1", "x", "Option Timeout: must be one number."},
+    };
+    for (const auto& [name, text, kind, error] : rows) {
+        SCOPED_TRACE(name + "=" + text);
+        Channel channel("audiofile");
+        const int result =
+            kind == "n"
+                ? coderChannelInit(channel.handle, 2, CODER_OPTION("FileName", "char", 4, "a.x"),
+                                   CODER_OPTION(name.c_str(), "double", 1, &zero))
+                : coderChannelInit(channel.handle, 2, CODER_OPTION("FileName", "char", 4, "a.x"),
+                                   CODER_OPTION(name.c_str(), "char", 99, text.c_str()));
+        EXPECT_EQ(result, 0);
+        EXPECT_EQ(channel.error().substr(0, unexpected.size() + error.size()), unexpected + error);
+    }
+}
