@@ -5,6 +5,7 @@
 #include "Stream.hpp"
 #include "brenixcore/plugin/Options.hpp"
 
+#include <atomic>
 #include <exception>
 #include <functional>
 #include <set>
@@ -88,6 +89,12 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost, plugin::Dev
     void updateProperty(OwnedProperty property) override;
     bool push(plugin::Packet packet) override;
     std::optional<plugin::Packet> pull() override;
+    bool tryPush(plugin::Packet& packet) override;
+    std::optional<plugin::Packet> tryPull() override;
+    bool isClosing() const override;
+
+    bool enter(plugin::Packet& packet, bool waits);
+    std::optional<plugin::Packet> leave(bool waits);
 
     /// Refuses an operation in a state in which it has no meaning.
     void require(bool allowed, const char* operation) const;
@@ -112,7 +119,8 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost, plugin::Dev
     State state = State::Created;
     std::unique_ptr<InputStream> input;
     std::unique_ptr<OutputStream> output;
-    std::thread worker; ///< runs the device while the channel is open
+    std::atomic<bool> closing = false; ///< while the channel waits for the device to stop
+    std::thread worker;                ///< runs the device while the channel is open
 };
 
 // --- What the device calls ---
@@ -137,32 +145,63 @@ void Channel::Impl::updateProperty(OwnedProperty property)
 
 bool Channel::Impl::push(plugin::Packet packet)
 {
+    return enter(packet, true);
+}
+
+bool Channel::Impl::tryPush(plugin::Packet& packet)
+{
+    return enter(packet, false);
+}
+
+bool Channel::Impl::enter(plugin::Packet& packet, bool waits)
+{
     if (!input) {
         throw std::logic_error("The device pushed a packet but has no input stream.");
     }
     if (!packet.fields || packet.counts == 0) {
         throw std::invalid_argument("The device pushed a packet without counts.");
     }
+    Stream::Impl& stream = *input->impl;
+    if (!stream.waitToPush(waits)) {
+        return false;
+    }
     try {
-        input->impl->applyFilters(packet);
+        stream.applyFilters(packet);
     } catch (...) {
         raise("error", "brenix:Stream:filterFailed", currentExceptionText().c_str());
         return true; // without this packet
     }
-    return input->impl->push(std::move(packet));
+    if (packet.counts > 0) {
+        stream.push(std::move(packet));
+    }
+    return true;
 }
 
 std::optional<plugin::Packet> Channel::Impl::pull()
 {
+    return leave(true);
+}
+
+std::optional<plugin::Packet> Channel::Impl::tryPull()
+{
+    return leave(false);
+}
+
+std::optional<plugin::Packet> Channel::Impl::leave(bool waits)
+{
     if (!output) {
         throw std::logic_error("The device pulled a packet but has no output stream.");
     }
-    auto packet = output->impl->pull();
-    if (!packet && input) {
-        input->impl->setPhase(
-            Phase::Stopping); // all output was taken: nothing more will come of it
+    auto packet = output->impl->pull(waits);
+    if (!packet && input && closing) {
+        input->impl->setPhase(Phase::Stopping); // nothing more will come of the output
     }
     return packet;
+}
+
+bool Channel::Impl::isClosing() const
+{
+    return closing;
 }
 
 // --- The device's life ---
@@ -204,13 +243,16 @@ void Channel::Impl::runDevice()
 
 void Channel::Impl::stopDevice(Phase phase)
 {
-    if (output) {
-        output->impl->setPhase(phase);
-    }
+    closing = true;
     if (input) {
         input->impl->setPhase(output ? phase : Phase::Stopping); // without output nothing drains
     }
+    if (output) {
+        output->impl->setPhase(phase);
+    }
+    device.object->wake();
     worker.join();
+    closing = false;
     forEachStream([](Stream::Impl& stream) { stream.setPhase(Phase::Closed); });
     state = State::Closed;
     device.object->close();
@@ -273,11 +315,13 @@ void Channel::init(const PropertyMap& options, PropertyMap& properties)
         std::unique_ptr<OutputStream> output;
         if (info.input) {
             input = std::make_unique<InputStream>(std::make_unique<Stream::Impl>(
-                impl->converter, impl->filterLibraries, impl->inputLimit, *info.input));
+                *impl->device.object, impl->converter, impl->filterLibraries, impl->inputLimit,
+                *info.input));
         }
         if (info.output) {
             output = std::make_unique<OutputStream>(std::make_unique<Stream::Impl>(
-                impl->converter, impl->filterLibraries, impl->outputLimit, *info.output));
+                *impl->device.object, impl->converter, impl->filterLibraries, impl->outputLimit,
+                *info.output));
         }
         for (const auto& property : delivered.map) {
             names.insert(property.first);

@@ -3,6 +3,7 @@
 #include "Packets.hpp"
 
 #include <algorithm>
+#include <new>
 #include <stdexcept>
 #include <string>
 #include <utility>
@@ -42,37 +43,56 @@ void Stream::Impl::setTimeout(double seconds)
     }
 }
 
-bool Stream::Impl::push(plugin::Packet packet)
-{
-    const std::uint64_t size = packet.counts;
-    for (std::uint64_t pushed = 0; pushed < size;) {
-        const std::uint64_t rest = size - pushed;
-        // Room for a part is used only where waiting for more would never end: by a packet beyond
-        // the limit, or while a read waits for more counts than are there.
-        const auto fitsPartly = [&] { return counts < limit && (counts == 0 || wanted > counts); };
-        std::unique_lock lock(mutex);
-        changed.wait(lock, [&] { return fits(rest) || fitsPartly() || phase != Phase::Open; });
-        if (phase == Phase::Stopping || (!fits(rest) && !fitsPartly())) {
-            return false;
-        }
-        changed.notify_all();
-        if (pushed == 0 && fits(size)) {
-            packets.push_back({std::move(packet)});
-            counts += size;
-            return true;
-        }
-        const std::uint64_t part = std::min(rest, limit - counts);
-        packets.push_back({slice(packet, pushed, part)});
-        pushed += part;
-        counts += part;
-    }
-    return true;
-}
-
-std::optional<plugin::Packet> Stream::Impl::pull()
+bool Stream::Impl::waitToPush(bool waits)
 {
     std::unique_lock lock(mutex);
-    changed.wait(lock, [&] { return !packets.empty() || phase != Phase::Open; });
+    if (waits) {
+        changed.wait(lock, [&] { return pending.empty() || phase != Phase::Open; });
+    }
+    return pending.empty() && phase != Phase::Stopping;
+}
+
+void Stream::Impl::push(plugin::Packet packet)
+{
+    Packets pushed;
+    pushed.push_back({std::move(packet)});
+    const std::lock_guard lock(mutex);
+    pending.splice(pending.end(), pushed);
+    refill();
+    changed.notify_all();
+}
+
+void Stream::Impl::refill()
+{
+    if (pending.empty()) {
+        return;
+    }
+    QueuedPacket& next = pending.front();
+    std::uint64_t part = next.counts();
+    if (!fits(part)) {
+        // Room for a part is used only where waiting for more would never end: by a packet beyond
+        // the limit, or while a read waits for more counts than are there.
+        const bool fitsPartly = counts < limit && (counts == 0 || wanted > counts);
+        part = fitsPartly ? limit - counts : 0;
+    }
+    if (part == next.packet.counts) {
+        packets.splice(packets.end(), pending);
+    } else if (part > 0) {
+        packets.push_back({slice(next.packet, next.taken, part)});
+        next.taken += part;
+        if (next.counts() == 0) {
+            pending.clear();
+        }
+    }
+    counts += part;
+}
+
+std::optional<plugin::Packet> Stream::Impl::pull(bool waits)
+{
+    std::unique_lock lock(mutex);
+    if (waits) {
+        changed.wait(lock, [&] { return !packets.empty() || phase != Phase::Open; });
+    }
     if (packets.empty() || phase == Phase::Stopping) {
         return std::nullopt;
     }
@@ -81,6 +101,14 @@ std::optional<plugin::Packet> Stream::Impl::pull()
     counts -= packet.counts;
     changed.notify_all();
     return packet;
+}
+
+void Stream::Impl::notifyDevice()
+{
+    changed.notify_all();
+    if (phase != Phase::Closed) {
+        device.wake();
+    }
 }
 
 Stream::Impl::Packets Stream::Impl::take(std::uint64_t count)
@@ -129,14 +157,19 @@ Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
         refuse("the limit is " + std::to_string(limit));
     }
     wanted = count;
-    changed.notify_all();
+    refill();
+    notifyDevice();
     wait(lock, [&] { return counts >= count; });
     wanted = 0;
     if (counts < count) {
         refuse("there are " + std::to_string(counts) + " and " + reason());
     }
     Packets taken = take(count);
-    changed.notify_all();
+    try {
+        refill();
+    } catch (const std::bad_alloc&) { // the next call tries again
+    }
+    notifyDevice();
     return taken;
 }
 
@@ -208,9 +241,10 @@ void Stream::flush()
 {
     Impl::Packets discarded;
     const std::lock_guard lock(impl->mutex);
-    discarded.swap(impl->packets);
+    discarded.splice(discarded.end(), impl->packets);
+    discarded.splice(discarded.end(), impl->pending);
     impl->counts = 0;
-    impl->changed.notify_all();
+    impl->notifyDevice();
 }
 
 bool Stream::isOpen() const
@@ -365,7 +399,7 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
     }
     stream.packets.splice(stream.packets.end(), outgoing);
     stream.counts += size;
-    stream.changed.notify_all();
+    stream.notifyDevice();
     return written;
 }
 

@@ -49,10 +49,11 @@ struct OwnedOptions {
 struct BRENIXCORE_INTERNAL Stream::Impl {
     using Packets = std::list<QueuedPacket>;
 
-    Impl(plugin::Converter& streamConverter, std::list<PluginLibrary>& pluginLibraries,
-         std::uint64_t countLimit, plugin::StreamInfo streamInfo)
-        : converter(streamConverter), libraries(pluginLibraries), limit(countLimit),
-          info(streamInfo)
+    Impl(plugin::Device& streamDevice, plugin::Converter& streamConverter,
+         std::list<PluginLibrary>& pluginLibraries, std::uint64_t countLimit,
+         plugin::StreamInfo streamInfo)
+        : device(streamDevice), converter(streamConverter), libraries(pluginLibraries),
+          limit(countLimit), info(streamInfo)
     {
     }
 
@@ -64,8 +65,9 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     void setTimeout(double seconds);
 
     /// For the device's thread; see plugin::DeviceStreams.
-    bool push(plugin::Packet packet);
-    std::optional<plugin::Packet> pull();
+    bool waitToPush(bool waits);
+    void push(plugin::Packet packet);
+    std::optional<plugin::Packet> pull(bool waits);
 
     void addFilter(const std::string& name, const brenixplugin::PropertyMap& options);
     void tuneFilters(const brenixplugin::PropertyMap& options);
@@ -89,6 +91,12 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
         }
     }
 
+    /// Moves from `pending` to `packets` what has room. Under the mutex.
+    void refill();
+
+    /// Tells both sides of a change that the caller's made. Under the mutex.
+    void notifyDevice();
+
     /// Takes the `count` oldest counts: waits for them, or throws SynchronousInputNotPossible.
     Packets takeInTime(std::uint64_t count);
 
@@ -101,6 +109,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     /// Why a wait ended without what it waited for. Under the mutex.
     const char* reason() const;
 
+    plugin::Device& device;
     plugin::Converter& converter;
     std::list<PluginLibrary>& libraries; ///< outlive every packet that a filter touched
     const std::uint64_t limit;
@@ -117,6 +126,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     Packets packets;
     std::uint64_t counts = 0; ///< in `packets`
     std::uint64_t wanted = 0; ///< that a read is waiting for
+    Packets pending;          ///< at most one, pushed by the device and not yet all in `packets`
 };
 
 } // namespace brenixcore

@@ -55,6 +55,17 @@ public:
     /// channel is closing and all output was taken: run() must return.
     virtual std::optional<Packet> pull() = 0;
 
+    // For a device that waits elsewhere, for a socket say, and is told by wake() to ask again:
+
+    /// As push(), but when there is no room at once returns false and leaves the packet as it is.
+    virtual bool tryPush(Packet& packet) = 0;
+
+    /// As pull(), but returns nothing when there is nothing at once.
+    virtual std::optional<Packet> tryPull() = 0;
+
+    /// Whether the channel is closing: run() must return once tryPull() returns nothing.
+    virtual bool isClosing() const = 0;
+
 protected:
     ~DeviceStreams() = default;
 };
@@ -86,6 +97,10 @@ public:
 
     /// Moves the data, on a thread of the core. When it returns or throws, the device is done.
     virtual void run(DeviceStreams& streams) = 0;
+
+    /// Called on the channel's thread, while run() may be busy, when tryPush(), tryPull() or
+    /// isClosing() may have a new answer. Must neither wait nor throw.
+    virtual void wake() noexcept {}
 
     /// Runs a command, possibly while run() is busy.
     virtual void execute(const std::string& command, const brenixplugin::PropertyMap& /*options*/)
