@@ -2,6 +2,7 @@
 // stream. A count is a frame: one sample of each channel, interleaved in the field "data" as
 // double, full scale from -1 to 1.
 
+#include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
@@ -21,24 +22,33 @@ namespace
 {
 
 using namespace brenixcore::plugin;
-using brenixplugin::OwnedProperty;
 using brenixplugin::PropertyMap;
 using brenixplugin::kit::coderconverter::TPointerProperty;
-using brenixplugin::kit::device::TScalarProperty;
 
 struct SampleFormat {
     std::string_view name;
     int subtype;
 };
 
+#define SAMPLE_FORMAT(name)                                                                        \
+    SampleFormat                                                                                   \
+    {                                                                                              \
+#name, SF_FORMAT_##name                                                                    \
+    }
 constexpr std::array sampleFormats = {
-    SampleFormat{"PCM_S8", SF_FORMAT_PCM_S8}, SampleFormat{"PCM_U8", SF_FORMAT_PCM_U8},
-    SampleFormat{"PCM_16", SF_FORMAT_PCM_16}, SampleFormat{"PCM_24", SF_FORMAT_PCM_24},
-    SampleFormat{"PCM_32", SF_FORMAT_PCM_32}, SampleFormat{"FLOAT", SF_FORMAT_FLOAT},
-    SampleFormat{"DOUBLE", SF_FORMAT_DOUBLE}, SampleFormat{"ULAW", SF_FORMAT_ULAW},
-    SampleFormat{"ALAW", SF_FORMAT_ALAW},     SampleFormat{"VORBIS", SF_FORMAT_VORBIS},
-    SampleFormat{"OPUS", SF_FORMAT_OPUS},
+    SAMPLE_FORMAT(PCM_S8),       SAMPLE_FORMAT(PCM_16),        SAMPLE_FORMAT(PCM_24),
+    SAMPLE_FORMAT(PCM_32),       SAMPLE_FORMAT(PCM_U8),        SAMPLE_FORMAT(FLOAT),
+    SAMPLE_FORMAT(DOUBLE),       SAMPLE_FORMAT(ULAW),          SAMPLE_FORMAT(ALAW),
+    SAMPLE_FORMAT(IMA_ADPCM),    SAMPLE_FORMAT(MS_ADPCM),      SAMPLE_FORMAT(GSM610),
+    SAMPLE_FORMAT(VOX_ADPCM),    SAMPLE_FORMAT(NMS_ADPCM_16),  SAMPLE_FORMAT(NMS_ADPCM_24),
+    SAMPLE_FORMAT(NMS_ADPCM_32), SAMPLE_FORMAT(G721_32),       SAMPLE_FORMAT(G723_24),
+    SAMPLE_FORMAT(G723_40),      SAMPLE_FORMAT(DWVW_12),       SAMPLE_FORMAT(DWVW_16),
+    SAMPLE_FORMAT(DWVW_24),      SAMPLE_FORMAT(DPCM_8),        SAMPLE_FORMAT(DPCM_16),
+    SAMPLE_FORMAT(VORBIS),       SAMPLE_FORMAT(OPUS),          SAMPLE_FORMAT(ALAC_16),
+    SAMPLE_FORMAT(ALAC_20),      SAMPLE_FORMAT(ALAC_24),       SAMPLE_FORMAT(ALAC_32),
+    SAMPLE_FORMAT(MPEG_LAYER_I), SAMPLE_FORMAT(MPEG_LAYER_II), SAMPLE_FORMAT(MPEG_LAYER_III),
 };
+#undef SAMPLE_FORMAT
 
 /// The container format of a file name's ending; 0 when there is none for it.
 int containerOf(const std::string& fileName)
@@ -153,12 +163,6 @@ private:
         }
     }
 
-    template <typename T>
-    static void publish(PropertyMap& properties, const std::string& name, T value)
-    {
-        storeProperty(properties, name, OwnedProperty(new TScalarProperty<T>(name, value)));
-    }
-
     void read(DeviceStreams& streams)
     {
         const auto channels = static_cast<std::uint64_t>(format.channels);
@@ -175,10 +179,7 @@ private:
             }
             Packet packet;
             packet.counts = static_cast<std::uint64_t>(frames);
-            OwnedProperty data(
-                new TPointerProperty<double>(dataField, samples.get(), packet.counts * channels));
-            samples.release();
-            setField(packet, std::move(data));
+            setField(packet, makeArray(dataField, std::move(samples), packet.counts * channels));
             if (!streams.push(std::move(packet))) {
                 return;
             }

@@ -1,6 +1,7 @@
 // Converter `columns`: the interleaved numbers of the field "data", k for each count, become the
 // fields Data1 to Datak with one number for each count. Everything else passes as it is.
 
+#include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 #include "brenixcore/plugin/Visit.hpp"
 
@@ -32,10 +33,8 @@ struct Deinterleave {
             for (std::uint64_t row = 0; row < rows; ++row) {
                 values[row] = interleaved.data[row * columns + column];
             }
-            brenixplugin::OwnedProperty field(
-                new TPointerProperty<T>("Data" + std::to_string(column + 1), values.get(), rows));
-            values.release();
-            setField(packet, std::move(field));
+            setField(packet,
+                     makeArray("Data" + std::to_string(column + 1), std::move(values), rows));
         }
     }
 

@@ -317,6 +317,91 @@ TEST(FilterTest, FiltersApplyInOrderAndAreTuned)
     EXPECT_EQ(channel.read(1, 1), Numbers{30});
 }
 
+TEST(FilterTest, ScaleAndDecimate)
+{
+    Channel channel("loopback");
+    ASSERT_EQ(channel.init(0), 1);
+    const int factor = 3;
+    const double gain = -2;
+    const double offset = 0.5;
+    ASSERT_EQ(coderStreamAddFilter(channel.output, "decimate", 1,
+                                   CODER_OPTION("Factor", "int32", 1, &factor)),
+              1);
+    ASSERT_EQ(coderStreamAddFilter(channel.input, "scale", 2,
+                                   CODER_OPTION("Gain", "double", 1, &gain),
+                                   CODER_OPTION("Offset", "double", 1, &offset)),
+              1);
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(channel.write(range(0, 5)), 5); // 0 and 3 stay
+    EXPECT_EQ(channel.write(range(5, 6)), 1); // none
+    EXPECT_EQ(channel.write(range(6, 8)), 2); // 6
+    EXPECT_EQ(channel.read(3, 2), (Numbers{0.5, -5.5, -11.5}));
+
+    // Integers are rounded and stop at their ends.
+    const int8_t bytes[] = {0, 70, 2, 3, -70, 5, 6};
+    int8_t back[3] = {};
+    double written = 0;
+    ASSERT_EQ(coderOutputStreamWriteTypedDataOld(channel.output, &written, 1, "int8",
+                                                 CODER_BUFFER(7, bytes)),
+              1);
+    ASSERT_EQ(coderInputStreamReadBuffers(channel.input, 2, 1), 1); // 70 and -70
+    ASSERT_EQ(coderInputStreamReadBufferData(channel.input, 1, 0, "", "int8", 3, back), 1);
+    EXPECT_EQ(std::vector<int>(back, back + 3), (std::vector<int>{-128, 127, 0}));
+}
+
+TEST(SignalTest, WaveformsChannelsAndCommands)
+{
+    Channel channel("signal", 16, 0, "columns");
+    const double rate = 8;
+    double frequency = 1;
+    const int channels = 2;
+    const int block = 4;
+    const auto start = [&](const char* waveform, const char* pace, int frames) {
+        const int result = channel.init(7, CODER_OPTION("Waveform", "char", 9, waveform),
+                                        CODER_OPTION("Pace", "char", 9, pace),
+                                        CODER_OPTION("SampleRate", "double", 1, &rate),
+                                        CODER_OPTION("Frequency", "double", 1, &frequency),
+                                        CODER_OPTION("Channels", "int32", 1, &channels),
+                                        CODER_OPTION("BlockSize", "int32", 1, &block),
+                                        CODER_OPTION("Frames", "int32", 1, &frames));
+        return result == 1 && channel.open() == 1;
+    };
+    const auto stop = [&] { ASSERT_EQ(coderChannelClose(channel.handle), 1); };
+
+    ASSERT_TRUE(start("ramp", "fast", 8)) << channel.error();
+    EXPECT_EQ(channel.read(8, 2, "Data1"), (Numbers{-1, -0.75, -0.5, -0.25, 0, 0.25, 0.5, 0.75}));
+    stop();
+    ASSERT_TRUE(start("square", "fast", 6));
+    EXPECT_EQ(channel.read(6, 2, "Data2"), (Numbers{-1, -1, -1, -1, 1, 1})); // half a period ahead
+    stop();
+    ASSERT_TRUE(start("noise", "fast", 4));
+    const Numbers noise = channel.read(4, 1, "Data1");
+    stop();
+    ASSERT_TRUE(start("noise", "fast", 4));
+    EXPECT_EQ(channel.read(4, 1, "Data1"), noise);
+    stop();
+
+    const auto begin = std::chrono::steady_clock::now();
+    ASSERT_TRUE(start("sine", "realtime", 1000)); // a block takes half a second
+    EXPECT_EQ(channel.read(4, 1, "Data1")[2], 1);
+    EXPECT_GE(std::chrono::steady_clock::now() - begin, std::chrono::milliseconds(500));
+    frequency = 2;
+    ASSERT_EQ(coderChannelExecute(channel.handle, "set", 1,
+                                  CODER_OPTION("Frequency", "double", 1, &frequency)),
+              1);
+    double reflected = 0;
+    EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Frequency", "double", 1, &reflected),
+              1);
+    EXPECT_EQ(reflected, 2);
+    frequency = 4.5;
+    EXPECT_EQ(coderChannelExecute(channel.handle, "set", 1,
+                                  CODER_OPTION("Frequency", "double", 1, &frequency)),
+              0);
+    EXPECT_EQ(channel.error(),
+              unexpected + "Option Frequency: must be from 0 Hz to half the sample rate.");
+    stop();
+}
+
 TEST(AudioFileTest, WhatIsWrittenIsReadBack)
 {
     const std::string file = testing::TempDir() + "t\xC3\xB6ne.wav";

@@ -1,5 +1,6 @@
 #include "Packets.hpp"
 
+#include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Visit.hpp"
 
 #include <algorithm>
@@ -44,7 +45,7 @@ struct Slicer {
     void operator()(const TScalarProperty<T>& scalar)
     {
         elements = 1;
-        result.reset(new TScalarProperty<T>(scalar.name, scalar.value));
+        result = plugin::makeScalar(scalar.name, scalar.value);
     }
 
     template <typename T>
@@ -54,8 +55,7 @@ struct Slicer {
         const Range range(first, length, counts, array.count);
         std::unique_ptr<T[]> copy(new T[range.size]);
         std::copy_n(array.data + range.begin, range.size, copy.get());
-        result.reset(new TPointerProperty<T>(array.name, copy.get(), range.size));
-        copy.release();
+        result = plugin::makeArray(array.name, std::move(copy), range.size);
     }
 
     template <typename T>

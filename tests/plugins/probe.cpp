@@ -1,5 +1,6 @@
 // A device that does what its options and commands say.
 
+#include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
@@ -35,8 +36,8 @@ public:
                 dynamic_cast<device::TVectorProperty<int>&>(*asProperty(found->second)).values;
         }
         reach("init");
-        host->updateProperty(level(0)); // too early: there is no property yet
-        storeProperty(properties, "Level", level(1));
+        host->updateProperty(makeScalar("Level", 0.0)); // too early: there is no property yet
+        publish(properties, "Level", 1.0);
         DeviceInfo info;
         if (streams.find('i') != std::string::npos) {
             info.input = StreamInfo{};
@@ -63,9 +64,8 @@ public:
             }
             Packet packet;
             packet.counts = size;
-            setField(packet, OwnedProperty(new coderconverter::TPointerProperty<double>(
-                                 dataField, values.release(), size)));
-            setField(packet, OwnedProperty(new device::TScalarProperty<double>("Stamp", next)));
+            setField(packet, makeArray(dataField, std::move(values), size));
+            setField(packet, makeScalar("Stamp", next));
             if (!streams.push(std::move(packet))) {
                 host->raise("error", "probe:push", "refused");
                 return;
@@ -82,8 +82,8 @@ public:
             Device::execute(command, optionMap);
         }
         std::thread([&] {
-            host->updateProperty(level(2));
-            host->updateProperty(OwnedProperty(new device::TScalarProperty<int>("Other", 1)));
+            host->updateProperty(makeScalar("Level", 2.0));
+            host->updateProperty(makeScalar("Other", 1));
             host->updateProperty(nullptr);
             host->raise("warning", "probe:warning", "is dropped");
             host->raise("error", "probe:thread", "from a thread");
@@ -94,11 +94,6 @@ public:
     void term() override { reach("term"); }
 
 private:
-    static OwnedProperty level(double value)
-    {
-        return OwnedProperty(new device::TScalarProperty<double>("Level", value));
-    }
-
     void reach(const std::string& operation)
     {
         if (operation == raiseIn) {

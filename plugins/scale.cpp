@@ -1,0 +1,79 @@
+// Filter `scale`: multiplies every number in arrays by a gain and adds an offset.
+
+#include "brenixcore/plugin/Options.hpp"
+#include "brenixcore/plugin/Plugin.hpp"
+#include "brenixcore/plugin/Visit.hpp"
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <type_traits>
+
+namespace
+{
+
+using namespace brenixcore::plugin;
+using brenixplugin::kit::coderconverter::TPointerProperty;
+
+/// The nearest value of T; beyond its range the last one, and 0 for what is no number.
+template <typename T>
+T nearest(double value)
+{
+    if constexpr (std::is_floating_point_v<T>) {
+        return static_cast<T>(value);
+    } else {
+        using Limits = std::numeric_limits<T>;
+        if (std::isnan(value)) {
+            return 0;
+        }
+        const double rounded = std::round(value);
+        if (rounded <= static_cast<double>(Limits::min())) {
+            return Limits::min();
+        }
+        // The limit of a 64-bit type rounds up to a power of two, which is already beyond it.
+        return rounded >= static_cast<double>(Limits::max()) ? Limits::max()
+                                                             : static_cast<T>(rounded);
+    }
+}
+
+class Scale : public Filter
+{
+public:
+    void tune(const brenixplugin::PropertyMap& optionMap) override
+    {
+        Options options(optionMap);
+        const double newGain = options.number("Gain").value_or(gain);
+        const double newOffset = options.number("Offset").value_or(offset);
+        options.requireAllKnown();
+        gain = newGain;
+        offset = newOffset;
+    }
+
+    void apply(Packet& packet) override
+    {
+        for (const auto& field : *packet.fields) {
+            visitNumbers(brenixplugin::asProperty(field.second), *this);
+        }
+    }
+
+    template <typename T>
+    void operator()(TPointerProperty<T>& array) const
+    {
+        std::transform(array.data, array.data + array.count, array.data, [&](T value) {
+            return nearest<T>(static_cast<double>(value) * gain + offset);
+        });
+    }
+
+    template <typename Other>
+    void operator()(Other& /*describes the packet*/) const
+    {
+    }
+
+private:
+    double gain = 1;
+    double offset = 0;
+};
+
+} // namespace
+
+BRENIXCORE_EXPORT_FILTER(Scale)
