@@ -58,13 +58,19 @@ static void* createChannel(const char* device, const char* converter, double inp
 }
 
 /*
- * Closes and terminates a channel as far as it was opened and initialised, and destroys it.
- * Returns 0, after printing why, if one of the steps fails.
+ * Closes and terminates a channel, if there is one, as far as it was opened and initialised, and
+ * destroys it. Returns 0, after printing why, if one of the steps fails.
  */
-static int finishChannel(void* channel, int initialised)
+static int finishChannel(void* channel)
 {
     uint8_t open = 0;
-    int ok = check(channel, "coderChannelIsOpen", coderChannelIsOpen(channel, &open));
+    int initialised;
+    int ok;
+    if (channel == NULL) {
+        return 1;
+    }
+    initialised = coderChannelGetInputStream(channel) != NULL;
+    ok = check(channel, "coderChannelIsOpen", coderChannelIsOpen(channel, &open));
     if (open && !check(channel, "coderChannelClose", coderChannelClose(channel))) {
         ok = 0;
     }

@@ -296,7 +296,6 @@ int main(int argc, char** argv)
 {
     const uint32_t blockFrames = BLOCK_FRAMES;
     void* channel;
-    int initialised;
     int ok;
     if (argc != 2) {
         fputs("usage: levels FILE\n", stderr);
@@ -307,11 +306,11 @@ int main(int argc, char** argv)
     if (channel == NULL) {
         return EXIT_FAILURE;
     }
-    initialised = check(channel, "coderChannelInit",
-                        coderChannelInit(channel, 2,
-                                         CODER_OPTION("FileName", "char", strlen(argv[1]), argv[1]),
-                                         CODER_OPTION("BlockSize", "uint32", 1, &blockFrames)));
-    ok = initialised && readProperties(channel) && readSound(channel);
-    ok = finishChannel(channel, initialised) && ok;
+    ok = check(channel, "coderChannelInit",
+               coderChannelInit(channel, 2,
+                                CODER_OPTION("FileName", "char", strlen(argv[1]), argv[1]),
+                                CODER_OPTION("BlockSize", "uint32", 1, &blockFrames))) &&
+         readProperties(channel) && readSound(channel);
+    ok = finishChannel(channel) && ok;
     return ok ? EXIT_SUCCESS : EXIT_FAILURE;
 }

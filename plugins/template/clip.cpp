@@ -1,0 +1,55 @@
+// A filter that limits the numbers in arrays. Option: Highest (number), also while data flows.
+
+#include <brenixcore/plugin/Options.hpp>
+#include <brenixcore/plugin/Plugin.hpp>
+#include <brenixcore/plugin/Visit.hpp>
+
+#include <limits>
+
+namespace
+{
+
+using namespace brenixcore::plugin;
+
+class Clip : public Filter
+{
+public:
+    void tune(const brenixplugin::PropertyMap& optionMap) override
+    {
+        Options options(optionMap);
+        const double value = options.number("Highest").value_or(highest);
+        options.requireAllKnown();
+        highest = value;
+    }
+
+    void apply(Packet& packet) override
+    {
+        for (const auto& field : *packet.fields) {
+            visitNumbers(brenixplugin::asProperty(field.second), *this);
+        }
+    }
+
+    // Called for each class that a field can have: arrays are clipped...
+    template <typename T>
+    void operator()(brenixplugin::kit::coderconverter::TPointerProperty<T>& array) const
+    {
+        for (T* element = array.data; element != array.data + array.count; ++element) {
+            if (static_cast<double>(*element) > highest) {
+                *element = static_cast<T>(highest);
+            }
+        }
+    }
+
+    // ... and everything else stays.
+    template <typename Other>
+    void operator()(Other& /*other*/) const
+    {
+    }
+
+private:
+    double highest = std::numeric_limits<double>::infinity();
+};
+
+} // namespace
+
+BRENIXCORE_EXPORT_FILTER(Clip)

@@ -1,0 +1,70 @@
+// A device that counts: it pushes running numbers as "uint32" in the field "data".
+//
+// Option at init: BlockSize (whole number, default 4), the numbers of one packet.
+// Property: Next ("uint32"), the number that comes next. Command: restart.
+
+#include <brenixcore/plugin/Make.hpp>
+#include <brenixcore/plugin/Options.hpp>
+#include <brenixcore/plugin/Plugin.hpp>
+
+#include <atomic>
+#include <memory>
+#include <string>
+#include <utility>
+
+namespace
+{
+
+using namespace brenixcore::plugin;
+
+class Counter : public Device
+{
+public:
+    DeviceInfo init(const brenixplugin::PropertyMap& optionMap,
+                    brenixplugin::PropertyMap& properties, DeviceHost& deviceHost) override
+    {
+        Options options(optionMap);
+        blockSize = static_cast<unsigned>(options.wholeNumber("BlockSize", 1, 65536).value_or(4));
+        options.requireAllKnown();
+        host = &deviceHost;
+        next = 0;
+        publish(properties, "Next", next.load());
+        return {StreamInfo{}, std::nullopt}; // an input stream, no output stream
+    }
+
+    // On a thread of the core. push() waits while there is no room, and is false when it is time to
+    // stop.
+    void run(DeviceStreams& streams) override
+    {
+        bool going = true;
+        while (going) {
+            std::unique_ptr<unsigned[]> numbers(new unsigned[blockSize]);
+            for (unsigned i = 0; i < blockSize; ++i) {
+                numbers[i] = next++;
+            }
+            Packet packet;
+            packet.counts = blockSize;
+            setField(packet, makeArray(dataField, std::move(numbers), blockSize));
+            going = streams.push(std::move(packet));
+            host->updateProperty(makeScalar("Next", next.load()));
+        }
+    }
+
+    void execute(const std::string& command, const brenixplugin::PropertyMap& options) override
+    {
+        if (command != "restart") {
+            Device::execute(command, options); // refuses it
+        }
+        Options(options).requireAllKnown();
+        next = 0;
+    }
+
+private:
+    DeviceHost* host = nullptr;
+    unsigned blockSize = 4;
+    std::atomic<unsigned> next = 0;
+};
+
+} // namespace
+
+BRENIXCORE_EXPORT_DEVICE(Counter)

@@ -1,0 +1,29 @@
+// A converter that gives the caller the field "data" under the name "Values". A converter may do
+// anything with the fields of a packet, such as decode them; output here passes as it is.
+
+#include <brenixcore/plugin/Plugin.hpp>
+
+#include <utility>
+
+namespace
+{
+
+using namespace brenixcore::plugin;
+
+class Rename : public Converter
+{
+public:
+    void convertInput(Packet& packet) override
+    {
+        if (auto field = packet.fields->extract(dataField)) {
+            field.key() = "Values";
+            packet.fields->insert(std::move(field));
+        }
+    }
+
+    void convertOutput(Packet& /*packet*/) override {}
+};
+
+} // namespace
+
+BRENIXCORE_EXPORT_CONVERTER(Rename)
