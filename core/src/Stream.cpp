@@ -64,27 +64,28 @@ void Stream::Impl::push(plugin::Packet packet)
 
 void Stream::Impl::refill()
 {
-    if (pending.empty()) {
-        return;
-    }
-    QueuedPacket& next = pending.front();
-    std::uint64_t part = next.counts();
-    if (!fits(part)) {
-        // Room for a part is used only where waiting for more would never end: by a packet beyond
-        // the limit, or while a read waits for more counts than are there.
-        const bool fitsPartly = counts < limit && (counts == 0 || wanted > counts);
-        part = fitsPartly ? limit - counts : 0;
-    }
-    if (part == next.packet.counts) {
-        packets.splice(packets.end(), pending);
-    } else if (part > 0) {
-        packets.push_back({slice(next.packet, next.taken, part)});
-        next.taken += part;
-        if (next.counts() == 0) {
-            pending.clear();
+    while (!pending.empty()) {
+        QueuedPacket& next = pending.front();
+        std::uint64_t part = next.counts();
+        if (!fits(part)) {
+            // Room for a part is used only where waiting for more would never end: by a packet
+            // beyond the limit, or while a read waits for more counts than are there.
+            if (counts >= limit || (counts > 0 && wanted <= counts)) {
+                return;
+            }
+            part = limit - counts;
         }
+        if (part == next.packet.counts) {
+            packets.splice(packets.end(), pending, pending.begin());
+        } else {
+            packets.push_back({slice(next.packet, next.taken, part)});
+            next.taken += part;
+            if (next.counts() == 0) {
+                pending.pop_front();
+            }
+        }
+        counts += part;
     }
-    counts += part;
 }
 
 std::optional<plugin::Packet> Stream::Impl::pull(bool waits)

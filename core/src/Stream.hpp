@@ -126,7 +126,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     Packets packets;
     std::uint64_t counts = 0; ///< in `packets`
     std::uint64_t wanted = 0; ///< that a read is waiting for
-    Packets pending;          ///< at most one, pushed by the device and not yet all in `packets`
+    Packets pending;          ///< pushed by the device, which then waits; not yet all in `packets`
 };
 
 } // namespace brenixcore
