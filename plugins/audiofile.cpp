@@ -53,9 +53,16 @@ constexpr std::array sampleFormats = {
 /// The container format of a file name's ending; 0 when there is none for it.
 int containerOf(const std::string& fileName)
 {
-    std::string ending = fileName.substr(fileName.rfind('.') + 1);
+    const std::size_t dot = fileName.rfind('.');
+    if (dot == std::string::npos) {
+        return 0;
+    }
+    std::string ending = fileName.substr(dot + 1);
     std::transform(ending.begin(), ending.end(), ending.begin(),
                    [](unsigned char letter) { return static_cast<char>(std::tolower(letter)); });
+    if (ending == "ogg" || ending == "aif") { // libsndfile lists one ending for each format
+        ending = ending == "ogg" ? "oga" : "aiff";
+    }
     int formats = 0;
     sf_command(nullptr, SFC_GET_FORMAT_MAJOR_COUNT, &formats, sizeof formats);
     for (int i = 0; i < formats; ++i) {
@@ -161,6 +168,8 @@ private:
         if (!file) {
             throw std::runtime_error("Could not open " + fileName + ": " + sf_strerror(nullptr));
         }
+        sf_command(file.get(), SFC_SET_CLIPPING, nullptr,
+                   SF_TRUE); // beyond full scale is full scale
     }
 
     void read(DeviceStreams& streams)

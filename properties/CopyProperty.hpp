@@ -14,8 +14,7 @@ namespace brenixcoder
 /// for messages.
 /// @return false for an unknown type name; then nothing was done
 /// @throws std::runtime_error when the type does not match or the elements do not fit; then nothing
-/// was
-///         written
+///         was written
 bool copyPropertyValue(const void* property, const std::string& name, const std::string& typeName,
                        int capacity, void* destination);
 

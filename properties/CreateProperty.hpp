@@ -15,8 +15,7 @@ using brenixplugin::interfaces::IPropertyInfo;
 /// TPointerProperty. "char" is always one UTF-16 text. The caller owns the result.
 /// @return null for an unknown type name; then neither count nor data is looked at
 /// @throws std::runtime_error for a count below 1 or a null pointer; for "char", `count` is the
-/// most
-///         characters to take, and 0 or less is an empty text
+///         most characters to take, and 0 or less is an empty text
 IPropertyInfo* createProperty(bool forDevice, const std::string& name, const std::string& typeName,
                               int count, const void* data);
 

@@ -1,6 +1,6 @@
 // What holds for every exported function of a channel or stream: one table of calls, and for each
 // the null handle, the last error, failures of the core, missing streams, wrong directions and
-// failing allocations. A table of null pointers follows.
+// failing allocations and null pointers.
 
 #include "scripted/ChannelFixture.hpp"
 
@@ -8,119 +8,126 @@
 
 using namespace scripted;
 
-namespace
-{
-
-enum Target { Channels, Streams, Inputs, Outputs };
-
-// A call with the handle h.
-#define CALL(call) [&]([[maybe_unused]] void* h) { return call; }
-
-struct Call {
-    Target target;
-    int clears;            ///< whether it clears the last error
-    const char* operation; ///< the core's operation, if any
-    std::function<bool(void*)> run;
-};
+// A call with a handle, whose answer is a flag, a number or an array.
+#define CALL(function, ...)                                                                        \
+    [&](void* handle, void* array) {                                                               \
+        [[maybe_unused]] auto* const flag = static_cast<uint8_t*>(array);                          \
+        [[maybe_unused]] auto* const number = static_cast<double*>(array);                         \
+        return coder##function(handle __VA_OPT__(, ) __VA_ARGS__);                                 \
+    }
 
 class ExportedCallsTest : public ChannelTest
 {
 protected:
+    enum Target { Channels, Streams, Inputs, Outputs };
+
+    struct Call {
+        Target target;
+        int clears;            ///< whether it clears the last error
+        std::string operation; ///< the core's operation, if any
+        std::string argument;  ///< the argument that takes the answer, if any
+        std::function<bool(void* handle, void* answer)> run;
+    };
+
     ExportedCallsTest() { refresh(); }
 
-    /// New handles, a property, a stored buffer and unwritten out-values.
+    /// New handles, a property, a stored buffer and an unwritten answer.
     void refresh()
     {
-        init(scalar<double>("p", 1));
-        core.delivery = {dataBuffer({scalar<double>(text, 1)})};
-        EXPECT_EQ(coderInputStreamReadBuffers(input, 1, 1), 1);
-        flag = Buffer(1);
-        number = Buffer(8);
-        core.counts = {1};
-        total = 1;
+        init(scalar("p", 1.0));
         core.on["read"] = [] {
             const AllocationsAllowed allowed;
-            core.delivery = {dataBuffer({scalar<double>(text, 1)})};
+            core.delivery = {dataBuffer({scalar(text, 1.0)})};
         };
+        EXPECT_EQ(coderInputStreamReadBuffers(input, 1, 1), 1);
+        core.counts = {1};
+        answer = Buffer(8);
     }
 
-    std::vector<void*> handles(Target target) const
+    std::vector<void*> handles(const Call& call) const
     {
+        const AllocationsAllowed allowed;
         const std::vector<void*> all[] = {{channel}, {input, output}, {input}, {output}};
-        return all[target];
+        return all[call.target];
+    }
+
+    /// The last error after a call that fails and answers nothing, or 0 where it resets first.
+    std::string failure(const Call& call, void* handle)
+    {
+        answer = Buffer(8);
+        EXPECT_FALSE(call.run(handle, answer.data())) << &call - calls.data();
+        const bool resets = call.argument == "totalCounts" || call.argument == "written";
+        EXPECT_EQ(answer.written(), resets ? std::string(8, 0) : "");
+        return lastError();
+    }
+
+    /// Lets each allocation of a call fail in turn. The call returns "|" or its error.
+    void sweep(const std::function<std::string()>& run)
+    {
+        bool failed = true;
+        for (long k = 1; failed; ++k) {
+            ASSERT_LT(k, 100);
+            refresh();
+            failingAllocation = k;
+            const std::string result = run();
+            failed = std::exchange(failingAllocation, 0) == 0;
+            EXPECT_EQ(result, failed ? unexpected + "std::bad_alloc" : "|");
+        }
     }
 
     static constexpr const char* text = "a text that needs memory of its own";
-    Buffer flag{1}, number{8};
-    double total = 1, counts = 1, buffers = 1;
-    uint8_t* f() { return flag.as<uint8_t>(); }
-    double* n() { return number.as<double>(); }
+    Buffer answer{8};
+    double counts = 1, buffers = 1;
 
     const std::vector<Call> calls = {
-        {Channels, 1, "init", CALL(coderChannelInit(h, 1, text, "char", 9, text))},
-        {Channels, 1, "open", CALL(coderChannelOpen(h, 1, text, "int8", 9, text))},
-        {Channels, 1, "execute", CALL(coderChannelExecute(h, "c", 1, text, "int8", 1, text))},
-        {Channels, 1, "close", coderChannelClose},
-        {Channels, 1, "term", coderChannelTerm},
-        {Channels, 1, "isOpen", CALL(coderChannelIsOpen(h, f()))},
-        {Channels, 1, nullptr, coderChannelGetInputStream},
-        {Channels, 1, nullptr, coderChannelGetOutputStream},
-        {Channels, 1, nullptr, CALL(coderChannelGetPropertyValue(h, "p", "double", 1, n()))},
-        {Channels, 0, nullptr, CALL(coderChannelGetLastError(h, id.data(), message.data()))},
-        {Channels, 0, nullptr, CALL(coderChannelHasSyncError(h, f()))},
-        {Channels, 0, nullptr, CALL(coderChannelGetLastSyncError(h, id.data(), message.data()))},
-        {Channels, 1, nullptr, CALL(coderChannelHasAsyncError(h, f()))},
-        {Channels, 0, nullptr, CALL(coderChannelGetLastAsyncError(h, id.data(), message.data()))},
-        {Streams, 0, nullptr, coderStreamGetChannel},
-        {Streams, 1, nullptr, CALL(coderStreamIsSupported(h, f()))},
-        {Streams, 1, "isDeviceDone", CALL(coderStreamIsDeviceDone(h, f()))},
-        {Streams, 1, "isOpen", CALL(coderStreamIsOpen(h, f()))},
-        {Streams, 1, "getCountDimension", CALL(coderStreamGetCountDimension(h, n()))},
-        {Streams, 1, "getDataAvailable", CALL(coderStreamGetDataAvailable(h, n()))},
-        {Streams, 1, "getSpaceAvailable", CALL(coderStreamGetSpaceAvailable(h, n()))},
-        {Streams, 1, "flush", coderStreamFlush},
-        {Streams, 1, "addFilter", CALL(coderStreamAddFilter(h, text, 1, text, "int8", 1, text))},
-        {Streams, 1, "tuneFilters", CALL(coderStreamTuneFilters(h, 1, text, "int8", 1, text))},
-        {Inputs, 1, "peekCounts", CALL(coderInputStreamPeek(h, &total, &counts, &buffers, 1))},
-        {Inputs, 1, "read", CALL(coderInputStreamReadBuffers(h, 1, 1))},
-        {Inputs, 1, nullptr, CALL(coderInputStreamReadBufferData(h, 1, 0, text, "double", 1, n()))},
-        {Outputs, 1, "write",
-         CALL(coderOutputStreamWriteTypedDataOld(h, &total, 1, "int8", 9, text))},
+        {Channels, 1, "init", "", CALL(ChannelInit, 1, text, "char", 9, text)},
+        {Channels, 1, "open", "", CALL(ChannelOpen, 1, text, "int8", 9, text)},
+        {Channels, 1, "execute", "", CALL(ChannelExecute, "", 1, text, "int8", 1, text)},
+        {Channels, 1, "close", "", CALL(ChannelClose)},
+        {Channels, 1, "term", "", CALL(ChannelTerm)},
+        {Channels, 1, "isOpen", "open", CALL(ChannelIsOpen, flag)},
+        {Channels, 1, "", "", CALL(ChannelGetInputStream)},
+        {Channels, 1, "", "", CALL(ChannelGetOutputStream)},
+        {Channels, 1, "", "destination", CALL(ChannelGetPropertyValue, "p", "double", 1, array)},
+        {Channels, 0, "", "", CALL(ChannelGetLastError, id, message)},
+        {Channels, 0, "", "hasError", CALL(ChannelHasSyncError, flag)},
+        {Channels, 0, "", "", CALL(ChannelGetLastSyncError, id, message)},
+        {Channels, 1, "", "hasError", CALL(ChannelHasAsyncError, flag)},
+        {Channels, 0, "", "", CALL(ChannelGetLastAsyncError, id, message)},
+        {Streams, 0, "", "", CALL(StreamGetChannel)},
+        {Streams, 1, "", "supported", CALL(StreamIsSupported, flag)},
+        {Streams, 1, "isDeviceDone", "done", CALL(StreamIsDeviceDone, flag)},
+        {Streams, 1, "isOpen", "open", CALL(StreamIsOpen, flag)},
+        {Streams, 1, "getCountDimension", "dimension", CALL(StreamGetCountDimension, number)},
+        {Streams, 1, "getDataAvailable", "available", CALL(StreamGetDataAvailable, number)},
+        {Streams, 1, "getSpaceAvailable", "space", CALL(StreamGetSpaceAvailable, number)},
+        {Streams, 1, "flush", "", CALL(StreamFlush)},
+        {Streams, 1, "addFilter", "", CALL(StreamAddFilter, text, 1, text, "int8", 1, text)},
+        {Streams, 1, "tuneFilters", "", CALL(StreamTuneFilters, 1, text, "int8", 1, text)},
+        {Inputs, 1, "peekCounts", "totalCounts",
+         CALL(InputStreamPeek, number, &counts, &buffers, 1)},
+        {Inputs, 1, "read", "", CALL(InputStreamReadBuffers, 1, 1)},
+        {Inputs, 1, "", "destination",
+         CALL(InputStreamReadBufferData, 1, 0, text, "double", 1, array)},
+        {Outputs, 1, "write", "written",
+         CALL(OutputStreamWriteTypedDataOld, number, 1, "int8", 9, text)},
     };
 };
 
-} // namespace
-
-TEST_F(ExportedCallsTest, NullHandlesFailAndNothingElse)
+TEST_F(ExportedCallsTest, FailuresAnswerNothingAndLastErrorIsClearedOrKept)
 {
-    for (const Call& call : calls) {
-        EXPECT_FALSE(call.run(nullptr));
-    }
     coderInputStreamFreeBuffer(nullptr, 1);
     coderChannelDestroy(nullptr);
-    EXPECT_EQ(flag.written() + number.written() + id.written() + message.written(), "");
-    EXPECT_EQ(total, 0.0); // reset before all else
-    EXPECT_EQ(counts, 1.0);
-}
-
-TEST_F(ExportedCallsTest, LastErrorIsClearedOrKeptAndFailuresWriteNothing)
-{
     for (const Call& call : calls) {
-        for (std::size_t i = 0; i < handles(call.target).size(); ++i) {
-            SCOPED_TRACE(&call - calls.data());
+        failure(call, nullptr);
+        for (std::size_t i = 0; i < handles(call).size(); ++i) {
             refresh();
             EXPECT_EQ(coderChannelIsOpen(channel, nullptr), 0);
-            EXPECT_TRUE(call.run(handles(call.target)[i]));
-            EXPECT_EQ(lastError() == "|", call.clears != 0);
-            if (call.operation != nullptr) {
-                refresh();
+            EXPECT_TRUE(call.run(handles(call)[i], answer.data()));
+            EXPECT_EQ(lastError() == "|", call.clears != 0) << &call - calls.data();
+            if (!call.operation.empty()) {
                 core.on[call.operation] = [] { throw brenixcore::CouldNotLoadFilter(""); };
-                EXPECT_FALSE(call.run(handles(call.target)[i]));
-                EXPECT_EQ(lastError(), "brenix:Stream:couldNotLoadFilter|");
-                EXPECT_EQ(flag.written() + number.written(), "");
-                const bool resets = call.operation == "peekCounts"s || call.operation == "write"s;
-                EXPECT_EQ(total, resets ? 0 : 1);
-                core.on.clear();
+                EXPECT_EQ(failure(call, handles(call)[i]), "brenix:Stream:couldNotLoadFilter|");
             }
         }
     }
@@ -128,104 +135,83 @@ TEST_F(ExportedCallsTest, LastErrorIsClearedOrKeptAndFailuresWriteNothing)
 
 TEST_F(ExportedCallsTest, MissingStreamsAndWrongDirectionsAreNotSupported)
 {
-    const auto expectNotSupported = [&](const Call& call, void* handle, bool isInput) {
-        SCOPED_TRACE(&call - calls.data());
-        EXPECT_FALSE(call.run(handle));
-        EXPECT_EQ(lastError(), "brenix:"s + (isInput ? "In" : "Out") + "putStream:notSupported|");
-    };
+    const std::string noInput = "brenix:InputStream:notSupported|";
+    const std::string noOutput = "brenix:OutputStream:notSupported|";
     for (const Call& call : calls) {
         if (call.target == Inputs || call.target == Outputs) {
             const bool isInput = call.target == Inputs;
-            expectNotSupported(call, isInput ? output : input, isInput);
+            EXPECT_EQ(failure(call, isInput ? output : input), isInput ? noInput : noOutput);
         }
     }
     coderInputStreamFreeBuffer(output, 1);
     EXPECT_EQ(lastError(), "|");
-    core.hasInput = core.hasOutput = false;
+    core.hasStreams = false;
     init();
     for (const Call& call : calls) {
-        for (void* handle : handles(call.target)) {
-            if (call.target != Channels && call.operation != nullptr) {
-                expectNotSupported(call, handle, handle == input);
+        for (void* handle : handles(call)) {
+            if (call.target != Channels && !call.operation.empty()) {
+                EXPECT_EQ(failure(call, handle), handle == input ? noInput : noOutput);
             }
         }
     }
+    // Nor are the options read.
+    EXPECT_EQ(coderStreamAddFilter(input, "f", 1, "o", "int24", 1, ""), 0);
+    EXPECT_EQ(lastError(), noInput);
+    EXPECT_EQ(coderStreamTuneFilters(output, 1, "o", "int24", 1, ""), 0);
+    EXPECT_EQ(lastError(), noOutput);
     EXPECT_EQ(takeLog(), Log{});
-    EXPECT_EQ(coderStreamIsSupported(input, f()), 1);
-    EXPECT_EQ(flag.written() + number.written(), "\0"s);
+    uint8_t supported = 2;
+    EXPECT_EQ(coderStreamIsSupported(input, &supported), 1);
+    EXPECT_EQ(supported, 0);
 }
 
 TEST_F(ExportedCallsTest, EveryAllocationMayFail)
 {
     for (const Call& call : calls) {
-        bool failed = true;
-        for (long k = 1; failed; ++k) {
-            SCOPED_TRACE(&call - calls.data());
-            ASSERT_LT(k, 100);
-            refresh();
-            void* const handle = handles(call.target)[0];
-            failingAllocation = k;
-            const bool succeeded = call.run(handle);
-            failed = std::exchange(failingAllocation, 0) == 0;
-            EXPECT_NE(succeeded, failed);
-            EXPECT_EQ(lastError(), failed ? unexpected + "std::bad_alloc" : "|");
-        }
+        sweep([&] { return call.run(handles(call)[0], answer.data()) ? "|" : lastError(); });
     }
     const std::string path = std::filesystem::current_path();
-    bool failed = true;
-    for (long k = 1; failed; ++k) {
-        ASSERT_LT(k, 100);
-        id = message = Buffer(CODER_ERROR_SIZE);
-        Buffer absolute(CODER_PATH_SIZE);
-        failingAllocation = k;
-        coderComputeAbsolutePath(path.c_str(), absolute.data());
-        failed = std::exchange(failingAllocation, k) == 0;
-        EXPECT_EQ(absolute.text(), failed ? "" : path);
-        void* const created = coderChannelCreate(text, text, id.data(), message.data(), 0, 0);
-        const bool createFailed = std::exchange(failingAllocation, 1) == 0;
+    Buffer absolute(CODER_PATH_SIZE);
+    sweep([&] {
+        coderComputeAbsolutePath(path.c_str(), absolute);
+        const AllocationsAllowed allowed;
+        return absolute.text() == path ? "|" : unexpected + "std::bad_alloc";
+    });
+    sweep([&] {
+        void* const created = coderChannelCreate(text, text, id, message, 0, 0);
+        const AllocationsAllowed allowed;
+        failingAllocation = 1;
         coderChannelDestroy(created); // needs no memory
         EXPECT_EQ(std::exchange(failingAllocation, 0), 1);
-        EXPECT_EQ(created == nullptr, createFailed);
-        EXPECT_EQ(id.written(), createFailed ? "brenix:Channel:unexpectedException\0"s : "");
-        failed = failed || createFailed;
-    }
+        return created == nullptr ? error() : "|";
+    });
 }
 
 TEST_F(ExportedCallsTest, NullPointersAreNamed)
 {
-    char* const m = message.data();
-    const std::pair<std::string, std::function<int(void*)>> rows[] = {
-        {"open", CALL(coderChannelIsOpen(channel, nullptr))},
-        {"hasError", CALL(coderChannelHasSyncError(channel, nullptr))},
-        {"hasError", CALL(coderChannelHasAsyncError(channel, nullptr))},
-        {"errorId", CALL(coderChannelGetLastSyncError(channel, nullptr, m))},
-        {"errorMessage", CALL(coderChannelGetLastSyncError(channel, m, nullptr))},
-        {"errorId", CALL(coderChannelGetLastAsyncError(channel, nullptr, m))},
-        {"errorMessage", CALL(coderChannelGetLastAsyncError(channel, m, nullptr))},
-        {"supported", CALL(coderStreamIsSupported(input, nullptr))},
-        {"done", CALL(coderStreamIsDeviceDone(input, nullptr))},
-        {"open", CALL(coderStreamIsOpen(input, nullptr))},
-        {"dimension", CALL(coderStreamGetCountDimension(input, nullptr))},
-        {"available", CALL(coderStreamGetDataAvailable(input, nullptr))},
-        {"space", CALL(coderStreamGetSpaceAvailable(input, nullptr))},
-        {"totalCounts", CALL(coderInputStreamPeek(input, nullptr, n(), &buffers, 1))},
-        {"bufferCounts", CALL(coderInputStreamPeek(input, &total, nullptr, n(), 1))},
-        {"numBuffers", CALL(coderInputStreamPeek(input, &total, n(), nullptr, 1))},
-        {"destination",
-         CALL(coderInputStreamReadBufferData(input, 1, 0, text, "double", 1, nullptr))},
-        {"written", CALL(coderOutputStreamWriteTypedDataOld(output, nullptr, 0, ""))},
-    };
     EXPECT_ANY_THROW(raiseEvent("error", "id", "m"));
     std::thread(raiseEvent, "error", "id", "m").join();
     takeLog();
-    for (const auto& [argument, run] : rows) {
-        EXPECT_EQ(run(nullptr), 0);
+    const auto expectNamed = [&](int result, const std::string& argument) {
+        EXPECT_EQ(result, 0);
         EXPECT_EQ(lastError(), unexpected + "Argument " + argument + " must not be null.");
+    };
+    for (const Call& call : calls) {
+        if (!call.argument.empty()) {
+            expectNamed(call.run(handles(call)[0], nullptr), call.argument);
+        }
     }
-    EXPECT_EQ(coderChannelGetLastError(channel, nullptr, m), 0);
-    EXPECT_EQ(coderChannelGetLastError(channel, m, nullptr), 0);
-    EXPECT_EQ(lastError(), unexpected + "Argument written must not be null.");
-    EXPECT_EQ(number.written(), "");
+    double total = 0;
+    char* const m = message;
+    expectNamed(coderChannelGetLastSyncError(channel, nullptr, m), "errorId");
+    expectNamed(coderChannelGetLastSyncError(channel, m, nullptr), "errorMessage");
+    expectNamed(coderChannelGetLastAsyncError(channel, nullptr, m), "errorId");
+    expectNamed(coderChannelGetLastAsyncError(channel, m, nullptr), "errorMessage");
+    expectNamed(coderInputStreamPeek(input, &total, &counts, nullptr, 1), "numBuffers");
+    expectNamed(coderInputStreamPeek(input, &total, nullptr, &buffers, 1), "bufferCounts");
+    expectNamed(coderChannelGetLastError(channel, nullptr, m), "bufferCounts"); // still this one
+    expectNamed(coderChannelGetLastError(channel, m, nullptr), "bufferCounts");
+    EXPECT_EQ(answer.written(), "");
     EXPECT_EQ(takeLog(), Log{});
     EXPECT_EQ(syncError() + asyncError(), "id|mid|m"); // still there
 }

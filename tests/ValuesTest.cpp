@@ -1,90 +1,90 @@
-// Typed values on their way in, as options, and out, as property values.
+// Typed values on their way in, as options and data, and out, as property values.
 
 #include "scripted/ChannelFixture.hpp"
 
-#include <climits>
 #include <limits>
-#include <sstream>
 
 using namespace scripted;
 
-namespace
-{
+static constexpr const char* types[] = {"double", "logical", "uint8",  "int8",  "uint64", "int64",
+                                        "uint32", "int32",   "uint16", "int16", "float",  "char"};
 
 class ValuesTest : public ChannelTest
 {
 protected:
-    /// The options as the core receives them, or the error.
-    std::string open(uint64_t count, const char* name, const char* type, int elements,
-                     const void* data)
+    /// The option "o" as the core receives it, which has to be of a class, or the error.
+    template <typename Property>
+    const Property& option(const std::string& type, int count, const void* data)
     {
-        if (coderChannelOpen(channel, count, CODER_OPTION(name, type, elements, data)) == 0) {
-            EXPECT_EQ(takeLog(), Log{});
-            return lastError().substr(unexpected.size());
-        }
-        return takeLog().at(0);
+        EXPECT_EQ(coderChannelOpen(channel, 1, CODER_OPTION("o", type.c_str(), count, data)), 1);
+        return as<Property>(*core.options, "o");
+    }
+    std::string badOption(const char* type, int count, const void* data, const char* name = "o")
+    {
+        EXPECT_EQ(coderChannelOpen(channel, 1, CODER_OPTION(name, type, count, data)), 0);
+        return unexpectedError();
     }
 
-    /// "" when "p" could be copied out, or the error.
-    std::string copy(const std::string& type, int capacity, Buffer& destination)
+    /// "" when a property could be copied out, or the error.
+    std::string copy(const char* type, int capacity, void* to, const char* name = "p")
     {
-        return coderChannelGetPropertyValue(channel, "p", type.c_str(), capacity,
-                                            destination.data()) == 1
-                   ? ""
-                   : lastError().substr(unexpected.size());
-    }
-
-    static std::string wrongType(const std::string& type)
-    {
-        return "Property: p is not of the expected type: " +
-               (type == "char" ? "string or ustring scalar or vector." : type);
+        const int result = coderChannelGetPropertyValue(channel, name, type, capacity, to);
+        return result == 1 ? "" : unexpectedError();
     }
 
     /// A property of `count` elements reads as these bytes where they fit, as this type only.
     void expectCopies(IPropertyInfo* property, const std::string& type, int count,
                       const std::string& bytes)
     {
-        SCOPED_TRACE(type + " with " + std::to_string(count));
         init(property);
         for (const int capacity : {INT_MIN, -1, 0, count - 1, count, count + 1, INT_MAX}) {
             Buffer destination(bytes.size());
             const bool fits = count == 0 || capacity >= count;
-            EXPECT_EQ(copy(type, capacity, destination),
+            EXPECT_EQ(copy(type.c_str(), capacity, destination.data()),
                       fits ? "" : "Property value: p is too large for allocated space.");
-            EXPECT_EQ(destination.written(), fits ? bytes : "");
+            EXPECT_EQ(destination.written(), fits ? bytes : "") << type << count;
         }
+        expectOtherTypesFail(type);
+    }
+
+    void expectOtherTypesFail(const std::string& type)
+    {
         Buffer destination(64);
-        const auto expectWrongType = [&](const std::string& other, auto) {
-            EXPECT_EQ(other == type ? wrongType(other) : copy(other, 64, destination),
-                      wrongType(other));
-        };
-        forEachType(expectWrongType);
-        expectWrongType("char", 0);
+        for (const std::string other : types) {
+            const std::string what =
+                other == "char" ? "string or ustring scalar or vector." : other;
+            if (other != type) {
+                EXPECT_EQ(copy(other.c_str(), 64, destination.data()),
+                          "Property: p is not of the expected type: " + what);
+            }
+        }
         EXPECT_EQ(destination.written(), "");
     }
 };
 
-} // namespace
-
 TEST_F(ValuesTest, NumbersOfEveryTypeAndShape)
 {
-    forEachType([&](const char* type, auto zero) {
-        using T = decltype(zero);
+    const auto check = [&]<typename T>(const std::string& type, T) {
         const T least = std::numeric_limits<T>::lowest();
         const T most = std::numeric_limits<T>::max();
-        const T data[] = {least, most, 1};
-        std::ostringstream text;
-        text.precision(std::numeric_limits<double>::max_digits10);
-        text << "open(o=" << type << '[' << +least << ',' << +most << ",1])";
-        EXPECT_EQ(open(1, "o", type, 3, data), text.str());
-        EXPECT_EQ(open(1, "o", type, 1, data + 2), "open(o="s + type + " 1)");
-
-        expectCopies(scalar<T>("p", most), type, 1, bytesOf<T>({most}));
-        expectCopies(vectorOf<T>("p", {1, least, most}), type, 3, bytesOf<T>({1, least, most}));
-        expectCopies(arrayOf<T>("p", {1, least, most}), type, 3, bytesOf<T>({1, least, most}));
-        expectCopies(vectorOf<T>("p", {}), type, 0, "");
-        expectCopies(arrayOf<T>("p", {}), type, 0, "");
-    });
+        const T data[] = {1, least, most};
+        expectCopies(scalar("p", most), type, 1, bytesOf(data + 2, 1));
+        expectCopies(vectorOf<T>({1, least, most}), type, 3, bytesOf(data, 3));
+        expectCopies(arrayOf<T>({1, least, most}), type, 3, bytesOf(data, 3));
+        EXPECT_EQ(option<TScalarProperty<T>>(type, 1, data + 2).value, most);
+        EXPECT_EQ(option<TVectorProperty<T>>(type, 3, data).values, std::vector<T>(data, data + 3));
+        double written = 0;
+        coderOutputStreamWriteTypedDataOld(output, &written, 1, type.c_str(), 3, data);
+        const auto& array = as<TPointerProperty<T>>(*core.written.at(0), "data");
+        EXPECT_EQ(bytesOf(array.data, array.count), bytesOf(data, 3));
+    };
+    [&]<typename... T>(std::tuple<T...>) {
+        const auto* type = types;
+        (check(*type++, T()), ...);
+    }(std::tuple<double, bool, unsigned char, signed char, unsigned long, long, unsigned int, int,
+                 unsigned short, short, float>());
+    expectCopies(vectorOf<int>({}), "int32", 0, "");
+    expectCopies(arrayOf<int>({}), "int32", 0, "");
 }
 
 TEST_F(ValuesTest, TextsOut)
@@ -95,13 +95,12 @@ TEST_F(ValuesTest, TextsOut)
     const std::pair<IPropertyInfo*, std::string> rows[] = {
         {scalar("p", "Hi\0\xC3\xA9"s), "Hi\0\xC3\xA9\0"s},
         {scalar("p", wide), narrow + end},
-        {vectorOf<std::string>("p", {"x", "", "y"}), "x,,y\0"s},
-        {vectorOf<std::string>("p", {}), end},
-        {arrayOf<std::string>("p", {"x", "", "y"}), "x,,y\0"s},
-        {arrayOf<std::string>("p", {}), end},
-        {vectorOf<std::u16string>("p", {u"x", wide}), "x," + narrow + end},
-        {arrayOf<std::u16string>("p", {wide, u""}), narrow + "," + end},
-        {arrayOf<std::u16string>("p", {}), end},
+        {vectorOf<std::string>({"x", "", "y"}), "x,,y\0"s},
+        {vectorOf<std::string>({}), end},
+        {arrayOf<std::string>({"x", "", "y"}), "x,,y\0"s},
+        {vectorOf<std::u16string>({u"x", wide}), "x," + narrow + end},
+        {arrayOf<std::u16string>({wide, u""}), narrow + "," + end},
+        {arrayOf<std::u16string>({}), end},
     };
     for (const auto& [property, bytes] : rows) {
         expectCopies(property, "char", static_cast<int>(bytes.size()), bytes);
@@ -110,65 +109,49 @@ TEST_F(ValuesTest, TextsOut)
 
 TEST_F(ValuesTest, TextAndLogicalOptionsAndBadOnes)
 {
-    const std::vector<char> bytes = {'a', 'b', '\0', '\xE9', '\x80', '\x7F', 2};
+    using Text = TScalarProperty<std::u16string>;
+    using Logicals = TVectorProperty<bool>;
+    const char bytes[] = {'a', 'b', '\0', '\xE9', '\x80', '\x7F', 2};
+    EXPECT_EQ(option<Text>("char", 10, bytes).value, u"ab");
+    EXPECT_EQ(option<Text>("char", 1, bytes).value, u"a");
+    EXPECT_EQ(option<Text>("char", 0, nullptr).value, u"");
+    EXPECT_EQ(option<Text>("char", INT_MIN, bytes).value, u"");
+    EXPECT_EQ(option<Text>("char", 4, bytes + 3).value, u"\uFFE9\uFF80\x7F\x02"); // no further
+    EXPECT_EQ(option<Logicals>("logical", 3, bytes + 1).values, std::vector({true, false, true}));
+    EXPECT_EQ(option<TScalarProperty<bool>>("logical", 1, bytes + 6).value, true);
     const std::string length = "Unsupported length for data o. Length must be 1 or greater.";
-    const struct {
-        const char* type;
-        int count;
-        const char* data;
-        std::string expected;
-    } rows[] = {
-        {"char", 10, bytes.data(), "open(o=char ab)"},
-        {"char", 1, bytes.data(), "open(o=char a)"},
-        {"char", 0, nullptr, "open(o=char )"},
-        {"char", INT_MIN, bytes.data(), "open(o=char )"},
-        {"char", 4, &bytes[3], "open(o=char \\65513\\65408\x7F\x02)"}, // reads no further
-        {"logical", 3, &bytes[1], "open(o=logical[1,0,1])"},
-        {"logical", 1, &bytes[6], "open(o=logical 1)"},
-        {"int32", 0, nullptr, length},
-        {"logical", -5, bytes.data(), length},
-        {"int8", 1, nullptr, "No data for o."},
-        {"char", 1, nullptr, "No data for o."},
-        {"Double", 1, bytes.data(), "Unsupported type: Double for option o."},
-        {"", 0, nullptr, "Unsupported type:  for option o."},
-    };
-    for (const auto& row : rows) {
-        EXPECT_EQ(open(1, "o", row.type, row.count, row.data), row.expected);
-    }
-    EXPECT_NE(open(1, nullptr, "int8", 1, bytes.data()).find("null"), std::string::npos);
-    EXPECT_NE(open(1, "o", nullptr, 1, bytes.data()).find("null"), std::string::npos);
+    EXPECT_EQ(badOption("logical", 0, nullptr), length);
+    EXPECT_EQ(badOption("logical", -5, nullptr), length);
+    EXPECT_EQ(badOption("int8", 1, nullptr), "No data for o.");
+    EXPECT_EQ(badOption("char", 1, nullptr), "No data for o.");
+    EXPECT_EQ(badOption("Double", 1, bytes), "Unsupported type: Double for option o.");
+    EXPECT_EQ(badOption("", 0, nullptr), "Unsupported type:  for option o.");
+    EXPECT_NE(badOption("int8", 1, bytes, nullptr).find("null"), std::string::npos);
+    EXPECT_NE(badOption(nullptr, 1, bytes).find("null"), std::string::npos);
     // A list ends at its first bad option, however long it is said to be.
-    EXPECT_EQ(coderChannelOpen(channel, UINT64_MAX, CODER_OPTION("o", "int8", 1, bytes.data()),
-                               CODER_OPTION("bad", "int24", 1, bytes.data())),
-              0);
-    EXPECT_EQ(lastError(), unexpected + "Unsupported type: int24 for option bad.");
-    EXPECT_EQ(coderChannelExecute(channel, "go!", 3, CODER_OPTION("z", "int8", 1, &bytes[6]),
-                                  CODER_OPTION("a", "logical", 1, &bytes[6]),
-                                  CODER_OPTION("a", "uint8", 1, &bytes[6])),
-              1);
-    EXPECT_EQ(coderChannelInit(channel, 1, CODER_OPTION("", "int8", 1, &bytes[6])), 1);
-    EXPECT_EQ(takeLog(), (Log{"execute(go!, a=uint8 2, z=int8 2)", "init(=int8 2)",
-                              "getInputStream()", "getOutputStream()"}));
+    takeLog();
+    EXPECT_EQ(coderChannelOpen(channel, UINT64_MAX, "o", "int8", 1, "", "bad", "int24", 1, ""), 0);
+    EXPECT_EQ(unexpectedError(), "Unsupported type: int24 for option bad.");
+    EXPECT_EQ(coderChannelInit(channel, 1, "", "int8", 1, ""), 1);
+    // Of two options of one name the later counts.
+    coderChannelExecute(channel, "go!", 2, "a", "int8", 1, "", "a", "uint8", 1, "\2");
+    EXPECT_EQ(as<TScalarProperty<unsigned char>>(*core.options, "a").value, 2);
+    EXPECT_EQ(takeLog(),
+              (Log{"init([])", "getInputStream()", "getOutputStream()", "execute(go!, [a])"}));
 }
 
 TEST_F(ValuesTest, WhatCannotBeRead)
 {
-    Buffer destination(8);
-    init(new Counted<coderconverter::TPointerProperty<int>>("p", nullptr, 2U));
-    EXPECT_EQ(copy("int32", 2, destination), wrongType("int32"));
-    EXPECT_EQ(copy("int24", 2, destination), "Custom property: p is not a supported type: int24");
-    init(new Counted<coderconverter::TPointerProperty<std::string>>("p", nullptr, 2U));
-    EXPECT_EQ(copy("char", 8, destination), wrongType("char"));
-    init(nullptr);
-    EXPECT_EQ(copy("char", 8, destination), wrongType("char"));
-    EXPECT_EQ(copy("logical", 8, destination), wrongType("logical"));
-    const auto expectError = [&](Names names, void* to, const std::string& text) {
-        EXPECT_EQ(coderChannelGetPropertyValue(channel, names.first, names.second, 1, to), 0);
-        EXPECT_NE(lastError().find(text), std::string::npos) << text;
-    };
-    expectError({"q", "int24"}, destination.data(), "|Custom property: q not found.");
-    expectError({nullptr, "int32"}, destination.data(), "null");
-    expectError({"p", nullptr}, destination.data(), "null");
-    expectError({"p", "int32"}, nullptr, "|Argument destination must not be null.");
-    EXPECT_EQ(destination.written(), "");
+    int value = 0;
+    IPropertyInfo* const noNumbers = new Counted<TPointerProperty<int>>("p", nullptr, 2U);
+    IPropertyInfo* const noTexts = new Counted<TPointerProperty<std::string>>("p", nullptr, 2U);
+    for (IPropertyInfo* property : std::vector<IPropertyInfo*>{noNumbers, noTexts, nullptr}) {
+        init(property);
+        expectOtherTypesFail("");
+    }
+    EXPECT_EQ(copy("int24", 2, &value), "Custom property: p is not a supported type: int24");
+    EXPECT_EQ(copy("int24", 1, &value, "q"), "Custom property: q not found.");
+    EXPECT_NE(copy("int32", 1, &value, nullptr).find("null"), std::string::npos);
+    EXPECT_NE(copy(nullptr, 1, &value).find("null"), std::string::npos);
+    EXPECT_EQ(value, 0);
 }

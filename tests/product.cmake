@@ -6,7 +6,6 @@ add_executable(product-tests
     PathTest.cpp
     StreamsTest.cpp
     ValuesTest.cpp
-    scripted/FailingAllocations.cpp
     scripted/ScriptedCore.cpp
     $<TARGET_OBJECTS:brenixcoder-objects>)
 target_include_directories(product-tests PRIVATE

@@ -1,6 +1,7 @@
 #include "brenixcore/Channel.hpp"
 
 #include "Converter.hpp"
+#include "Packets.hpp"
 #include "Plugin.hpp"
 #include "Stream.hpp"
 #include "brenixcore/plugin/Options.hpp"
@@ -27,7 +28,8 @@ class Event : public CustomEvent
 {
 public:
     Event(const char* eventName, const char* eventIdentifier, const char* eventMessage)
-        : name(eventName), identifier(eventIdentifier), message(eventMessage)
+        : name(textOf(eventName)), identifier(textOf(eventIdentifier)),
+          message(textOf(eventMessage))
     {
     }
     const char* getEventName() override { return name; }
@@ -35,6 +37,8 @@ public:
     const char* getMessage() override { return message; }
 
 private:
+    static const char* textOf(const char* text) { return text == nullptr ? "" : text; }
+
     const char* name;
     const char* identifier;
     const char* message;
@@ -161,6 +165,7 @@ bool Channel::Impl::enter(plugin::Packet& packet, bool waits)
     if (!packet.fields || packet.counts == 0) {
         throw std::invalid_argument("The device pushed a packet without counts.");
     }
+    requireCopyable(*packet.fields);
     Stream::Impl& stream = *input->impl;
     if (!stream.waitToPush(waits)) {
         return false;

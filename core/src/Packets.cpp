@@ -70,12 +70,12 @@ struct Slicer {
     }
 };
 
-Slicer sliceField(const std::string& name, void* property, Slicer slicer)
+template <typename Visitor>
+void visitField(const std::string& name, void* property, Visitor&& visitor)
 {
-    if (!plugin::visitProperty(asProperty(property), slicer)) {
-        throw std::runtime_error("Field " + name + " is of a class that cannot be copied.");
+    if (!plugin::visitProperty(asProperty(property), visitor)) {
+        throw std::invalid_argument("Field " + name + " is of a class that cannot be copied.");
     }
-    return slicer;
 }
 
 } // namespace
@@ -85,7 +85,8 @@ plugin::Packet slice(const plugin::Packet& packet, std::uint64_t first, std::uin
     plugin::Packet part;
     part.counts = length;
     for (const auto& [name, property] : *packet.fields) {
-        Slicer slicer = sliceField(name, property, {first, length, packet.counts, nullptr});
+        Slicer slicer{first, length, packet.counts, nullptr};
+        visitField(name, property, slicer);
         storeProperty(*part.fields, name, std::move(slicer.result));
     }
     return part;
@@ -95,13 +96,21 @@ plugin::Packet copyFields(const PropertyMap& fields)
 {
     plugin::Packet copy;
     for (const auto& [name, property] : fields) {
-        Slicer slicer = sliceField(name, property, {0, 1, 1, nullptr});
+        Slicer slicer{0, 1, 1, nullptr};
+        visitField(name, property, slicer);
         storeProperty(*copy.fields, name, std::move(slicer.result));
         if (copy.counts == 0) {
             copy.counts = slicer.elements;
         }
     }
     return copy;
+}
+
+void requireCopyable(const PropertyMap& fields)
+{
+    for (const auto& [name, property] : fields) {
+        visitField(name, property, [](const auto& /*known*/) {});
+    }
 }
 
 } // namespace brenixcore

@@ -16,6 +16,9 @@ plugin::Packet slice(const plugin::Packet& packet, std::uint64_t first, std::uin
 /// single value or a text.
 plugin::Packet copyFields(const brenixplugin::PropertyMap& fields);
 
+/// Throws when a field is of a class that these do not know.
+void requireCopyable(const brenixplugin::PropertyMap& fields);
+
 } // namespace brenixcore
 
 #endif

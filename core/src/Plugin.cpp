@@ -3,6 +3,7 @@
 #include <dlfcn.h>
 
 #include <cstdint>
+#include <optional>
 #include <stdexcept>
 
 namespace brenixcore
@@ -42,10 +43,22 @@ void PluginLibrary::Unload::operator()(void* library) const noexcept
 
 PluginLibrary::PluginLibrary(const std::string& name) : path(pluginPath(name))
 {
-    // dlopen is declared not to throw, but a static object of the plug-in may, and then the
-    // exception must find its way.
+    // dlopen is declared not to throw, but a static object of the plug-in may. The library is then half
+    // loaded and held once, and must not pass for loaded the next time.
     void* (*const volatile open)(const char*, int) = dlopen;
-    handle.reset(open(path.c_str(), RTLD_NOW | RTLD_LOCAL));
+    std::optional<std::string> thrown;
+    try {
+        handle.reset(open(path.c_str(), RTLD_NOW | RTLD_LOCAL));
+    } catch (...) {
+        thrown = currentExceptionText();
+    }
+    if (thrown) {
+        handle.reset(dlopen(path.c_str(), RTLD_NOW | RTLD_NOLOAD));
+        if (handle) {
+            dlclose(handle.get());
+        }
+        throw std::runtime_error(*thrown);
+    }
     if (!handle) {
         throw std::runtime_error(loaderError());
     }

@@ -63,7 +63,7 @@ void Stream::Impl::push(plugin::Packet packet)
 }
 
 void Stream::Impl::refill()
-{
+try {
     while (!pending.empty()) {
         QueuedPacket& next = pending.front();
         std::uint64_t part = next.counts();
@@ -86,6 +86,7 @@ void Stream::Impl::refill()
         }
         counts += part;
     }
+} catch (const std::bad_alloc&) { // the rest waits on, and the next read tries again
 }
 
 std::optional<plugin::Packet> Stream::Impl::pull(bool waits)
@@ -166,10 +167,7 @@ Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
         refuse("there are " + std::to_string(counts) + " and " + reason());
     }
     Packets taken = take(count);
-    try {
-        refill();
-    } catch (const std::bad_alloc&) { // the next call tries again
-    }
+    refill();
     notifyDevice();
     return taken;
 }
@@ -328,12 +326,15 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
             continue;
         }
         try {
+            const std::uint64_t counts = current->packet.counts;
             stream.converter.convertInput(current->packet);
+            if (!current->packet.fields || current->packet.counts != counts) {
+                throw std::logic_error("The converter changed the number of counts.");
+            }
             current->converted = true;
         } catch (...) {
-            const std::string reason = currentExceptionText();
             taken.packets.erase(current);
-            throw CouldNotConvertInputData(reason);
+            throw CouldNotConvertInputData(currentExceptionText());
         }
     }
     for (QueuedPacket& queued : taken.packets) {
@@ -395,8 +396,11 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
         refuse("the limit is " + std::to_string(stream.limit));
     }
     stream.wait(lock, [&] { return stream.fits(size); });
-    if (stream.deviceDone || !stream.fits(size)) {
+    if (!stream.fits(size)) {
         refuse(std::string("there is no room and ") + stream.reason());
+    }
+    if (size > 0 && stream.phase == Phase::Open && stream.deviceDone) {
+        refuse("the device is done");
     }
     stream.packets.splice(stream.packets.end(), outgoing);
     stream.counts += size;

@@ -14,7 +14,7 @@
  * lets a C++ exception out, also when memory runs out.
  *
  * A null channel or stream handle makes every function return its failure value (0, NULL or
- * nothing) and do nothing else. A null pointer for an out-value or a destination is an error
+ * nothing) and do nothing else, but for the out-values that are reset first. A null pointer for an out-value or a destination is an error
  * ("Argument <name> must not be null.") and nothing is done. A handle is not checked further: it
  * must be one that the library gave out and that is still valid.
  *
@@ -28,21 +28,25 @@
  *
  *   | identifier | meaning |
  *   |---|---|
- *   | brenix:Channel:couldNotLoadDevice, ...:couldNotLoadConverter | plug-in not found or not
- * loadable | | brenix:Channel:couldNotCreateDevice, ...:couldNotCreateConverter | plug-in loaded,
- * object not made | | brenix:Stream:couldNotLoadFilter, ...:couldNotCreateFilter | the same for a
- * filter | | brenix:Stream:cannotAddFilterWhileOpen | filters are added before the channel opens |
- *   | brenix:InputStream:notSupported, brenix:OutputStream:notSupported | no stream of this
- * direction | | brenix:InputStream:synchronousInputNotPossible | the counts asked for cannot be had
- * (in time) | | brenix:OutputStream:synchronousOutputNotPossible | the data cannot be taken (in
- * time) | | brenix:InputStream:couldNotConvertInputData | the converter failed on data read | |
- * brenix:OutputStream:couldNotConvertOutputData | the converter failed on data written | |
- * brenix:Channel:unexpectedException | everything else; the message says what |
+ *   | brenix:Channel:couldNotLoadDevice | device plug-in not found or not loadable |
+ *   | brenix:Channel:couldNotLoadConverter | the same for the converter |
+ *   | brenix:Channel:couldNotCreateDevice | plug-in loaded, but its device not made |
+ *   | brenix:Channel:couldNotCreateConverter | the same for the converter |
+ *   | brenix:Stream:couldNotLoadFilter | filter plug-in not found or not loadable |
+ *   | brenix:Stream:couldNotCreateFilter | plug-in loaded, but its filter not made |
+ *   | brenix:Stream:cannotAddFilterWhileOpen | filters are added before the channel opens |
+ *   | brenix:InputStream:notSupported | the channel has no input stream |
+ *   | brenix:OutputStream:notSupported | the channel has no output stream |
+ *   | brenix:InputStream:synchronousInputNotPossible | the counts cannot be had (in time) |
+ *   | brenix:OutputStream:synchronousOutputNotPossible | the data cannot be taken (in time) |
+ *   | brenix:InputStream:couldNotConvertInputData | the converter failed on data read |
+ *   | brenix:OutputStream:couldNotConvertOutputData | the converter failed on data written |
+ *   | brenix:Channel:unexpectedException | everything else; the message says what |
  *
- * - The synchronous error: raised by a plug-in inside a call. The call returns 0 and the *last*
- * error stays empty. Kept until it is read.
+ * - The synchronous error: raised by a plug-in inside a call. The call returns 0 and the last error
+ *   stays empty. Kept until it is read.
  * - The asynchronous error: raised by a plug-in on another thread. It interrupts nothing; poll for
- * it. Kept until it is read; a newer one replaces it.
+ *   it. Kept until it is read; a newer one replaces it.
  *
  * ### Typed values
  *
@@ -112,8 +116,7 @@
 #define CODER_OPTION(name, typeName, count, data)                                                  \
     (const char*)(name), (const char*)(typeName), (int)(count), (const void*)(data)
 
-/** One buffer of coderOutputStreamWriteTypedDataOld(): element count, pointer to the first element.
- */
+/** One buffer of coderOutputStreamWriteTypedDataOld(): element count, pointer to the elements. */
 #define CODER_BUFFER(count, data) (int)(count), (const void*)(data)
 
 #ifdef __cplusplus
@@ -159,7 +162,7 @@ CODER_API void* coderChannelCreate(const char* devicePath, const char* converter
  * @param channel     channel handle
  * @param optionCount number of options that follow, each a #CODER_OPTION
  * @return 1, or 0 with the last error: those of option lists, and what the core or the device
- * refuses
+ *         refuses
  */
 CODER_API int coderChannelInit(void* channel, uint64_t optionCount, ...) CODER_NOEXCEPT;
 
@@ -176,7 +179,7 @@ CODER_API int coderChannelOpen(void* channel, uint64_t optionCount, ...) CODER_N
  * @param command     the device's command, NUL-terminated, passed on unchanged
  * @param optionCount number of options that follow, each a #CODER_OPTION
  * @return 1, or 0 with the last error: those of option lists, and what the core or the device
- * refuses
+ *         refuses
  */
 CODER_API int coderChannelExecute(void* channel, const char* command, uint64_t optionCount,
                                   ...) CODER_NOEXCEPT;
@@ -230,7 +233,7 @@ CODER_API void* coderChannelGetOutputStream(void* channel) CODER_NOEXCEPT;
  * @param capacity number of elements (for "char": bytes, the final NUL included) that fit
  * @param ...      one pointer: the destination, an array of `capacity` elements. How many were
  *                 written is not reported; elements beyond them stay as they were. A list of texts
- * is joined with commas.
+ *                 is joined with commas.
  * @return 1, or 0 with brenix:Channel:unexpectedException and one of
  *         - "Custom property: <name> not found."
  *         - "Custom property: <name> is not a supported type: <type name>"
@@ -297,8 +300,7 @@ CODER_API int coderStreamIsOpen(void* stream, uint8_t* open) CODER_NOEXCEPT;
 /** Writes the dimension of the data along which the device counts. */
 CODER_API int coderStreamGetCountDimension(void* stream, double* dimension) CODER_NOEXCEPT;
 
-/** Writes the number of counts in the stream: input that waits to be read, output that the device
- * has yet to take. */
+/** Writes the number of counts in the stream: input yet to be read, output yet to be taken. */
 CODER_API int coderStreamGetDataAvailable(void* stream, double* available) CODER_NOEXCEPT;
 
 /** Writes the number of counts that the stream has room for; INFINITY when it is unlimited. */
@@ -339,12 +341,11 @@ CODER_API int coderStreamTuneFilters(void* stream, uint64_t optionCount, ...) CO
  * @param stream       input stream handle
  * @param totalCounts  receives the sum of the counts reported; 0.0 at once, so also on failure
  * @param bufferCounts receives one count for each reported buffer, oldest first; an array of at
- * least
- *                     `*numBuffers` elements
+ *                     least `*numBuffers` elements
  * @param numBuffers   in: how many elements `bufferCounts` has (negative or NaN is 0); out: how
- * many were written
+ *                     many were written
  * @param maxCounts    list no more counts than this; below 0 is 0, INFINITY lists all. A read of
- * that many counts delivers just these buffers.
+ *                     that many counts delivers just these buffers.
  * @return 1, or 0 with the last error
  */
 CODER_API int coderInputStreamPeek(void* stream, double* totalCounts, double* bufferCounts,
@@ -359,7 +360,8 @@ CODER_API int coderInputStreamPeek(void* stream, double* totalCounts, double* bu
  * @param expectedBuffers in how many buffers they must arrive, as coderInputStreamPeek() told
  * @return 1, or 0 with the last error: brenix:InputStream:synchronousInputNotPossible,
  *         ...:couldNotConvertInputData, or brenix:Channel:unexpectedException with "The number of
- *         buffers read did not match the expected number." (the data read is then lost)
+ *         buffers read did not match the expected number." (the data read is then lost, as it
+ *         is when memory runs out at the last step)
  */
 CODER_API int coderInputStreamReadBuffers(void* stream, double countsToRead,
                                           double expectedBuffers) CODER_NOEXCEPT;

@@ -10,6 +10,12 @@ struct OwnException : std::runtime_error {
     using std::runtime_error::runtime_error;
 };
 
+#if FAULT == 7 // throws from a static object
+struct Static {
+    Static() { throw OwnException("thrown by a static object"); }
+} staticObject;
+#endif
+
 EXPORT std::uint32_t brenixcorePluginAbiVersion()
 {
     if (FAULT == 1) {

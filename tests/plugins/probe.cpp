@@ -86,6 +86,7 @@ public:
             host->updateProperty(makeScalar("Other", 1));
             host->updateProperty(nullptr);
             host->raise("warning", "probe:warning", "is dropped");
+            host->raise(nullptr, nullptr, nullptr);
             host->raise("error", "probe:thread", "from a thread");
         }).join();
     }

@@ -1,40 +1,73 @@
-// What the tests of the exported functions share: a channel on the scripted core, caller buffers
-// that show every byte written, and property objects that count their releases.
+// What the tests of the exported functions share: a core that they script, a channel on it, caller
+// buffers that show every byte written, and property objects that count their releases.
 #ifndef BRENIXCODER_TESTS_SCRIPTED_CHANNELFIXTURE_HPP
 #define BRENIXCODER_TESTS_SCRIPTED_CHANNELFIXTURE_HPP
 
 #include "brenixcoder/coder.h"
-#include "scripted/ScriptedCore.hpp"
+#include "brenixcore/Channel.hpp"
 
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <initializer_list>
-#include <string>
+#include <climits>
+#include <cmath>
+#include <functional>
 #include <thread>
-#include <utility>
-#include <vector>
 
 namespace scripted
 {
 
 using namespace std::string_literals;
-using namespace brenixplugin::kit;
+using brenixplugin::PropertyMap;
 using brenixplugin::interfaces::IPropertyInfo;
 using Log = std::vector<std::string>;
-using Names = std::pair<const char*, const char*>;
+using brenixplugin::kit::coderconverter::TPointerProperty;
+using brenixplugin::kit::device::TScalarProperty;
+using brenixplugin::kit::device::TVectorProperty;
+
+/// The core keeps a log of every call as text, runs the hook that a test set for the operation,
+/// which may throw or raise events, and answers with what the test put here.
+struct Core {
+    Log log;
+    std::map<std::string, std::function<void()>, std::less<>> on; ///< hooks by operation
+    bool hasStreams = true, unlimited = false;
+    bool flag = false;                 ///< what isOpen() and isDeviceDone() answer
+    unsigned long number = 0;          ///< what the other queries and write() answer
+    std::vector<unsigned long> counts; ///< what peekCounts() lists
+    std::vector<void*> delivery;       ///< what read() hands over
+    brenixcore::Channel::IEventHandler* handler = nullptr;
+    PropertyMap* properties = nullptr;                  ///< the store; for hooks of init
+    brenixplugin::OwnedDataBuffer options;              ///< those of the last call
+    std::vector<brenixplugin::OwnedDataBuffer> written; ///< the buffers of the last write
+    std::unique_ptr<brenixcore::InputStream> input;
+    std::unique_ptr<brenixcore::OutputStream> output;
+};
+
+inline Core core;
+
+/// Which allocation from now on fails on this thread: 1 is the next, 0 is none.
+inline thread_local long failingAllocation = 0;
+
+/// Exempts the core and the tests themselves from failing allocations.
+struct AllocationsAllowed {
+    ~AllocationsAllowed() { failingAllocation = suspended; }
+    const long suspended = std::exchange(failingAllocation, 0);
+};
+
+/// Logs "what(argument)".
+inline void log(const std::string_view what, const std::string& argument = "")
+{
+    const AllocationsAllowed allowed;
+    core.log.push_back(std::string(what) + '(' + argument + ')');
+}
 
 /// A caller's buffer between two zones that nobody may write to.
 class Buffer
 {
 public:
     explicit Buffer(std::size_t size) : bytes(size + 2 * zone, fill) {}
-    template <typename T>
-    T* as()
-    {
-        return reinterpret_cast<T*>(bytes.data() + zone);
-    }
-    char* data() { return as<char>(); }
+    char* data() { return bytes.data() + zone; }
+    operator char*() { return data(); }
 
     /// What was written: from the start to the last byte that changed, beyond the end if need be.
     std::string written() const
@@ -57,85 +90,66 @@ private:
     std::string bytes;
 };
 
-/// The bytes of a list of elements, as a buffer should hold them.
-template <typename T>
-std::string bytesOf(std::initializer_list<T> elements)
-{
-    return {reinterpret_cast<const char*>(elements.begin()), elements.size() * sizeof(T)};
-}
-
 /// Property objects that were made and not yet released.
 inline std::atomic<int> liveProperties = 0;
 
 /// A property object of a test, whose release is counted and logged.
 template <typename Base>
 struct Counted : Base {
-    template <typename... Arguments>
-    explicit Counted(Arguments&&... arguments) : Base(std::forward<Arguments>(arguments)...)
-    {
-        ++liveProperties;
-    }
-    void destroy() override
-    {
-        const AllocationsAllowed allowed;
-        log("destroy(" + this->name + ")");
-        --liveProperties;
-        Base::destroy();
-    }
+    using Base::Base;
+    void destroy() override { log("destroy", this->name), --liveProperties, Base::destroy(); }
+    const int number = ++liveProperties;
 };
 
 template <typename T>
-IPropertyInfo* scalar(const std::string& name, T value)
+IPropertyInfo* vectorOf(std::initializer_list<T> values)
 {
-    return new Counted<device::TScalarProperty<T>>(name, value);
-}
-
-template <typename T>
-IPropertyInfo* vectorOf(const std::string& name, std::initializer_list<T> values)
-{
-    auto* const property = new Counted<device::TVectorProperty<T>>(name, values.size());
+    auto* const property = new Counted<TVectorProperty<T>>("p", values.size());
     property->values.assign(values);
     return property;
 }
 
 template <typename T>
-IPropertyInfo* arrayOf(const std::string& name, std::initializer_list<T> values)
+IPropertyInfo* arrayOf(std::initializer_list<T> values)
 {
     T* const elements = values.size() > 0 ? new T[values.size()] : nullptr;
     std::copy(values.begin(), values.end(), elements);
-    return new Counted<coderconverter::TPointerProperty<T>>(name, elements, values.size());
+    return new Counted<TPointerProperty<T>>("p", elements, values.size());
+}
+
+/// The property of a map, which has to be of that class and name.
+template <typename Property>
+const Property& as(const PropertyMap& map, const std::string& name)
+{
+    const auto& property = dynamic_cast<Property&>(*brenixplugin::asProperty(map.at(name)));
+    EXPECT_EQ(property.name, name);
+    return property;
 }
 
 inline void* dataBuffer(const std::vector<IPropertyInfo*>& fields)
 {
-    auto* const buffer = new brenixplugin::PropertyMap;
+    auto* const buffer = new PropertyMap;
     for (IPropertyInfo* field : fields) {
         buffer->emplace(field == nullptr ? "null" : field->getName(), field);
     }
     return buffer;
 }
 
-struct Event : brenixcore::CustomEvent {
-    const char* getEventName() override { return name.c_str(); }
-    const char* getIdentifier() override { return identifier.c_str(); }
-    const char* getMessage() override { return log("getMessage"), message.c_str(); }
-    void onAccepted() override { log("accept"); }
-    std::string name, identifier, message;
-};
-
 /// Raises an event on the calling thread.
-inline void raiseEvent(const std::string& name, const std::string& identifier,
-                       const std::string& message)
+inline void raiseEvent(const std::string& name, const std::string& id, const std::string& message)
 {
-    Event event;
-    event.name = name;
-    event.identifier = identifier;
-    event.message = message;
+    struct Event : brenixcore::CustomEvent {
+        const char* getEventName() override { return texts[0].c_str(); }
+        const char* getIdentifier() override { return texts[1].c_str(); }
+        const char* getMessage() override { return log("getMessage"), texts[2].c_str(); }
+        void onAccepted() override { log("accept"); }
+        Log texts;
+    } event;
+    event.texts = {name, id, message};
     core.handler->onCustomEvent(event);
 }
 
-inline const std::string unexpected = // NOLINT(cert-err58-cpp)
-    "brenix:Channel:unexpectedException|";
+inline const auto unexpected = "brenix:Channel:unexpectedException|"s; // NOLINT(cert-err58-cpp)
 
 /// Starts with a channel that is created, not initialised.
 class ChannelTest : public testing::Test
@@ -144,7 +158,7 @@ protected:
     ChannelTest()
     {
         core = {};
-        channel = coderChannelCreate("d", "c", id.data(), message.data(), 1, 2);
+        channel = create();
         EXPECT_EQ(id.written() + message.written(), "");
         takeLog();
     }
@@ -155,45 +169,56 @@ protected:
         EXPECT_EQ(liveProperties, 0);
     }
 
+    static IPropertyInfo* scalar(const std::string& name, auto value)
+    {
+        return new Counted<TScalarProperty<decltype(value)>>(name, value);
+    }
+
+    /// The bytes of a list of elements, as a buffer should hold them.
+    static std::string bytesOf(const auto* data, std::size_t count)
+    {
+        return {reinterpret_cast<const char*>(data), count * sizeof *data};
+    }
+
+    void* create(double in = 1, double out = 2, const char* device = "d",
+                 const char* converter = "c")
+    {
+        id = message = Buffer(CODER_ERROR_SIZE);
+        return coderChannelCreate(device, converter, id, message, in, out);
+    }
+
     static Log takeLog() { return std::exchange(core.log, {}); }
 
     /// Initialises the channel, with a property "p" of the device.
     void init(IPropertyInfo* property = nullptr)
     {
         core.on["init"] = [&] {
-            brenixplugin::storeProperty(*core.properties, "p",
-                                        brenixplugin::OwnedProperty(property));
+            storeProperty(*core.properties, "p", brenixplugin::OwnedProperty(property));
         };
-        ASSERT_EQ(coderChannelInit(channel, 0), 1);
+        EXPECT_EQ(coderChannelInit(channel, 0), 1);
         core.on.clear();
         input = coderChannelGetInputStream(channel);
         output = coderChannelGetOutputStream(channel);
         takeLog();
     }
 
-    /// "identifier|message" of one of the three error records.
+    /// "identifier|message" of the two buffers, or of one of the three error records.
+    std::string error() const { return id.text() + "|" + message.text(); }
     std::string errorOf(int (*query)(void*, char*, char*) noexcept)
     {
         id = message = Buffer(CODER_ERROR_SIZE);
-        EXPECT_EQ(query(channel, id.data(), message.data()), 1);
-        return id.text() + "|" + message.text();
+        EXPECT_EQ(query(channel, id, message), 1);
+        return error();
     }
     std::string lastError() { return errorOf(coderChannelGetLastError); }
     std::string syncError() { return errorOf(coderChannelGetLastSyncError); }
     std::string asyncError() { return errorOf(coderChannelGetLastAsyncError); }
 
-    std::string flagOf(int (*query)(void*, uint8_t*) noexcept)
-    {
-        Buffer flag(1);
-        EXPECT_EQ(query(channel, flag.as<uint8_t>()), 1);
-        return flag.written();
-    }
+    /// The message of the last error, which is an unexpected exception.
+    std::string unexpectedError() { return lastError().substr(unexpected.size()); }
 
-    void* channel = nullptr;
-    void* input = nullptr;
-    void* output = nullptr;
-    Buffer id{CODER_ERROR_SIZE};
-    Buffer message{CODER_ERROR_SIZE};
+    void *channel = nullptr, *input = nullptr, *output = nullptr;
+    Buffer id{CODER_ERROR_SIZE}, message{CODER_ERROR_SIZE};
 };
 
 } // namespace scripted

@@ -1,112 +1,65 @@
-#include "scripted/ScriptedCore.hpp"
+#include "scripted/ChannelFixture.hpp"
 
-#include <limits>
-#include <mutex>
-#include <ostream>
+#include <new>
 #include <sstream>
-#include <type_traits>
 
 using namespace scripted;
-using brenixplugin::PropertyMap;
-using brenixplugin::interfaces::IPropertyInfo;
 
-void scripted::log(std::string entry)
+// The allocation functions of the test program, which fail when a test says so. The array forms end
+// here as well, except under a sanitizer that brings its own.
+void* operator new(std::size_t size)
 {
-    static std::mutex mutex;
-    const std::lock_guard lock(mutex);
-    core.log.push_back(std::move(entry));
+    const bool fails = failingAllocation > 0 && --failingAllocation == 0;
+    void* const memory = fails ? nullptr : std::malloc(size);
+    return memory != nullptr ? memory : throw std::bad_alloc();
+}
+
+void operator delete(void* memory) noexcept
+{
+    std::free(memory);
+}
+
+void operator delete(void* memory, std::size_t) noexcept
+{
+    std::free(memory);
 }
 
 namespace
 {
 
-template <typename Elements>
-void printList(std::ostream& out, const Elements& elements, std::size_t count)
+/// Options, which an operation takes over. Their names are printed in brackets.
+std::ostream& operator<<(std::ostream& out, const PropertyMap& options)
 {
-    for (std::size_t i = 0; i < count; ++i) {
-        out << (i > 0 ? "," : "[") << +elements[i];
-    }
-    out << ']';
-}
-
-void print(std::ostream& out, const IPropertyInfo* property)
-{
-    using namespace brenixplugin::kit;
-    forEachType([&](const char* type, auto zero) {
-        using T = decltype(zero);
-        // Logical bytes are kept as they came, so they may not be read as bool.
-        using Byte = std::conditional_t<std::is_same_v<T, bool>, unsigned char, T>;
-        if (const auto* scalar = dynamic_cast<const device::TScalarProperty<T>*>(property)) {
-            out << type << ' ' << +scalar->value;
-        } else if (const auto* vector = dynamic_cast<const device::TVectorProperty<T>*>(property)) {
-            printList(out << type, vector->values, vector->values.size());
-        } else if (const auto* array =
-                       dynamic_cast<const coderconverter::TPointerProperty<T>*>(property)) {
-            printList(out << type << '*', reinterpret_cast<const Byte*>(array->data), array->count);
-        }
-    });
-    if (const auto* text = dynamic_cast<const device::TScalarProperty<std::u16string>*>(property)) {
-        out << "char ";
-        for (const char16_t unit : text->value) {
-            unit < 0x80 ? out << static_cast<char>(unit) : out << '\\' << +unit;
-        }
-    }
-}
-
-/// Options, which an operation takes over. Printed as name=type value for a scalar,
-/// name=type[values] for a vector and name=type*[values] for an array.
-struct Options {
-    explicit Options(const PropertyMap& options) : map(options) {}
-    ~Options() { brenixplugin::releaseProperties(map); }
-    const PropertyMap& map;
-};
-
-std::ostream& operator<<(std::ostream& out, const PropertyMap& map)
-{
-    const char* separator = "";
-    for (const auto& [name, value] : map) {
-        const IPropertyInfo* const property = brenixplugin::asProperty(value);
-        out << std::exchange(separator, ", ") << (name == property->getName() ? name : "?") << '=';
-        print(out, property);
+    core.options.reset(new PropertyMap(options));
+    for (const auto& [name, value] : options) {
+        out << '[' << name << ']';
     }
     return out;
 }
 
-std::ostream& operator<<(std::ostream& out, const Options& options)
+/// Keeps the fields of the buffers written; the buffers stay.
+unsigned long takeFields(const std::vector<void*>& buffers)
 {
-    return out << options.map;
-}
-
-std::ostream& operator<<(std::ostream& out, const std::vector<void*>& dataList)
-{
-    for (void* buffer : dataList) {
-        out << ';' << *static_cast<PropertyMap*>(buffer);
+    const AllocationsAllowed allowed;
+    core.written.clear();
+    for (void* buffer : buffers) {
+        core.written.emplace_back(new PropertyMap)->swap(*static_cast<PropertyMap*>(buffer));
     }
-    return out;
-}
-
-/// "" for a channel.
-template <typename Owner>
-const char* side(const Owner* owner)
-{
-    if constexpr (std::is_base_of_v<brenixcore::Stream, Owner>) {
-        return owner->isInput() ? "input." : "output.";
-    }
-    return "";
+    return core.number;
 }
 
 /// Logs "side.operation(arguments)" and runs the operation's hook.
-template <typename... Arguments>
-void called(const char* side, const char* operation, const Arguments&... arguments)
+template <typename... Types>
+void called(const void* object, const std::string_view operation, const Types&... arguments)
 {
     {
         const AllocationsAllowed allowed;
+        const bool isInput = object == core.input.get();
+        const char* side = isInput ? "input." : object == core.output.get() ? "output." : "";
         std::ostringstream text;
-        text.precision(std::numeric_limits<double>::max_digits10);
-        text << side << operation << '(';
         [[maybe_unused]] const char* separator = "";
         ((text << std::exchange(separator, ", ") << arguments), ...);
-        log(text.str() + ')');
+        log(side + std::string(operation), text.str());
     }
     if (const auto hook = core.on.find(operation); hook != core.on.end()) {
         hook->second();
@@ -115,18 +68,12 @@ void called(const char* side, const char* operation, const Arguments&... argumen
 
 } // namespace
 
-// A function of one statement, and one that is logged with its trailing arguments before it
-// answers.
-#define FUNCTION(signature, statement)                                                             \
+// Defines a function that is logged with the trailing arguments before it does its statement.
+#define OPERATION(signature, statement, ...)                                                       \
     signature                                                                                      \
     {                                                                                              \
+        called(this, static_cast<const char*>(__func__) __VA_OPT__(, ) __VA_ARGS__);               \
         statement;                                                                                 \
-    }
-#define OPERATION(Result, Class, name, parameters, answer, ...)                                    \
-    Result Class::name parameters                                                                  \
-    {                                                                                              \
-        called(side(this), #name __VA_OPT__(, ) __VA_ARGS__);                                      \
-        return answer;                                                                             \
     }
 
 namespace brenixcore
@@ -135,83 +82,63 @@ namespace brenixcore
 struct Converter::Impl {
 };
 struct Channel::Impl {
-    std::unique_ptr<InputStream> input;
-    std::unique_ptr<OutputStream> output;
 };
 struct Stream::Impl {
 };
+using Text = const std::string&;
+using Map = const PropertyMap&;
+using Count = unsigned long;
+using Buffers = std::vector<void*>;
 
-FUNCTION(Converter::Converter(const std::string& path), called("", "Converter", path))
-FUNCTION(Converter::~Converter(), called("", "~Converter"))
+OPERATION(Converter::Converter(Text path), , path)
+OPERATION(Converter::~Converter(), )
+OPERATION(Channel::Channel(Text device, Converter&, IEventHandler& handler, Count in, Count out),
+          core.handler = &handler, device, in, out)
+OPERATION(Channel::~Channel(), )
 
-Channel::Channel(const std::string& devicePath, Converter&, IEventHandler& handler,
-                 unsigned long firstLimit, unsigned long secondLimit)
-    : impl(std::make_unique<Impl>())
-{
-    core.handler = &handler;
-    called("", "Channel", devicePath, firstLimit, secondLimit);
-}
-
-FUNCTION(Channel::~Channel(), called("", "~Channel"))
-
-void Channel::init(const PropertyMap& options, PropertyMap& properties)
+void Channel::init(Map options, PropertyMap& properties)
 {
     core.properties = &properties;
-    called("", "init", Options(options));
+    called(this, "init", options);
     // The streams of the last init end here, so that any later use of them shows.
-    impl->input = core.hasInput ? std::make_unique<InputStream>(nullptr) : nullptr;
-    impl->output = core.hasOutput ? std::make_unique<OutputStream>(nullptr) : nullptr;
+    core.input = core.hasStreams ? std::make_unique<InputStream>(nullptr) : nullptr;
+    core.output = core.hasStreams ? std::make_unique<OutputStream>(nullptr) : nullptr;
 }
 
-using Name = const std::string&;
-using Map = const PropertyMap&;
-OPERATION(void, Channel, open, (Map options), void(), Options(options))
-OPERATION(void, Channel, execute, (const char* command, Map options), void(), command,
-          Options(options))
-OPERATION(void, Channel, close, (), void())
-OPERATION(void, Channel, term, (), void())
-OPERATION(bool, Channel, isOpen, () const, core.flag)
-OPERATION(InputStream*, Channel, getInputStream, () const, impl->input.get())
-OPERATION(OutputStream*, Channel, getOutputStream, () const, impl->output.get())
+OPERATION(void Channel::open(Map options), , options)
+OPERATION(void Channel::execute(const char* command, Map options), , command, options)
+OPERATION(void Channel::close(), )
+OPERATION(void Channel::term(), )
+OPERATION(bool Channel::isOpen() const, return core.flag)
+OPERATION(InputStream* Channel::getInputStream() const, return core.input.get())
+OPERATION(OutputStream* Channel::getOutputStream() const, return core.output.get())
 
-Stream::Stream(std::unique_ptr<Impl> state) : impl(std::move(state)) {}
+Stream::Stream(std::unique_ptr<Impl>) {}
 Stream::~Stream() = default;
-FUNCTION(bool Stream::isInput() const, return dynamic_cast<const InputStream*>(this) != nullptr)
-OPERATION(void, Stream, addFilter, (Name name, Map options), void(), name, Options(options))
-OPERATION(void, Stream, tuneFilters, (Map options), void(), Options(options))
-OPERATION(void, Stream, flush, (), void())
-OPERATION(bool, Stream, isOpen, () const, core.flag)
-OPERATION(bool, Stream, isUnlimited, () const, core.unlimited)
-OPERATION(unsigned long, Stream, getDataAvailable, () const, core.number)
-OPERATION(unsigned long, Stream, getSpaceAvailable, () const, core.number)
+OPERATION(bool Stream::isInput() const, return false)
+OPERATION(void Stream::addFilter(Text name, Map options), , name, options)
+OPERATION(void Stream::tuneFilters(Map options), , options)
+OPERATION(void Stream::flush(), )
+OPERATION(bool Stream::isOpen() const, return core.flag)
+OPERATION(bool Stream::isUnlimited() const, return core.unlimited)
+OPERATION(Count Stream::getDataAvailable() const, return core.number)
+OPERATION(Count Stream::getSpaceAvailable() const, return core.number)
 
-InputStream::InputStream(std::unique_ptr<Impl> state) : Stream(std::move(state)) {}
+InputStream::InputStream(std::unique_ptr<Impl>) : Stream(nullptr) {}
 InputStream::~InputStream() = default;
-FUNCTION(bool InputStream::isInput() const, return Stream::isInput())
-OPERATION(bool, InputStream, isDeviceDone, () const, core.flag)
-OPERATION(unsigned long, InputStream, getCountDimension, () const, core.number)
+OPERATION(bool InputStream::isInput() const, return true)
+OPERATION(bool InputStream::isDeviceDone() const, return core.flag)
+OPERATION(Count InputStream::getCountDimension() const, return core.number)
+OPERATION(void InputStream::peekCounts(Count limit, Count& total, std::vector<Count>& counts),
+          (total = core.number, counts = core.counts), limit)
+OPERATION(void InputStream::read(Count count, Buffers& buffers, Count&),
+          buffers.swap(core.delivery), count)
 
-// NOLINTBEGIN(readability-make-member-function-const): the core's headers fix them.
-void InputStream::peekCounts(unsigned long limit, unsigned long& total,
-                             std::vector<unsigned long>& counts)
-{
-    called(side(this), "peekCounts", limit);
-    total = core.number;
-    counts = core.counts;
-}
-
-void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigned long&)
-{
-    called(side(this), "read", count);
-    buffers.swap(core.delivery);
-}
-// NOLINTEND(readability-make-member-function-const)
-
-OutputStream::OutputStream(std::unique_ptr<Impl> state) : Stream(std::move(state)) {}
+OutputStream::OutputStream(std::unique_ptr<Impl>) : Stream(nullptr) {}
 OutputStream::~OutputStream() = default;
-FUNCTION(bool OutputStream::isInput() const, return Stream::isInput())
-OPERATION(bool, OutputStream, isDeviceDone, () const, core.flag)
-OPERATION(unsigned long, OutputStream, getCountDimension, () const, core.number)
-OPERATION(unsigned long, OutputStream, write, (const std::vector<void*>& list), core.number, list)
+OPERATION(bool OutputStream::isInput() const, return false)
+OPERATION(bool OutputStream::isDeviceDone() const, return core.flag)
+OPERATION(Count OutputStream::getCountDimension() const, return core.number)
+OPERATION(Count OutputStream::write(const Buffers& list), return takeFields(list), list.size())
 
 } // namespace brenixcore

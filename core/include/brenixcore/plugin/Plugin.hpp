@@ -47,8 +47,8 @@ class BRENIXCORE_PLUGIN_SHARED DeviceStreams
 {
 public:
     /// Puts a packet of at least one count into the input stream, waiting while there is no room.
-    /// Returns false when the channel is closing and the packet was dropped: run() should return,
-    /// or, if the device has output, go on with pull().
+    /// Its fields must be property objects of the classes of Visit.hpp. Returns false when the channel
+    /// is closing and the packet was dropped: there is no room, or no output left that it could answer.
     virtual bool push(Packet packet) = 0;
 
     /// Takes the next packet from the output stream, waiting for one. Returns nothing when the
@@ -95,7 +95,9 @@ public:
     /// Before run().
     virtual void open(const brenixplugin::PropertyMap& /*options*/) {}
 
-    /// Moves the data, on a thread of the core. When it returns or throws, the device is done.
+    /// Moves the data, on a thread of the core. When it returns or throws, the device is done. The
+    /// channel's close waits for it: a device with an output stream goes on with pull() until that
+    /// returns nothing, any other device returns when push() is false.
     virtual void run(DeviceStreams& streams) = 0;
 
     /// Called on the channel's thread, while run() may be busy, when tryPush(), tryPull() or
@@ -121,6 +123,8 @@ class BRENIXCORE_PLUGIN_SHARED Converter
 {
 public:
     virtual ~Converter() = default;
+
+    /// Changes the fields, not the number of counts.
     virtual void convertInput(Packet& packet) = 0;
     virtual void convertOutput(Packet& packet) = 0;
 };
@@ -135,7 +139,8 @@ public:
     /// Called with the options that the filter is added with, and again whenever it is tuned.
     virtual void tune(const brenixplugin::PropertyMap& options) = 0;
 
-    /// May change fields and counts; a packet that is left without counts is dropped.
+    /// May change fields and counts; a packet that is left without counts is dropped. A write that then
+    /// finds no room is refused, though its packets came this far; the caller may write them again.
     virtual void apply(Packet& packet) = 0;
 };
 
