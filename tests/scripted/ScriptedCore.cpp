@@ -6,20 +6,21 @@
 using namespace scripted;
 
 // The allocation functions of the test program, which fail when a test says so. The array forms end
-// here as well, except under a sanitizer that brings its own.
-void* operator new(std::size_t size)
+// here as well, except under a sanitizer that brings its own. Not inline: GCC would see memory of
+// operator new go to free.
+[[gnu::noinline]] void* operator new(std::size_t size)
 {
     const bool fails = failingAllocation > 0 && --failingAllocation == 0;
     void* const memory = fails ? nullptr : std::malloc(size);
     return memory != nullptr ? memory : throw std::bad_alloc();
 }
 
-void operator delete(void* memory) noexcept
+[[gnu::noinline]] void operator delete(void* memory) noexcept
 {
     std::free(memory);
 }
 
-void operator delete(void* memory, std::size_t) noexcept
+[[gnu::noinline]] void operator delete(void* memory, std::size_t) noexcept
 {
     std::free(memory);
 }
@@ -92,8 +93,9 @@ using Buffers = std::vector<void*>;
 
 OPERATION(Converter::Converter(Text path), , path)
 OPERATION(Converter::~Converter(), )
-OPERATION(Channel::Channel(Text device, Converter&, IEventHandler& handler, Count in, Count out),
-          core.handler = &handler, device, in, out)
+OPERATION(Channel::Channel(Text devicePath, Converter&, IEventHandler& handler, Count firstLimit,
+                           Count secondLimit),
+          core.handler = &handler, devicePath, firstLimit, secondLimit)
 OPERATION(Channel::~Channel(), )
 
 void Channel::init(Map options, PropertyMap& properties)
