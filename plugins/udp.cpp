@@ -1,0 +1,105 @@
+// Device `udp`: each datagram is a packet, both ways.
+
+#include "ByteDevice.hpp"
+
+namespace
+{
+
+using namespace bytes;
+using asio::ip::udp;
+
+/// Receives from anyone and sends to one peer.
+class DatagramPort
+{
+public:
+    explicit DatagramPort(asio::io_context& context) : socket(context) {}
+
+    template <typename Handler>
+    void async_read_some(const asio::mutable_buffer& buffer, Handler&& handler)
+    {
+        socket.async_receive(buffer, std::forward<Handler>(handler));
+    }
+
+    template <typename Handler>
+    void async_write_some(const asio::const_buffer& buffer, Handler&& handler)
+    {
+        socket.async_send_to(buffer, peer, std::forward<Handler>(handler));
+    }
+
+    void cancel(asio::error_code& error) { socket.cancel(error); }
+    int native_handle() { return socket.native_handle(); }
+
+    udp::socket socket;
+    udp::endpoint peer;
+};
+
+class Udp : public ByteDevice<DatagramPort>
+{
+public:
+    Udp() : ByteDevice(Framing::Datagrams) {}
+
+    DeviceInfo init(const PropertyMap& optionMap, PropertyMap& properties,
+                    DeviceHost& deviceHost) override
+    {
+        Options options(optionMap);
+        const std::string localHost = options.text("LocalHost").value_or("127.0.0.1");
+        asio::error_code error;
+        const auto address = asio::ip::make_address(localHost, error);
+        if (error) {
+            Options::fail("LocalHost", "must be an IP address, not " + localHost);
+        }
+        const long localPort = options.wholeNumber("LocalPort", 0, 65535).value_or(0);
+        const udp::endpoint local(address, static_cast<unsigned short>(localPort));
+        const auto peerHost = options.text("Host");
+        const auto peerPort = options.wholeNumber("Port", 1, 65535);
+        if (peerHost.has_value() != peerPort.has_value()) {
+            Options::fail(peerHost ? "Port" : "Host", "is missing: a peer has a host and a port");
+        }
+        readFormat(options);
+        options.requireAllKnown();
+
+        host = &deviceHost;
+        sends = peerHost.has_value();
+        peer = localHost + ":" + std::to_string(localPort);
+        if (sends) {
+            peer = *peerHost + ":" + std::to_string(*peerPort);
+            const auto found = udp::resolver(context).resolve(local.protocol(), *peerHost,
+                                                              std::to_string(*peerPort), error);
+            if (error) {
+                throw std::runtime_error("Could not find " + peer + ": " + error.message());
+            }
+            port.peer = *found.begin();
+        }
+        bind(local);
+        publish(properties, "LocalPort", port.socket.local_endpoint().port());
+        return {StreamInfo{}, sends ? std::optional(StreamInfo{}) : std::nullopt};
+    }
+
+    void open(const PropertyMap& options) override { Options(options).requireAllKnown(); }
+
+    void term() override
+    {
+        asio::error_code ignored;
+        port.socket.close(ignored);
+    }
+
+private:
+    void bind(const udp::endpoint& local)
+    {
+        term();
+        asio::error_code error;
+        port.socket.open(local.protocol(), error);
+        if (!error) {
+            port.socket.bind(local, error);
+        }
+        if (error) {
+            term();
+            throw std::runtime_error("Could not bind " + local.address().to_string() + ":" +
+                                     std::to_string(local.port()) + ": " + error.message());
+        }
+    }
+};
+
+} // namespace
+
+BRENIXCORE_EXPORT_DEVICE(Udp)
