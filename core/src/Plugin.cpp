@@ -29,19 +29,19 @@ std::string loaderError()
     return text == nullptr ? "the reason is not known" : text;
 }
 
+} // namespace
+
 std::string pluginPath(const std::string& name)
 {
     return name.find('/') != std::string::npos ? name : pluginFolder() + name + ".so";
 }
-
-} // namespace
 
 void PluginLibrary::Unload::operator()(void* library) const noexcept
 {
     dlclose(library);
 }
 
-PluginLibrary::PluginLibrary(const std::string& name) : path(pluginPath(name))
+PluginLibrary::PluginLibrary(const std::string& path)
 {
     // dlopen is declared not to throw, but a static object of the plug-in may. The library is then half
     // loaded and held once, and must not pass for loaded the next time.

@@ -17,13 +17,16 @@
 namespace brenixcore
 {
 
+/// Where a plug-in is looked for: a path with a slash is used as it stands, a bare name is a file of
+/// the plug-in folder.
+std::string pluginPath(const std::string& name);
+
 /// A loaded shared library; unloads it.
 class PluginLibrary
 {
 public:
-    /// Loads the plug-in named by a path with a slash, or by a bare name in the plug-in folder.
     /// Throws std::runtime_error with the reason.
-    explicit PluginLibrary(const std::string& name);
+    explicit PluginLibrary(const std::string& path);
 
     /// Throws std::runtime_error with both versions when the plug-in was made for another.
     void requireAbiVersion() const;
@@ -35,8 +38,6 @@ public:
         return reinterpret_cast<Function*>(address(symbol));
     }
 
-    const std::string& getPath() const { return path; }
-
 private:
     struct Unload {
         void operator()(void* library) const noexcept;
@@ -44,7 +45,6 @@ private:
 
     void* address(const char* symbol) const;
 
-    std::string path;
     std::unique_ptr<void, Unload> handle;
 };
 
@@ -65,11 +65,13 @@ template <typename Interface, typename LoadError, typename CreateError>
 LoadedPlugin<Interface> loadPlugin(const std::string& name, const char* factory)
 {
     std::optional<PluginLibrary> library;
+    std::string path = name;
     try {
-        library.emplace(name);
+        path = pluginPath(name);
+        library.emplace(path);
         library->requireAbiVersion();
     } catch (...) {
-        throw LoadError("Could not load " + name + ": " + currentExceptionText());
+        throw LoadError("Could not load " + path + ": " + currentExceptionText());
     }
     std::unique_ptr<Interface> object;
     try {
@@ -78,7 +80,7 @@ LoadedPlugin<Interface> loadPlugin(const std::string& name, const char* factory)
             throw std::runtime_error("the factory returned nothing");
         }
     } catch (...) {
-        throw CreateError("Could not create " + library->getPath() + ": " + currentExceptionText());
+        throw CreateError("Could not create " + path + ": " + currentExceptionText());
     }
     return {*std::move(library), std::move(object)};
 }

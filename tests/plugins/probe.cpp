@@ -32,8 +32,11 @@ public:
         const std::string streams = options.text("Streams").value_or("i");
         packets.clear();
         if (const auto found = optionMap.find("Packets"); found != optionMap.end()) {
-            packets =
-                dynamic_cast<device::TVectorProperty<int>&>(*asProperty(found->second)).values;
+            auto* const property = asProperty(found->second);
+            const auto* const one = dynamic_cast<device::TScalarProperty<int>*>(property);
+            packets = one != nullptr
+                          ? std::vector<int>{one->value}
+                          : dynamic_cast<device::TVectorProperty<int>&>(*property).values;
         }
         reach("init");
         host->updateProperty(makeScalar("Level", 0.0)); // too early: there is no property yet
@@ -51,7 +54,8 @@ public:
 
     void open(const PropertyMap& /*options*/) override { reach("open"); }
 
-    /// Pushes packets of running numbers in "data", with one "Stamp" each; then takes all output.
+    /// Pushes packets of running numbers in "data", with a "Stamp" and the "Address" of
+    /// the numbers each; then takes all output.
     void run(DeviceStreams& streams) override
     {
         reach("run");
@@ -64,6 +68,7 @@ public:
             }
             Packet packet;
             packet.counts = size;
+            setField(packet, makeScalar("Address", reinterpret_cast<std::uintptr_t>(values.get())));
             setField(packet, makeArray(dataField, std::move(values), size));
             setField(packet, makeScalar("Stamp", next));
             if (!streams.push(std::move(packet))) {

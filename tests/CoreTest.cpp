@@ -1,0 +1,129 @@
+// The embedded core through its own classes: what the C functions do not show.
+
+#include "brenixcore/Channel.hpp"
+#include "brenixcore/Converter.hpp"
+#include "brenixcore/Exceptions.hpp"
+#include "brenixcore/Stream.hpp"
+#include "brenixplugin/Property.hpp"
+
+#include <gtest/gtest.h>
+
+#include <dlfcn.h>
+
+#include <filesystem>
+#include <fstream>
+#include <string>
+
+using namespace brenixcore;
+using brenixplugin::PropertyMap;
+
+namespace
+{
+
+const std::string testPlugins = TEST_PLUGINS "/";
+const std::string folder = PLUGINS "/"; // where bare names are looked for
+
+class Handler : public Channel::IEventHandler
+{
+public:
+    void onCustomEvent(CustomEvent& event) override { ADD_FAILURE() << event.getMessage(); }
+    void onPropertyUpdate(brenixplugin::interfaces::IPropertyInfo* property) override
+    {
+        property->destroy();
+    }
+    void* onDelegatedEvent(DelegatedEvent& event) override { return event.invoke(); }
+    void onIgnoredEvent1(void* /*event*/) override {}
+    void onIgnoredEvent2(void* /*event*/) override {}
+};
+
+bool isLoaded(const std::string& path)
+{
+    void* const library = dlopen(path.c_str(), RTLD_NOW | RTLD_NOLOAD);
+    if (library != nullptr) {
+        dlclose(library);
+    }
+    return library != nullptr;
+}
+
+} // namespace
+
+TEST(LoadTest, ErrorsSayWhatWasTriedAndWhy)
+{
+    const std::string text = testing::TempDir() + "text.so";
+    std::ofstream(text) << "This is a text and not a shared library, though it is as long as one.";
+    const std::string load = "Could not load ";
+    const std::string create = "Could not create ";
+    const std::string rows[][2] = {
+        {"none", load + folder + "none.so: " + folder +
+                     "none.so: cannot open shared object file: No such file or directory"},
+        {"./none.so", load + "./none.so: ./none.so: cannot open shared object file: No such file "
+                             "or directory"},
+        {text, load + text + ": " + text + ": invalid ELF header"},
+        {testPlugins + "throwsWhileLoading.so",
+         load + testPlugins + "throwsWhileLoading.so: thrown while loading"},
+        {testPlugins + "otherAbiVersion.so",
+         load + testPlugins + "otherAbiVersion.so: it has plug-in ABI version 999, needed is 1"},
+        {"identity", create + folder + "identity.so: " + folder +
+                         "identity.so: undefined symbol: brenixcoreCreateDevice"},
+        {testPlugins + "throwingInt.so",
+         create + testPlugins + "throwingInt.so: Unrecognized error."},
+        {testPlugins + "nullFactory.so",
+         create + testPlugins + "nullFactory.so: the factory returned nothing"},
+    };
+    Converter converter("identity");
+    Handler handler;
+    for (const auto& [device, error] : rows) {
+        try {
+            const Channel channel(device, converter, handler, 1, 1);
+            ADD_FAILURE() << device;
+        } catch (const std::runtime_error& exception) {
+            EXPECT_EQ(exception.what(), error);
+        }
+        EXPECT_FALSE(isLoaded(device)) << device;
+    }
+}
+
+TEST(LoadTest, PluginsAreUnloaded)
+{
+    int plugins = 0;
+    for (const auto& entry : std::filesystem::directory_iterator(folder)) {
+        void* const library = dlopen(entry.path().c_str(), RTLD_NOW | RTLD_LOCAL);
+        EXPECT_NE(library, nullptr) << dlerror();
+        dlclose(library);
+        EXPECT_FALSE(isLoaded(entry.path())) << entry.path();
+        ++plugins;
+    }
+    EXPECT_GT(plugins, 0);
+}
+
+TEST(DataTest, MovesByPointerFromDeviceToCaller)
+{
+    const std::string probe = testPlugins + "probe.so";
+    {
+        Converter converter("identity");
+        Handler handler;
+        Channel channel(probe, converter, handler, UINT64_MAX, UINT64_MAX);
+        PropertyMap properties;
+        const std::string name = "Packets";
+        channel.init({{name, new brenixplugin::kit::device::TScalarProperty<int>(name, 1000)}},
+                     properties);
+        channel.open({});
+        std::vector<void*> buffers;
+        unsigned long read = 0;
+        channel.getInputStream()->read(1000, buffers, read);
+        ASSERT_EQ(buffers.size(), 1);
+        const brenixplugin::OwnedDataBuffer buffer(static_cast<PropertyMap*>(buffers[0]));
+        const auto field = [&](const char* fieldName) {
+            return brenixplugin::asProperty(buffer->at(fieldName));
+        };
+        const auto& data =
+            dynamic_cast<brenixplugin::kit::coderconverter::TPointerProperty<double>&>(
+                *field("data"));
+        const auto& address =
+            dynamic_cast<brenixplugin::kit::device::TScalarProperty<unsigned long>&>(
+                *field("Address"));
+        EXPECT_EQ(reinterpret_cast<std::uintptr_t>(data.data), address.value);
+        brenixplugin::releaseProperties(properties);
+    }
+    EXPECT_FALSE(isLoaded(probe));
+}

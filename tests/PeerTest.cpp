@@ -1,0 +1,364 @@
+// The devices tcp, udp, serial and audiofile on programs of other makers: socat, nc and sox, on
+// loopback addresses, pseudo-terminals and files.
+
+#include "Driver.hpp"
+
+#include <asio.hpp>
+
+#include <fcntl.h>
+#include <sys/wait.h>
+#include <termios.h>
+#include <unistd.h>
+
+#include <cmath>
+#include <cstdlib>
+#include <cstring>
+#include <fstream>
+
+using namespace driver;
+
+namespace
+{
+
+constexpr std::size_t npos = std::string::npos;
+asio::io_context context;
+using Acceptor = asio::ip::tcp::acceptor;
+const asio::ip::tcp::endpoint any(asio::ip::address_v4::loopback(), 0);
+const int port = Acceptor(context, any).local_endpoint().port(); // free by now
+const std::string peer = "127.0.0.1:" + std::to_string(port);
+const std::string server =
+    "socat TCP-LISTEN:" + std::to_string(port) + ",bind=127.0.0.1,reuseaddr ";
+const std::string lost = "brenix:Device:dataLost|";
+const std::string file = testing::TempDir() + "peer-" + std::to_string(getpid());
+
+/// A running program that may write the file.
+struct Program {
+    explicit Program(const std::string& command) : id(fork())
+    {
+        if (id == 0) {
+            execl("/bin/sh", "sh", "-c", ("exec " + command).c_str(), nullptr);
+            _exit(127);
+        }
+    }
+    ~Program()
+    {
+        kill(id, SIGKILL);
+        waitpid(id, nullptr, 0);
+        std::remove(file.c_str());
+    }
+
+    pid_t id;
+};
+
+int init(Channel& channel, const char* type, int at = port, const char* order = "little")
+{
+    return channel.init(
+        4, CODER_OPTION("Host", "char", 9, "127.0.0.1"), CODER_OPTION("Port", "int32", 1, &at),
+        CODER_OPTION("ElementType", "char", 9, type), CODER_OPTION("ByteOrder", "char", 9, order));
+}
+
+int writeBytes(const Channel& channel, const std::string& data)
+{
+    double written = 0;
+    return coderOutputStreamWriteTypedDataOld(channel.output, &written, 1, "uint8",
+                                              CODER_BUFFER(data.size(), data.data()));
+}
+
+/// Reads what waits of the numbers that go up from `next`; whether there was any.
+bool readOn(const Channel& channel, double& next)
+{
+    const Numbers counts = channel.peek();
+    const double end = std::accumulate(counts.begin(), counts.end(), next);
+    EXPECT_EQ(channel.read(end - next, double(counts.size())), range(next, end));
+    return std::exchange(next, end) < end;
+}
+
+std::string readFile()
+{
+    std::ifstream stream(file, std::ios::binary);
+    return {std::istreambuf_iterator<char>(stream), {}};
+}
+
+void sox(const std::string& arguments)
+{
+    ASSERT_EQ(std::system(("sox -D " + arguments).c_str()), 0) << arguments;
+}
+
+/// The samples of a sound file as sox has them, full scale from -1 to 1.
+Numbers soxSamples(const std::string& soundFile)
+{
+    sox(soundFile + " -t s32 " + file);
+    const std::string raw = readFile();
+    std::remove(file.c_str());
+    std::vector<std::int32_t> samples(raw.size() / sizeof(std::int32_t));
+    std::memcpy(samples.data(), raw.data(), samples.size() * sizeof(std::int32_t));
+    Numbers numbers(samples.begin(), samples.end());
+    for (double& number : numbers) {
+        number /= 1U << 31U;
+    }
+    return numbers;
+}
+
+} // namespace
+
+TEST(TcpTest, SixtyFourMiBComeBackAndThenThePeerIsKilled)
+{
+    auto echo = std::make_unique<Program>(server + "EXEC:cat");
+    Channel channel("tcp", 3000, 5000);
+    ASSERT_EQ(init(channel, "double"), 1);
+    Channel::waitUntil([&] { return channel.open(0.5) == 1; });
+    double next = 0;
+    double sent = 0;
+    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(60);
+    while (next < 8 << 20 && !HasFailure()) {
+        ASSERT_LT(std::chrono::steady_clock::now(), end);
+        const double room = channel.ask(coderStreamGetSpaceAvailable, channel.output);
+        if (const double count = std::min(room, (8 << 20) - sent); count > 0) {
+            ASSERT_EQ(channel.write(range(sent, sent + count)), count);
+            sent += count;
+        }
+        readOn(channel, next);
+    }
+    for (; channel.write(range(sent, sent + 1000)) == 1000; sent += 1000) { // until all is full
+    }
+    echo.reset();
+    Channel::waitUntil([&] {
+        uint8_t done = 0;
+        coderStreamIsDeviceDone(channel.input, &done);
+        return !readOn(channel, next) && done == 1;
+    });
+    EXPECT_GE(next, (8 << 20) + 3000);
+    EXPECT_EQ(channel.asyncError().rfind("brenix:Device:failed|Transfer with " + peer, 0), 0);
+}
+
+TEST(TcpTest, APeerThatClosesEndsTheDevice)
+{
+    const Program nc("sh -c \"printf '\\277\\360\\0\\0\\0\\0\\0\\0abc' | exec nc -N -l 127.0.0.1 " +
+                     std::to_string(port) + "\" >" + file);
+    Channel channel("tcp");
+    ASSERT_EQ(init(channel, "double", port, "big"), 1);
+    ASSERT_EQ(channel.write({-2}), 1);
+    Channel::waitUntil([&] { return channel.open(0.5) == 1; });
+    channel.waitForEnd();
+    EXPECT_EQ(channel.read(1, 1), Numbers{-1});
+    EXPECT_EQ(channel.asyncError(),
+              lost + "The last 3 bytes of the data from " + peer + " are no whole double.");
+    Channel::waitUntil([] { return readFile() == "\xC0\0\0\0\0\0\0\0"s; }); // only one side ended
+}
+
+TEST(TcpTest, ClosingSendsWhatIsLeft)
+{
+    // The peer sends without end and is not read: the other way goes on.
+    const Program socat(server + "OPEN:/dev/zero!!STDOUT 2>/dev/null >" + file);
+    Channel channel("tcp", 10);
+    ASSERT_EQ(init(channel, "uint8"), 1);
+    Channel::waitUntil([&] { return channel.open(0.5) == 1; });
+    ASSERT_EQ(channel.write({1}), 1);
+    EXPECT_EQ(channel.asyncError(),
+              "brenix:Device:wrongType|Data to send must be uint8, but is double.");
+    const std::string data(8 << 20, 'x');
+    ASSERT_EQ(writeBytes(channel, data), 1);
+    EXPECT_EQ(coderChannelClose(channel.handle), 1);
+    Channel::waitUntil([&] { return readFile() == data; });
+}
+
+TEST(TcpTest, PeersThatDoNotAnswer)
+{
+    Acceptor full(context, any); // takes one connection, does not read, and lets the next one wait
+    full.listen(0);
+    const int number = full.local_endpoint().port();
+    Channel channel("tcp");
+    ASSERT_EQ(init(channel, "uint8", number), 1);
+    ASSERT_EQ(channel.open(), 1);
+    const double seconds = 0.3;
+    Channel second("tcp");
+    second.init(3, CODER_OPTION("Host", "char", 9, "localhost"),
+                CODER_OPTION("Port", "int32", 1, &number),
+                CODER_OPTION("ConnectTimeout", "double", 1, &seconds));
+    EXPECT_EQ(second.open(), 0);
+    EXPECT_NE(second.error().find(": Connection timed out"), npos);
+    ASSERT_EQ(writeBytes(channel, std::string(20 << 20, 'x')), 1);
+    EXPECT_EQ(coderChannelClose(channel.handle), 1);
+    EXPECT_NE(channel.asyncError().find(" bytes were not sent to 127.0.0.1:"), npos);
+}
+
+TEST(UdpTest, DatagramsArePackets)
+{
+    Channel receiver("udp");
+    ASSERT_EQ(receiver.init(1, CODER_OPTION("ElementType", "char", 9, "double")), 1);
+    EXPECT_EQ(receiver.write({1}), 0);
+    uint16_t local = 0;
+    ASSERT_EQ(coderChannelGetPropertyValue(receiver.handle, "LocalPort", "uint16", 1, &local), 1);
+    ASSERT_EQ(receiver.open(), 1);
+    Channel sender("udp");
+    ASSERT_EQ(init(sender, "uint8", local), 1);
+    for (const unsigned int size : {70000U, 16U, 3U, 11U}) {
+        ASSERT_EQ(writeBytes(sender, std::string(size, '\0')), 1);
+    }
+    ASSERT_EQ(sender.open(), 1);
+    EXPECT_EQ(receiver.read(3, 2), (Numbers{0, 0, 0}));
+    EXPECT_EQ(receiver.asyncError(), lost + "The last 3 bytes of a datagram are no whole double.");
+    EXPECT_NE(sender.asyncError().find(lost + "70000 bytes were not sent to 127.0.0.1:"), npos);
+}
+
+TEST(SerialTest, TwoPortsTalk)
+{
+    const std::string other = file + "-other";
+    auto line = std::make_unique<Program>("socat PTY,raw,echo=0,link=" + file +
+                                          " PTY,raw,echo=0,link=" + other);
+    Channel near("serial");
+    Channel far("serial");
+    const int baudRate = 115200;
+    const int stopBits = 2;
+    for (Channel* end : {&near, &far}) {
+        const std::string& name = end == &near ? file : other;
+        ASSERT_EQ(end->init(5, CODER_OPTION("Port", "char", 999, name.c_str()),
+                            CODER_OPTION("BaudRate", "int32", 1, &baudRate),
+                            CODER_OPTION("StopBits", "int32", 1, &stopBits),
+                            CODER_OPTION("FlowControl", "char", 9, "hardware"),
+                            CODER_OPTION("ElementType", "char", 9, "double")),
+                  1);
+        Channel::waitUntil([&] { return end->open(5) == 1; });
+    }
+    const int port = ::open(file.c_str(), O_RDWR | O_NOCTTY);
+    termios settings{};
+    EXPECT_EQ(tcgetattr(port, &settings), 0);
+    ::close(port);
+    EXPECT_EQ(cfgetospeed(&settings), speed_t(B115200));
+    EXPECT_EQ(settings.c_cflag & (CSTOPB | CRTSCTS), tcflag_t(CSTOPB | CRTSCTS));
+
+    const double special = 0x1.A11131A03047Fp-815; // its bytes mean something to a terminal
+    ASSERT_EQ(near.write({special, 1}), 2);
+    ASSERT_EQ(far.write({2}), 1);
+    Channel::waitUntil([&] { return far.ask(coderStreamGetDataAvailable, far.input) == 2; });
+    EXPECT_EQ(far.read(2, double(far.peek().size())), (Numbers{special, 1}));
+    EXPECT_EQ(near.read(1, 1), Numbers{2});
+    line.reset();
+    for (const Channel* end : {&near, &far}) {
+        end->waitForEnd();
+        EXPECT_EQ(end->peek(), Numbers{});
+    }
+}
+
+TEST(AudioFileTest, WhatIsWrittenIsWhatSoxReads)
+{
+    const struct {
+        const char *ending, *format;
+        int bits;
+    } rows[] = {{".wav", "PCM_16", 16}, {".flac", "PCM_24", 24}, {".aiff", "PCM_32", 32},
+                {".wav", "FLOAT", 25},  {".au", "DOUBLE", 32},   {".caf", "PCM_S8", 8}};
+    const int channels = 2;
+    for (const auto& [ending, format, bits] : rows) {
+        SCOPED_TRACE(format);
+        const std::string soundFile = file + ending;
+        Channel writer("audiofile");
+        ASSERT_EQ(writer.init(4, CODER_OPTION("FileName", "char", 999, soundFile.c_str()),
+                              CODER_OPTION("Mode", "char", 9, "write"),
+                              CODER_OPTION("Channels", "int32", 1, &channels),
+                              CODER_OPTION("SampleFormat", "char", 9, format)),
+                  1)
+            << writer.error();
+        Numbers samples = {-1, 1 - std::ldexp(1, 1 - bits)};
+        for (double value = 1; samples.size() < 2000;
+             value = std::fmod(value * 16807, 2147483647)) {
+            const double scale = std::ldexp(1, bits - 1);
+            samples.push_back(std::floor((value / 1073741824 - 1) * scale) / scale);
+        }
+        ASSERT_EQ(writer.open(), 1);
+        ASSERT_EQ(writer.write(samples), 2000);
+        ASSERT_EQ(coderChannelClose(writer.handle), 1);
+        EXPECT_EQ(soxSamples(soundFile), samples);
+        std::remove(soundFile.c_str());
+    }
+}
+
+TEST(AudioFileTest, WhatSoxMakesIsRead)
+{
+    const std::pair<const char*, const char*> rows[] = {
+        {".wav", "-b 16"},  {".wav", "-b 8"},   {".wav", "-b 32 -e floating-point"},
+        {".flac", "-b 24"}, {".aiff", "-b 24"}, {".au", "-b 8 -e mu-law"},
+        {".w64", "-b 32"},
+    };
+    for (const auto& [ending, encoding] : rows) {
+        SCOPED_TRACE(ending + " "s + encoding);
+        const std::string soundFile = file + ending;
+        sox("-n -r 8000 -c 2 "s + encoding + " " + soundFile + " synth 0.2 brownnoise");
+        Channel reader("audiofile");
+        ASSERT_EQ(reader.init(1, CODER_OPTION("FileName", "char", 999, soundFile.c_str())), 1)
+            << reader.error();
+        ASSERT_EQ(reader.open(), 1);
+        EXPECT_EQ(reader.read(1600, 2), soxSamples(soundFile));
+        std::remove(soundFile.c_str());
+    }
+}
+
+TEST(OptionsTest, BadOnesAreNamed)
+{
+    constexpr double text = std::numeric_limits<double>::quiet_NaN();
+    const struct {
+        std::string device, name, text;
+        double number;
+        std::string error;
+    } rows[] = {
+        {"tcp", "Host", "", text, "must name a host."},
+        {"tcp", "Port", "x", text, "must be one number."},
+        {"tcp", "Port", "", 65536, "must be a whole number from 1 to 65535."},
+        {"tcp", "ConnectTimeout", "", 0, "must be more than 0 and at most 86400 seconds."},
+        {"tcp", "ElementType", "int24", text, "is not a numeric type: int24."},
+        {"tcp", "ByteOrder", "pdp", text, "must be little or big, not pdp."},
+        {"tcp", "BlockSize", "", 0.5, "must be a whole number from 1 to 16777216."},
+        {"tcp", "Hots", "x", text, "is not known."},
+        {"udp", "LocalHost", "here", text, "must be an IP address, not here."},
+        {"udp", "LocalPort", "", -1, "must be a whole number from 0 to 65535."},
+        {"udp", "Host", "::1", text, "is missing: a peer has a host and a port."},
+        {"udp", "Port", "", 9, "is missing: a peer has a host and a port."},
+        {"udp", "BlockSize", "", 1, "is not known."},
+        {"serial", "Port", "", text, "must name a serial port."},
+        {"serial", "BaudRate", "", 0, "must be a whole number from 1 to 4000000."},
+        {"serial", "Parity", "mark", text, "must be none, even or odd, not mark."},
+        {"serial", "StopBits", "", 1.5, "must be a whole number from 1 to 2."},
+        {"serial", "FlowControl", "x", text, "must be none, software or hardware, not x."},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.device + " " + row.name + "=" + row.text);
+        Channel channel(row.device);
+        const bool isTcp = row.device == "tcp";
+        const bool isSerial = row.device == "serial";
+        const bool isText = std::isnan(row.number);
+        // Two good options, and the bad one, which replaces one of the same name.
+        EXPECT_EQ(
+            channel.init(
+                3,
+                CODER_OPTION(isTcp      ? "Host"
+                             : isSerial ? "Port"
+                                        : "LocalHost",
+                             "char", 9, "127.0.0.1"),
+                CODER_OPTION(isTcp      ? "Port"
+                             : isSerial ? "BaudRate"
+                                        : "LocalPort",
+                             "int32", 1, &port),
+                CODER_OPTION(row.name.c_str(), isText ? "char" : "double", isText ? 99 : 1,
+                             isText ? static_cast<const void*>(row.text.c_str()) : &row.number)),
+            0);
+        // The one that is missing is the other one.
+        const bool isMissing = row.error.rfind("is missing", 0) == 0;
+        const std::string named = !isMissing ? row.name : row.name == "Host" ? "Port" : "Host";
+        EXPECT_EQ(channel.error(), unexpected + "Option " + named + ": " + row.error);
+    }
+}
+
+TEST(OpenTest, PeersThatAreNotThere)
+{
+    Channel tcp("tcp");
+    ASSERT_EQ(init(tcp, "int8"), 1);
+    EXPECT_EQ(tcp.open(), 0);
+    EXPECT_EQ(tcp.error(), unexpected + "Could not connect to " + peer + ": Connection refused");
+    Channel serial("serial");
+    ASSERT_EQ(serial.init(1, CODER_OPTION("Port", "char", 99, "/no/such")), 1);
+    EXPECT_EQ(serial.open(), 0);
+    EXPECT_EQ(serial.error(), unexpected + "Could not open /no/such: No such file or directory");
+    ASSERT_EQ(serial.init(1, CODER_OPTION("Port", "char", 99, "/dev/null")), 1);
+    EXPECT_EQ(serial.open(), 0);
+    EXPECT_EQ(serial.error(),
+              unexpected + "Could not open /dev/null: Inappropriate ioctl for device");
+}
