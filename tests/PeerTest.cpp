@@ -220,10 +220,10 @@ TEST(SerialTest, TwoPortsTalk)
                   1);
         Channel::waitUntil([&] { return end->open(5) == 1; });
     }
-    const int port = ::open(file.c_str(), O_RDWR | O_NOCTTY);
+    const int opened = ::open(file.c_str(), O_RDWR | O_NOCTTY);
     termios settings{};
-    EXPECT_EQ(tcgetattr(port, &settings), 0);
-    ::close(port);
+    EXPECT_EQ(tcgetattr(opened, &settings), 0);
+    ::close(opened);
     EXPECT_EQ(cfgetospeed(&settings), speed_t(B115200));
     EXPECT_EQ(settings.c_cflag & (CSTOPB | CRTSCTS), tcflag_t(CSTOPB | CRTSCTS));
 
