@@ -201,6 +201,18 @@ TEST(UdpTest, DatagramsArePackets)
     EXPECT_NE(sender.asyncError().find(lost + "70000 bytes were not sent to 127.0.0.1:"), npos);
 }
 
+TEST(UdpTest, APeerAnswers)
+{
+    const Program echo("socat UDP-RECVFROM:" + std::to_string(port) +
+                       ",bind=127.0.0.1,fork EXEC:cat");
+    Channel channel("udp");
+    ASSERT_EQ(init(channel, "double", port, "big"), 1);
+    ASSERT_EQ(channel.open(0), 1);
+    Channel::waitUntil([&] { // the first ones may come before the peer listens
+        return channel.write({1.5, -2}) == 2 && channel.read(2, 1) == Numbers{1.5, -2};
+    });
+}
+
 TEST(SerialTest, TwoPortsTalk)
 {
     const std::string other = file + "-other";
