@@ -22,6 +22,12 @@ public:
         return *this;
     }
 
+    /// The same for a text of a plug-in, which may be null: then there is none.
+    ErrorText& operator=(const char* text) noexcept
+    {
+        return *this = std::string_view(text == nullptr ? "" : text);
+    }
+
     void clear() noexcept { length = 0; }
     bool empty() const noexcept { return length == 0; }
     std::string_view view() const noexcept { return {characters.data(), length}; }

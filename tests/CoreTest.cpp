@@ -51,6 +51,14 @@ TEST(LoadTest, ErrorsSayWhatWasTriedAndWhy)
 {
     const std::string text = testing::TempDir() + "text.so";
     std::ofstream(text) << "This is a text and not a shared library, though it is as long as one.";
+    std::ifstream probeFile(testPlugins + "probe.so", std::ios::binary);
+    std::string bytes(std::istreambuf_iterator<char>(probeFile), {});
+    const std::string cut = testing::TempDir() + "cut.so";
+    std::ofstream(cut, std::ios::binary) << bytes.substr(0, 9000); // in the middle of its code
+    const std::string dependency = "libstdc++.so.6";
+    const std::string lacking = testing::TempDir() + "lacking.so";
+    std::ofstream(lacking, std::ios::binary)
+        << bytes.replace(bytes.find(dependency), dependency.size(), "libabsent.so.6");
     const std::string load = "Could not load ";
     const std::string create = "Could not create ";
     const std::string rows[][2] = {
@@ -59,6 +67,12 @@ TEST(LoadTest, ErrorsSayWhatWasTriedAndWhy)
         {"./none.so", load + "./none.so: ./none.so: cannot open shared object file: No such file "
                              "or directory"},
         {text, load + text + ": " + text + ": invalid ELF header"},
+        {folder, load + folder + ": it is not a regular file"},
+        {"/dev/zero", load + "/dev/zero: it is not a regular file"},
+        {cut, load + cut + ": the file is cut short"},
+        {lacking, load + lacking +
+                      ": libabsent.so.6: cannot open shared object file: No such file or "
+                      "directory"},
         {testPlugins + "throwsWhileLoading.so",
          load + testPlugins + "throwsWhileLoading.so: thrown while loading"},
         {testPlugins + "otherAbiVersion.so",

@@ -18,12 +18,14 @@ const std::string noInput = "brenix:InputStream:synchronousInputNotPossible|";
 const std::string noOutput = "brenix:OutputStream:synchronousOutputNotPossible|";
 
 int initProbe(Channel& channel, const std::string& streams, const std::vector<int>& packets = {},
-              const std::string& failIn = "", const std::string& raiseIn = "")
+              const std::string& failIn = "", const std::string& raiseIn = "",
+              const std::string& failAs = "")
 {
-    return channel.init(packets.empty() ? 3 : 4,
+    return channel.init(packets.empty() ? 4 : 5,
                         CODER_OPTION("Streams", "char", 9, streams.c_str()),
                         CODER_OPTION("FailIn", "char", 9, failIn.c_str()),
                         CODER_OPTION("RaiseIn", "char", 9, raiseIn.c_str()),
+                        CODER_OPTION("FailAs", "char", 9, failAs.c_str()),
                         CODER_OPTION("Packets", "int32", packets.size(), packets.data()));
 }
 
@@ -119,12 +121,24 @@ TEST(StateTest, OperationsOutOfOrderNameOperationAndState)
 
 TEST(StateTest, FailuresAndErrorsOfEachOperationReachTheCaller)
 {
+    const std::string unrecognized = unexpected + "Unrecognized error.";
     for (const std::string last : {"init", "open", "execute", "close", "term"}) {
-        for (const bool raises : {false, true}) {
-            SCOPED_TRACE(last);
+        const std::string failed = unexpected + "failed in " + last;
+        const std::pair<std::string, std::string> rows[] = {
+            {"", failed},
+            {"int", unrecognized},
+            {"own", unrecognized},
+            {"silent", unexpected},
+            {"long", (failed + std::string(5000, '!')).substr(0, unexpected.size() + 1023)},
+            {"raised", "|"}};
+        for (const auto& [as, error] : rows) {
+            SCOPED_TRACE(last + " " + as);
+            const bool raises = as == "raised";
             Channel channel(probe);
             const std::function<int()> steps[] = {
-                [&] { return initProbe(channel, "i", {}, raises ? "" : last, raises ? last : ""); },
+                [&] {
+                    return initProbe(channel, "i", {}, raises ? "" : last, raises ? last : "", as);
+                },
                 [&] { return channel.open(); },
                 [&] { return coderChannelExecute(channel.handle, "updateFromThread", 0); },
                 [&] { return coderChannelClose(channel.handle); },
@@ -134,9 +148,11 @@ TEST(StateTest, FailuresAndErrorsOfEachOperationReachTheCaller)
             while (step != std::end(steps) && (*step)() == 1) {
                 ++step;
             }
-            EXPECT_EQ(channel.error(), raises ? "|" : unexpected + "failed in " + last);
+            EXPECT_EQ(channel.error(), error);
             EXPECT_EQ(channel.error(coderChannelGetLastSyncError),
                       raises ? "probe:raised|" + last : "|");
+            coderChannelClose(channel.handle); // if it is open
+            EXPECT_EQ(initProbe(channel, "i"), 1); // and all is well again
         }
     }
 }
@@ -154,10 +170,11 @@ TEST(StreamTest, PeekListsWhatReadDelivers)
     EXPECT_EQ(channel.peek(), (Numbers{5, 5}));
     EXPECT_EQ(channel.read(2, 1), range(25, 27));
     EXPECT_EQ(channel.read(1, 1, "Stamp"), Numbers{30}); // repeated in each part
-    EXPECT_EQ(channel.read(8, 2), Numbers{});            // 7 are left
+    EXPECT_EQ(channel.read(1, 1, "Odd").size(), 7);      // does not divide either
+    EXPECT_EQ(channel.read(8, 2), Numbers{});            // 6 are left
     EXPECT_EQ(channel.error(), noInput);
     EXPECT_EQ(coderChannelClose(channel.handle), 1);
-    EXPECT_EQ(channel.read(7, 2), range(28, 35)); // also after close
+    EXPECT_EQ(channel.read(6, 2), range(29, 35)); // also after close
     EXPECT_EQ(channel.peek(), Numbers{});
     EXPECT_EQ(coderInputStreamReadBuffers(channel.input, 0, 0), 1);
 }
@@ -239,13 +256,52 @@ TEST(StreamTest, DevicesMayLackStreams)
 
 TEST(EventTest, AFailureOfTheDevicesThreadIsAnError)
 {
+    const struct {
+        std::string failAs; // or else:
+        int mistake;
+        std::string message;
+    } rows[] = {{"", 0, "failed in run"},
+                {"int", 0, "Unrecognized error."},
+                {"own", 0, "Unrecognized error."},
+                {"silent", 0, ""},
+                {"long", 0, ("failed in run" + std::string(5000, '!')).substr(0, 1023)},
+                {"", -1, "The device pushed a packet without counts."},
+                {"", -2, "A packet has no fields."},
+                {"", -3, "Field unknown is of a class that cannot be copied."},
+                {"", -4, "Field none has no elements."},
+                {"", -5, "Field null is of a class that cannot be copied."}};
     Channel channel(probe);
-    ASSERT_EQ(initProbe(channel, "i", {4, 4}, "run"), 1);
-    ASSERT_EQ(channel.open(infinity), 1);
-    EXPECT_EQ(channel.read(1, 1), Numbers{}); // the device's end ends the wait
-    EXPECT_EQ(channel.error(), noInput);
-    EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|failed in run");
+    for (const auto& [failAs, mistake, message] : rows) {
+        SCOPED_TRACE(message);
+        const bool pushes = mistake < 0;
+        ASSERT_EQ(
+            initProbe(channel, "i", {pushes ? 4 : 1, mistake, 1}, pushes ? "" : "run", "", failAs),
+            1);
+        ASSERT_EQ(channel.open(infinity), 1);
+        EXPECT_EQ(channel.read(5, 2), Numbers{}); // the device's end ends the wait
+        EXPECT_EQ(channel.error(), noInput);
+        EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|" + message);
+        EXPECT_EQ(coderChannelClose(channel.handle), 1);
+        EXPECT_EQ(channel.read(4, 1), pushes ? range(0, 4) : Numbers{}); // what came before
+    }
+}
+
+TEST(EventTest, StormsAndStreamsAfterTheEnd)
+{
+    Channel channel(probe, 4);
+    ASSERT_EQ(initProbe(channel, "io", {1}), 1);
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(coderChannelExecute(channel.handle, "storm", 0), 1);
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|" + std::string(1023, 'x'));
+    double level = 0;
+    EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Level", "double", 1, &level), 1);
+    EXPECT_EQ(level, 3);
+    EXPECT_EQ(channel.read(1, 1), Numbers{0});
     EXPECT_EQ(coderChannelClose(channel.handle), 1);
+    EXPECT_EQ(channel.write({1, 2}), 2); // for the next time
+    EXPECT_EQ(coderChannelExecute(channel.handle, "streamAfterClose", 0), 1) << channel.error();
+    EXPECT_EQ(channel.peek(), Numbers{});
+    EXPECT_EQ(channel.ask(coderStreamGetDataAvailable, channel.output), 2);
 }
 
 TEST(EventTest, PropertiesFollowTheDevice)
@@ -278,6 +334,44 @@ TEST(ConversionTest, AFailureLosesOnePacketAtMost)
     const Numbers third = range(20, 30);
     rest.insert(rest.end(), third.begin(), third.end());
     EXPECT_EQ(channel.read(20, 2), rest);
+}
+
+TEST(ConversionTest, SpoiltPacketsGoNoFurther)
+{
+    const std::string noConversion = "brenix:InputStream:couldNotConvertInputData|";
+    const std::string noOutputConversion = "brenix:OutputStream:couldNotConvertOutputData|";
+    Channel channel(probe, infinity, infinity, plugins + "pickyConverter.so");
+    ASSERT_EQ(initProbe(channel, "io", {14, 1, 1, 1, 1, 1}), 1);
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(channel.read(14, 1), Numbers{}); // 0 to 13
+    for (const double mistake : range(14, 18)) {
+        SCOPED_TRACE(mistake);
+        EXPECT_EQ(channel.read(1, 1), Numbers{});
+        EXPECT_EQ(channel.error(), noConversion);
+        EXPECT_EQ(channel.write({mistake}), 0);
+        EXPECT_EQ(channel.error(), noOutputConversion);
+    }
+    EXPECT_EQ(channel.read(1, 1), Numbers{18});
+
+    Channel filtered("loopback");
+    ASSERT_EQ(filtered.init(0), 1);
+    const std::string filter = plugins + "pickyFilter.so";
+    ASSERT_EQ(coderStreamAddFilter(filtered.output, filter.c_str(), 0), 1);
+    for (const double mistake : {13, 14, 16, 17}) {
+        EXPECT_EQ(filtered.write({mistake}), 0);
+        EXPECT_EQ(filtered.error(), noOutputConversion) << mistake;
+    }
+    const double numbers[] = {15, 1}; // the first becomes as many counts as there can be
+    double written = 0;
+    EXPECT_EQ(coderOutputStreamWriteTypedDataOld(filtered.output, &written, 2, "double",
+                                                 CODER_BUFFER(1, numbers),
+                                                 CODER_BUFFER(1, numbers + 1)),
+              0);
+    EXPECT_EQ(filtered.error(), noOutput);
+    ASSERT_EQ(coderStreamAddFilter(filtered.input, filter.c_str(), 0), 1);
+    EXPECT_EQ(filtered.write({1}), 1);
+    ASSERT_EQ(filtered.open(), 1);
+    EXPECT_EQ(filtered.read(1, 1), Numbers{1});
 }
 
 TEST(FilterTest, FiltersApplyInOrderAndAreTuned)

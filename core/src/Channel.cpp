@@ -133,7 +133,9 @@ void Channel::Impl::raise(const char* name, const char* identifier, const char* 
 {
     const std::lock_guard lock(handlerMutex);
     if (handler != nullptr) {
-        Event event(name, identifier, message);
+        // An error whose identifier is empty would pass for none.
+        const bool isNamed = identifier != nullptr && *identifier != '\0';
+        Event event(name, isNamed ? identifier : "brenix:Device:failed", message);
         handler->onCustomEvent(event);
     }
 }
@@ -162,10 +164,10 @@ bool Channel::Impl::enter(plugin::Packet& packet, bool waits)
     if (!input) {
         throw std::logic_error("The device pushed a packet but has no input stream.");
     }
-    if (!packet.fields || packet.counts == 0) {
+    if (packet.counts == 0) {
         throw std::invalid_argument("The device pushed a packet without counts.");
     }
-    requireCopyable(*packet.fields);
+    requireWhole(packet);
     Stream::Impl& stream = *input->impl;
     if (!stream.waitToPush(waits)) {
         return false;

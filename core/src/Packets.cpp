@@ -78,6 +78,21 @@ void visitField(const std::string& name, void* property, Visitor&& visitor)
     }
 }
 
+/// Throws when an array has lost its elements.
+struct RequireElements {
+    template <typename T>
+    void operator()(const TPointerProperty<T>& array) const
+    {
+        if (array.data == nullptr && array.count > 0) {
+            throw std::invalid_argument("Field " + array.name + " has no elements.");
+        }
+    }
+    template <typename Other>
+    void operator()(const Other& /*holds its values*/) const
+    {
+    }
+};
+
 } // namespace
 
 plugin::Packet slice(const plugin::Packet& packet, std::uint64_t first, std::uint64_t length)
@@ -106,10 +121,16 @@ plugin::Packet copyFields(const PropertyMap& fields)
     return copy;
 }
 
-void requireCopyable(const PropertyMap& fields)
+void requireWhole(const plugin::Packet& packet)
 {
-    for (const auto& [name, property] : fields) {
-        visitField(name, property, [](const auto& /*known*/) {});
+    if (packet.counts == 0) {
+        return; // it goes nowhere
+    }
+    if (!packet.fields) {
+        throw std::invalid_argument("A packet has no fields.");
+    }
+    for (const auto& [name, property] : *packet.fields) {
+        visitField(name, property, RequireElements());
     }
 }
 

@@ -16,8 +16,9 @@ plugin::Packet slice(const plugin::Packet& packet, std::uint64_t first, std::uin
 /// single value or a text.
 plugin::Packet copyFields(const brenixplugin::PropertyMap& fields);
 
-/// Throws when a field is of a class that these do not know.
-void requireCopyable(const brenixplugin::PropertyMap& fields);
+/// Throws when these could not copy a packet that a plug-in made or changed: it has no fields, one is
+/// of a class that they do not know, or an array lacks its elements.
+void requireWhole(const plugin::Packet& packet);
 
 } // namespace brenixcore
 

@@ -1,8 +1,12 @@
 #include "Plugin.hpp"
 
 #include <dlfcn.h>
+#include <elf.h>
 
 #include <cstdint>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
 #include <optional>
 #include <stdexcept>
 
@@ -29,6 +33,36 @@ std::string loaderError()
     return text == nullptr ? "the reason is not known" : text;
 }
 
+/// Throws for a file that dlopen would wait for without end, being no regular one, or that it would
+/// map and then die reading, since it ends before the segments that its headers announce. What else
+/// is wrong with it dlopen says itself.
+void requireWholeFile(const std::string& path)
+{
+    std::error_code error;
+    const std::filesystem::file_status status = std::filesystem::status(path, error);
+    if (!std::filesystem::is_regular_file(status)) {
+        if (std::filesystem::exists(status)) {
+            throw std::runtime_error("it is not a regular file");
+        }
+        return;
+    }
+    const std::uint64_t size = std::filesystem::file_size(path);
+    std::ifstream file(path, std::ios::binary);
+    Elf64_Ehdr header{};
+    file.read(reinterpret_cast<char*>(&header), sizeof header);
+    if (std::memcmp(header.e_ident, ELFMAG, SELFMAG) != 0) {
+        return;
+    }
+    Elf64_Phdr segment{};
+    file.seekg(static_cast<std::streamoff>(header.e_phoff));
+    for (int i = 0; i < header.e_phnum; ++i) {
+        file.read(reinterpret_cast<char*>(&segment), sizeof segment);
+        if (!file || segment.p_offset > size || segment.p_filesz > size - segment.p_offset) {
+            throw std::runtime_error("the file is cut short");
+        }
+    }
+}
+
 } // namespace
 
 std::string pluginPath(const std::string& name)
@@ -43,6 +77,7 @@ void PluginLibrary::Unload::operator()(void* library) const noexcept
 
 PluginLibrary::PluginLibrary(const std::string& path)
 {
+    requireWholeFile(path);
     // dlopen is declared not to throw, but a static object of the plug-in may. The library is then half
     // loaded and held once, and must not pass for loaded the next time.
     void* (*const volatile open)(const char*, int) = dlopen;
@@ -87,7 +122,8 @@ std::string currentExceptionText()
     try {
         throw;
     } catch (const std::exception& exception) {
-        return exception.what();
+        const char* const text = exception.what();
+        return text == nullptr ? "" : text;
     } catch (...) {
         return "Unrecognized error.";
     }

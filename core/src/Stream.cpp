@@ -49,7 +49,7 @@ bool Stream::Impl::waitToPush(bool waits)
     if (waits) {
         changed.wait(lock, [&] { return pending.empty() || phase != Phase::Open; });
     }
-    return pending.empty() && phase != Phase::Stopping;
+    return pending.empty() && takesPart();
 }
 
 void Stream::Impl::push(plugin::Packet packet)
@@ -95,7 +95,7 @@ std::optional<plugin::Packet> Stream::Impl::pull(bool waits)
     if (waits) {
         changed.wait(lock, [&] { return !packets.empty() || phase != Phase::Open; });
     }
-    if (packets.empty() || phase == Phase::Stopping) {
+    if (packets.empty() || !takesPart()) {
         return std::nullopt;
     }
     plugin::Packet packet = std::move(packets.front().packet);
@@ -209,8 +209,20 @@ void Stream::Impl::applyFilters(plugin::Packet& packet)
     for (const auto& filter : filters) {
         if (packet.counts > 0) {
             filter->apply(packet);
+            requireWhole(packet);
         }
     }
+}
+
+void Stream::Impl::convert(plugin::Packet& packet,
+                           void (plugin::Converter::*operation)(plugin::Packet&))
+{
+    const std::uint64_t before = packet.counts;
+    (converter.*operation)(packet);
+    if (packet.counts != before) {
+        throw std::logic_error("The converter changed the number of counts.");
+    }
+    requireWhole(packet);
 }
 
 // --- Both directions ---
@@ -326,11 +338,7 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
             continue;
         }
         try {
-            const std::uint64_t counts = current->packet.counts;
-            stream.converter.convertInput(current->packet);
-            if (!current->packet.fields || current->packet.counts != counts) {
-                throw std::logic_error("The converter changed the number of counts.");
-            }
+            stream.convert(current->packet, &plugin::Converter::convertInput);
             current->converted = true;
         } catch (...) {
             taken.packets.erase(current);
@@ -376,10 +384,14 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
         plugin::Packet packet = copyFields(*static_cast<const PropertyMap*>(buffer));
         written += packet.counts;
         try {
-            stream.converter.convertOutput(packet);
+            stream.convert(packet, &plugin::Converter::convertOutput);
             stream.applyFilters(packet);
         } catch (...) {
             throw CouldNotConvertOutputData(currentExceptionText());
+        }
+        if (packet.counts > stream.limit - size) {
+            throw SynchronousOutputNotPossible("Cannot write more counts than the limit of " +
+                                               std::to_string(stream.limit) + ".");
         }
         size += packet.counts;
         if (packet.counts > 0) {
@@ -392,9 +404,6 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
         throw SynchronousOutputNotPossible("Cannot write " + std::to_string(size) +
                                            " counts: " + why + ".");
     };
-    if (size > stream.limit) {
-        refuse("the limit is " + std::to_string(stream.limit));
-    }
     stream.wait(lock, [&] { return stream.fits(size); });
     if (!stream.fits(size)) {
         refuse(std::string("there is no room and ") + stream.reason());

@@ -73,8 +73,14 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     void tuneFilters(const brenixplugin::PropertyMap& options);
     void applyFilters(plugin::Packet& packet);
 
+    /// Runs an operation of the converter. Throws when it does, or leaves the packet as it must not.
+    void convert(plugin::Packet& packet, void (plugin::Converter::*operation)(plugin::Packet&));
+
     /// Whether the other side may still take or bring data. Under the mutex.
     bool isFlowing() const { return phase == Phase::Open && !deviceDone; }
+
+    /// Whether the device may bring or take data. Under the mutex.
+    bool takesPart() const { return phase == Phase::Open || phase == Phase::Draining; }
 
     /// Whether `more` counts have room. Under the mutex.
     bool fits(std::uint64_t more) const { return counts <= limit && more <= limit - counts; }

@@ -17,8 +17,22 @@ using namespace brenixcore::plugin;
 using namespace brenixplugin;
 using namespace brenixplugin::kit;
 
-/// Options: Packets (counts of the packets to push, as int32), Streams ("i", "o", "io", ""), FailIn
-/// and RaiseIn (an operation: init, open, run, execute, close, term).
+/// No std::exception, and known to nobody else.
+struct OwnException {
+};
+
+struct SilentException : std::exception {
+    const char* what() const noexcept override { return nullptr; }
+};
+
+struct UnknownProperty : interfaces::IPropertyInfo {
+    const char* getName() const override { return "unknown"; }
+    void destroy() override { delete this; }
+};
+
+/// Options: Packets (counts of the packets to push, as int32; of those below 0 each is a mistake of
+/// its own), Streams ("i", "o", "io", ""), FailIn and RaiseIn (an operation: init, open, run, execute,
+/// close, term), FailAs (what is thrown: "", "int", "own", "silent", "long").
 class Probe : public Device
 {
 public:
@@ -28,6 +42,7 @@ public:
         host = &deviceHost;
         Options options(optionMap);
         failIn = options.text("FailIn").value_or("");
+        failAs = options.text("FailAs").value_or("");
         raiseIn = options.text("RaiseIn").value_or("");
         const std::string streams = options.text("Streams").value_or("i");
         packets.clear();
@@ -54,13 +69,18 @@ public:
 
     void open(const PropertyMap& /*options*/) override { reach("open"); }
 
-    /// Pushes packets of running numbers in "data", with a "Stamp" and the "Address" of
-    /// the numbers each; then takes all output.
+    /// Pushes packets of running numbers in "data", with a "Stamp", seven numbers "Odd" and the
+    /// "Address" of the numbers each; then takes all output.
     void run(DeviceStreams& streams) override
     {
         reach("run");
+        lastStreams = &streams;
         double next = 0;
         for (const int counts : packets) {
+            if (counts < 0) {
+                pushMistake(counts);
+                continue;
+            }
             const auto size = static_cast<std::uint64_t>(counts);
             std::unique_ptr<double[]> values(new double[size]);
             for (std::uint64_t i = 0; i < size; ++i) {
@@ -71,6 +91,7 @@ public:
             setField(packet, makeScalar("Address", reinterpret_cast<std::uintptr_t>(values.get())));
             setField(packet, makeArray(dataField, std::move(values), size));
             setField(packet, makeScalar("Stamp", next));
+            setField(packet, makeArray("Odd", std::make_unique<double[]>(7), 7));
             if (!streams.push(std::move(packet))) {
                 host->raise("error", "probe:push", "refused");
                 return;
@@ -83,6 +104,31 @@ public:
     void execute(const std::string& command, const PropertyMap& optionMap) override
     {
         reach("execute");
+        if (command == "streamAfterClose") {
+            Packet packet;
+            packet.counts = 1;
+            if (lastStreams->tryPush(packet) || lastStreams->push(std::move(packet)) ||
+                lastStreams->pull()) {
+                throw std::logic_error("the streams of a closed channel took part");
+            }
+            return;
+        }
+        if (command == "storm") {
+            std::vector<std::thread> threads(4);
+            for (std::thread& thread : threads) {
+                thread = std::thread([&] {
+                    for (int i = 0; i < 500; ++i) {
+                        host->updateProperty(makeScalar("Level", 3.0));
+                        host->updateProperty(makeScalar("Other", i));
+                        host->raise("error", "", std::string(5000, 'x').c_str());
+                    }
+                });
+            }
+            for (std::thread& thread : threads) {
+                thread.join();
+            }
+            return;
+        }
         if (command != "updateFromThread") {
             Device::execute(command, optionMap);
         }
@@ -106,12 +152,40 @@ private:
             host->raise("error", "probe:raised", operation.c_str());
         }
         if (operation == failIn) {
-            throw std::runtime_error("failed in " + operation);
+            if (failAs == "int") {
+                throw 5;
+            }
+            if (failAs == "own") {
+                throw OwnException();
+            }
+            if (failAs == "silent") {
+                throw SilentException();
+            }
+            throw std::runtime_error("failed in " + operation +
+                                     std::string(failAs == "long" ? 5000 : 0, '!'));
         }
     }
 
+    void pushMistake(int mistake)
+    {
+        Packet packet;
+        packet.counts = mistake == -1 ? 0 : 5;
+        if (mistake == -2) {
+            packet.fields.reset();
+        } else if (mistake == -3) {
+            setField(packet, OwnedProperty(new UnknownProperty));
+        } else if (mistake == -4) {
+            setField(packet, makeArray<int>("none", nullptr, 5));
+        } else if (mistake == -5) {
+            packet.fields->emplace("null", nullptr);
+        }
+        lastStreams->push(std::move(packet));
+    }
+
     DeviceHost* host = nullptr;
+    DeviceStreams* lastStreams = nullptr;
     std::string failIn;
+    std::string failAs;
     std::string raiseIn;
     std::vector<int> packets;
     bool hasOutput = false;

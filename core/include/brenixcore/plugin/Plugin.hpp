@@ -31,8 +31,9 @@ constexpr std::uint32_t abiVersion = 1;
 class BRENIXCORE_PLUGIN_SHARED DeviceHost
 {
 public:
-    /// Raises an event. `name` is "error", "warning" or "trace". On the thread that is inside an
-    /// operation of the channel, an error throws, and the exception must pass through the device.
+    /// Raises an event. `name` is "error", "warning" or "trace". An event without an identifier has
+    /// brenix:Device:failed. On the thread that is inside an operation of the channel, an error throws,
+    /// and the exception must pass through the device.
     virtual void raise(const char* name, const char* identifier, const char* message) = 0;
 
     /// Gives a property that init() delivered a new value.
@@ -42,7 +43,8 @@ protected:
     ~DeviceHost() = default;
 };
 
-/// The streams as a device's worker thread sees them.
+/// The streams as a device's worker thread sees them. After run() they take and give nothing, and from
+/// the next init() on they are not to be used.
 class BRENIXCORE_PLUGIN_SHARED DeviceStreams
 {
 public:
@@ -124,7 +126,7 @@ class BRENIXCORE_PLUGIN_SHARED Converter
 public:
     virtual ~Converter() = default;
 
-    /// Changes the fields, not the number of counts.
+    /// Changes the fields, not the number of counts. The fields must stay of the classes of Visit.hpp.
     virtual void convertInput(Packet& packet) = 0;
     virtual void convertOutput(Packet& packet) = 0;
 };
@@ -139,8 +141,9 @@ public:
     /// Called with the options that the filter is added with, and again whenever it is tuned.
     virtual void tune(const brenixplugin::PropertyMap& options) = 0;
 
-    /// May change fields and counts; a packet that is left without counts is dropped. A write that then
-    /// finds no room is refused, though its packets came this far; the caller may write them again.
+    /// May change fields, within the classes of Visit.hpp, and counts; a packet that is left without
+    /// counts is dropped. A write that then finds no room is refused, though its packets came this far;
+    /// the caller may write them again.
     virtual void apply(Packet& packet) = 0;
 };
 
