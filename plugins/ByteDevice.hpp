@@ -2,6 +2,7 @@
 #ifndef BRENIX_PLUGINS_BYTEDEVICE_HPP
 #define BRENIX_PLUGINS_BYTEDEVICE_HPP
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
@@ -68,6 +69,14 @@ constexpr std::array elementTypes = {
     elementType<unsigned char>("uint8"), elementType<unsigned short>("uint16"),
     elementType<unsigned int>("uint32"), elementType<unsigned long>("uint64"),
 };
+
+/// The options that readFormat() reads.
+constexpr OptionInfo elementTypeOption = {"ElementType", "text", "", "uint8",
+                                          "double, float, int8 to int64 or uint8 to uint64"};
+constexpr OptionInfo byteOrderOption = {"ByteOrder", "text", "", "little",
+                                        "little or big: of the elements on their way"};
+constexpr OptionInfo blockSizeOption = {"BlockSize", "whole number", "elements", "16384",
+                                        "of the largest packet that arrives"};
 
 /// What a property holds that is not what it should be.
 inline std::string describe(IPropertyInfo* property)

@@ -2,6 +2,7 @@
 // stream. A count is a frame: one sample of each channel, interleaved in the field "data" as
 // double, full scale from -1 to 1.
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
@@ -237,6 +238,27 @@ private:
     DeviceHost* deviceHost = nullptr;
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"FileName", "text", "", "(required)", "the file; when writing, its ending names the format"},
+    {"Mode", "text", "", "read", "read or write"},
+    {"BlockSize", "whole number", "frames", "1024", "reading: frames of one packet"},
+    {"SampleRate", "whole number", "Hz", "48000", "writing"},
+    {"Channels", "whole number", "", "1", "writing"},
+    {"SampleFormat", "text", "", "PCM_16",
+     "writing: libsndfile's name of an encoding, such as PCM_24, FLOAT, DOUBLE, ULAW, VORBIS, "
+     "ALAC_16; which ones a file format has is its own matter, and refused otherwise"},
+    {},
+};
+
+constexpr PropertyInfo propertyTable[] = {
+    {"SampleRate", "double", "Hz", ""},
+    {"Channels", "uint32", "", ""},
+    {"Frames", "int64", "frames", "of the file as it was at init"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(AudioFile)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
+BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)

@@ -1,6 +1,7 @@
 // Converter `columns`: the interleaved numbers of the field "data", k for each count, become the
 // fields Data1 to Datak with one number for each count. Everything else passes as it is.
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 #include "brenixcore/plugin/Visit.hpp"
@@ -62,3 +63,4 @@ public:
 } // namespace
 
 BRENIXCORE_EXPORT_CONVERTER(Columns)
+BRENIXCORE_DESCRIBE_OPTIONS(brenixcore::plugin::noOptions)

@@ -1,5 +1,6 @@
 // Filter `decimate`: keeps every n-th count, across packets.
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 #include "brenixcore/plugin/Visit.hpp"
@@ -74,6 +75,12 @@ private:
     std::uint64_t skip = 0; ///< counts until the next one that stays
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"Factor", "whole number", "counts", "1", "one of so many stays"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_FILTER(Decimate)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)

@@ -1,5 +1,6 @@
 // Converter `identity`: data passes as it is.
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
 namespace
@@ -15,3 +16,4 @@ public:
 } // namespace
 
 BRENIXCORE_EXPORT_CONVERTER(Identity)
+BRENIXCORE_DESCRIBE_OPTIONS(brenixcore::plugin::noOptions)

@@ -1,5 +1,6 @@
 // Device `loopback`: what is written comes back.
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
@@ -43,3 +44,4 @@ private:
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Loopback)
+BRENIXCORE_DESCRIBE_OPTIONS(brenixcore::plugin::noOptions)

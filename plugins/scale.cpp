@@ -1,5 +1,6 @@
 // Filter `scale`: multiplies every number in arrays by a gain and adds an offset.
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 #include "brenixcore/plugin/Visit.hpp"
@@ -74,6 +75,13 @@ private:
     double offset = 0;
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"Gain", "number", "", "1", "what numbers are multiplied by"},
+    {"Offset", "number", "", "0", "what is then added"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_FILTER(Scale)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)

@@ -82,6 +82,20 @@ private:
     Base::flow_control::type flowControl = Base::flow_control::none;
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"Port", "text", "", "(required)", "such as /dev/ttyUSB0"},
+    {"BaudRate", "whole number", "baud", "9600", "one that the system knows"},
+    {"Parity", "text", "", "none", "none, even or odd"},
+    {"StopBits", "whole number", "", "1", "1 or 2"},
+    {"FlowControl", "text", "", "none",
+     "none, software (XON and XOFF, which then cannot be data) or hardware (RTS and CTS)"},
+    elementTypeOption,
+    byteOrderOption,
+    blockSizeOption,
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Serial)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)

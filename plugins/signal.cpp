@@ -1,6 +1,7 @@
 // Device `signal`: a test signal, on one or more channels. A count is a frame: one sample of each
 // channel, interleaved in the field "data" as double.
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
@@ -185,6 +186,29 @@ private:
     double amplitude = 1;
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"Waveform", "text", "", "sine", "sine, square, ramp (-1 to 1) or noise (evenly from -1 to 1)"},
+    {"Frequency", "number", "Hz", "440", "0 to half the sample rate"},
+    {"Amplitude", "number", "", "1", "of the highest and the lowest value"},
+    {"Channels", "whole number", "", "1", ""},
+    {"SampleRate", "number", "Hz", "48000", ""},
+    {"BlockSize", "whole number", "frames", "1024", "of one packet"},
+    {"Frames", "whole number", "frames", "endless", "after which the device is done"},
+    {"Pace", "text", "", "realtime",
+     "realtime delivers a block when its last frame is due, fast as soon as there is room"},
+    {},
+};
+
+constexpr PropertyInfo propertyTable[] = {
+    {"SampleRate", "double", "Hz", ""},
+    {"Frequency", "double", "Hz", ""},
+    {"Amplitude", "double", "", ""},
+    {"Channels", "uint32", "", ""},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Signal)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
+BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)

@@ -97,6 +97,18 @@ private:
     std::chrono::steady_clock::duration timeout{};
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"Host", "text", "", "(required)", "name or address"},
+    {"Port", "whole number", "", "(required)", "1 to 65535"},
+    elementTypeOption,
+    byteOrderOption,
+    blockSizeOption,
+    {"ConnectTimeout", "number", "seconds", "10",
+     "for the connection, up to 86400; the system's look-up of the name is apart"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Tcp)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)

@@ -100,6 +100,25 @@ private:
     }
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"LocalHost", "text", "", "127.0.0.1",
+     "address to receive at; 0.0.0.0 for all of this machine"},
+    {"LocalPort", "whole number", "", "0", "port to receive at; 0 for a free one"},
+    {"Host", "text", "", "none",
+     "where output goes; without it and Port there is no output stream"},
+    {"Port", "whole number", "", "none", "the same"},
+    elementTypeOption,
+    byteOrderOption,
+    {},
+};
+
+constexpr PropertyInfo propertyTable[] = {
+    {"LocalPort", "uint16", "", "the port that it receives at"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Udp)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
+BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)

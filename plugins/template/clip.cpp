@@ -1,5 +1,6 @@
-// A filter that limits the numbers in arrays. Option: Highest (number), also while data flows.
+// A filter that limits the numbers in arrays.
 
+#include <brenixcore/plugin/Describe.hpp>
 #include <brenixcore/plugin/Options.hpp>
 #include <brenixcore/plugin/Plugin.hpp>
 #include <brenixcore/plugin/Visit.hpp>
@@ -50,6 +51,12 @@ private:
     double highest = std::numeric_limits<double>::infinity();
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"Highest", "number", "", "infinity", "the highest number that passes, also while data flows"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_FILTER(Clip)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)

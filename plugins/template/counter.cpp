@@ -1,8 +1,8 @@
 // A device that counts: it pushes running numbers as "uint32" in the field "data".
 //
-// Option at init: BlockSize (whole number, default 4), the numbers of one packet.
-// Property: Next ("uint32"), the number that comes next. Command: restart.
+// Its option and its property are described at the end. Command: restart.
 
+#include <brenixcore/plugin/Describe.hpp>
 #include <brenixcore/plugin/Make.hpp>
 #include <brenixcore/plugin/Options.hpp>
 #include <brenixcore/plugin/Plugin.hpp>
@@ -65,6 +65,18 @@ private:
     std::atomic<unsigned> next = 0;
 };
 
+constexpr OptionInfo optionTable[] = {
+    {"BlockSize", "whole number", "numbers", "4", "of one packet"},
+    {},
+};
+
+constexpr PropertyInfo propertyTable[] = {
+    {"Next", "uint32", "", "the number that comes next"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Counter)
+BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
+BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)

@@ -1,6 +1,7 @@
 // A converter that gives the caller the field "data" under the name "Values". A converter may do
 // anything with the fields of a packet, such as decode them; output here passes as it is.
 
+#include <brenixcore/plugin/Describe.hpp>
 #include <brenixcore/plugin/Plugin.hpp>
 
 #include <utility>
@@ -27,3 +28,4 @@ public:
 } // namespace
 
 BRENIXCORE_EXPORT_CONVERTER(Rename)
+BRENIXCORE_DESCRIBE_OPTIONS(brenixcore::plugin::noOptions)
