@@ -16,17 +16,6 @@ namespace brenixcore
 namespace
 {
 
-/// The folder of the plug-ins, beside this library.
-std::string pluginFolder()
-{
-    Dl_info info{};
-    if (dladdr(reinterpret_cast<const void*>(&pluginFolder), &info) == 0) {
-        throw std::runtime_error("the folder of this library is not known");
-    }
-    const std::string library = info.dli_fname;
-    return library.substr(0, library.rfind('/') + 1) + "brenix-plugins/";
-}
-
 std::string loaderError()
 {
     const char* const text = dlerror();
@@ -65,9 +54,19 @@ void requireWholeFile(const std::string& path)
 
 } // namespace
 
+std::string plugin::pluginFolder()
+{
+    Dl_info info{};
+    if (dladdr(reinterpret_cast<const void*>(&pluginPath), &info) == 0) {
+        throw std::runtime_error("the folder of this library is not known");
+    }
+    const std::string library = info.dli_fname;
+    return library.substr(0, library.rfind('/') + 1) + "brenix-plugins/";
+}
+
 std::string pluginPath(const std::string& name)
 {
-    return name.find('/') != std::string::npos ? name : pluginFolder() + name + ".so";
+    return name.find('/') != std::string::npos ? name : plugin::pluginFolder() + name + ".so";
 }
 
 void PluginLibrary::Unload::operator()(void* library) const noexcept
@@ -106,6 +105,11 @@ void PluginLibrary::requireAbiVersion() const
         throw std::runtime_error("it has plug-in ABI version " + std::to_string(version) +
                                  ", needed is " + std::to_string(plugin::abiVersion));
     }
+}
+
+bool PluginLibrary::has(const char* symbol) const noexcept
+{
+    return dlsym(handle.get(), symbol) != nullptr;
 }
 
 void* PluginLibrary::address(const char* symbol) const

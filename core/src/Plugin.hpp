@@ -3,11 +3,13 @@
 #define BRENIXCORE_SRC_PLUGIN_HPP
 
 #include "brenixcore/Exceptions.hpp"
+#include "brenixcore/plugin/Inspect.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
 #include <exception>
 #include <memory>
 #include <optional>
+#include <stdexcept>
 #include <string>
 #include <utility>
 
@@ -30,6 +32,8 @@ public:
 
     /// Throws std::runtime_error with both versions when the plug-in was made for another.
     void requireAbiVersion() const;
+
+    bool has(const char* symbol) const noexcept;
 
     /// An exported function; throws std::runtime_error when there is none of that name.
     template <typename Function>
@@ -59,6 +63,17 @@ struct LoadedPlugin {
 /// loaded.
 std::string currentExceptionText();
 
+/// Makes the object of a loaded plug-in.
+template <typename Interface>
+std::unique_ptr<Interface> createPlugin(const PluginLibrary& library, const char* factory)
+{
+    std::unique_ptr<Interface> object(library.function<Interface*()>(factory)());
+    if (!object) {
+        throw std::runtime_error("the factory returned nothing");
+    }
+    return object;
+}
+
 /// Loads a plug-in and makes its object. Whatever goes wrong becomes one of the two exceptions
 /// while the library, to which an exception may belong, is still loaded.
 template <typename Interface, typename LoadError, typename CreateError>
@@ -75,10 +90,7 @@ LoadedPlugin<Interface> loadPlugin(const std::string& name, const char* factory)
     }
     std::unique_ptr<Interface> object;
     try {
-        object.reset(library->template function<Interface*()>(factory)());
-        if (!object) {
-            throw std::runtime_error("the factory returned nothing");
-        }
+        object = createPlugin<Interface>(*library, factory);
     } catch (...) {
         throw CreateError("Could not create " + path + ": " + currentExceptionText());
     }
