@@ -93,8 +93,10 @@
 
 #include <stdint.h>
 
+/** An exported function. */
 #define CODER_API __attribute__((visibility("default")))
 
+/** noexcept, in the words of the language. */
 #if !defined(__cplusplus)
 #define CODER_NOEXCEPT
 #elif __cplusplus >= 201103L

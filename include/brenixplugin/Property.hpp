@@ -21,6 +21,7 @@
 #include <utility>
 #include <vector>
 
+/// Classes that pass between the modules of a process.
 #define BRENIXPLUGIN_SHARED __attribute__((visibility("default")))
 
 namespace brenixplugin
@@ -56,6 +57,7 @@ template <typename T>
 class BRENIXPLUGIN_SHARED TScalarProperty : public interfaces::IPropertyInfo
 {
 public:
+    /// Moves both in.
     TScalarProperty(std::string propertyName, T propertyValue)
         : name(std::move(propertyName)), value(std::move(propertyValue))
     {
@@ -67,8 +69,8 @@ public:
     const char* getName() const override { return name.c_str(); }
     void destroy() override { delete this; }
 
-    std::string name;
-    T value;
+    std::string name; ///< what getName() returns
+    T value;          ///< the value
 };
 
 /// A sequence of T. For bool the vector is the packed one, a bit per element.
@@ -88,8 +90,8 @@ public:
     const char* getName() const override { return name.c_str(); }
     void destroy() override { delete this; }
 
-    std::string name;
-    std::vector<T> values;
+    std::string name;      ///< what getName() returns
+    std::vector<T> values; ///< the elements
 };
 
 } // namespace device
@@ -116,9 +118,9 @@ public:
     const char* getName() const override { return name.c_str(); }
     void destroy() override { delete this; }
 
-    std::string name;
-    T* data;
-    std::uint64_t count;
+    std::string name;    ///< what getName() returns
+    T* data;             ///< the elements, or null
+    std::uint64_t count; ///< of the elements
 };
 
 } // namespace coderconverter
@@ -128,8 +130,9 @@ public:
 /// nothing: who releases the objects is stated wherever a map is passed.
 using PropertyMap = std::map<std::string, void*>;
 
-/// Releases a property object through destroy(); a null pointer is nothing.
+/// Releases a property object through destroy().
 struct PropertyReleaser {
+    /// Not null.
     void operator()(interfaces::IPropertyInfo* property) const noexcept { property->destroy(); }
 };
 
@@ -158,17 +161,20 @@ struct OwnedPropertyMap {
     OwnedPropertyMap& operator=(const OwnedPropertyMap&) = delete;
     ~OwnedPropertyMap() { releaseProperties(map); }
 
-    PropertyMap map;
+    PropertyMap map; ///< null objects are allowed
 };
 
-/// A heap-allocated property map whose objects belong to it: a data buffer, fields by name.
+/// Releases a data buffer with its objects.
 struct DataBufferReleaser {
+    /// Not null.
     void operator()(PropertyMap* buffer) const noexcept
     {
         releaseProperties(*buffer);
         delete buffer;
     }
 };
+
+/// A heap-allocated property map whose objects belong to it: a data buffer, fields by name.
 using OwnedDataBuffer = std::unique_ptr<PropertyMap, DataBufferReleaser>;
 
 /// Stores a property under a name of the map, which owns its objects; an object that was there is

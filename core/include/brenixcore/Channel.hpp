@@ -22,12 +22,13 @@ public:
     /// "error", "errorMessage", "warning", "warningMessage", "trace", "traceMessage" or any other
     /// name. This text and the two below are NUL-terminated, never null, and valid during the call.
     virtual const char* getEventName() = 0;
-    virtual const char* getIdentifier() = 0;
-    virtual const char* getMessage() = 0;
+    virtual const char* getIdentifier() = 0; ///< of the error or message
+    virtual const char* getMessage() = 0;    ///< for people
 
     /// Called by the handler for every event whose name it recognises.
     virtual void accept() { onAccepted(); }
 
+    /// For the core's own use.
     virtual bool isAccepted() const { return false; }
 
     /// What accept() forwards to.
@@ -68,8 +69,8 @@ public:
         /// Calls event.invoke() and returns its result.
         virtual void* onDelegatedEvent(DelegatedEvent& event) = 0;
 
-        virtual void onIgnoredEvent1(void* event) = 0;
-        virtual void onIgnoredEvent2(void* event) = 0;
+        virtual void onIgnoredEvent1(void* event) = 0; ///< does nothing
+        virtual void onIgnoredEvent2(void* event) = 0; ///< does nothing
         virtual ~IEventHandler() = default;
     };
 
@@ -90,17 +91,23 @@ public:
     /// owned by the caller; the map may hold those of an earlier init.
     void init(const std::map<std::string, void*>& options,
               std::map<std::string, void*>& properties);
+
+    /// Lets the device start to work.
     void open(const std::map<std::string, void*>& options);
 
     /// Runs a command of the device; the command is NUL-terminated.
     void execute(const char* command, const std::map<std::string, void*>& options);
+
+    /// Hands the device what is queued for output, then stops it. Unread input stays.
     void close();
+
+    /// Releases what init() prepared.
     void term();
-    bool isOpen() const;
+    bool isOpen() const; ///< between open() and close()
 
     /// The streams, null where the device has none; valid until the next init() or the destructor.
     InputStream* getInputStream() const;
-    OutputStream* getOutputStream() const;
+    OutputStream* getOutputStream() const; ///< as getInputStream()
 
 private:
     struct Impl;

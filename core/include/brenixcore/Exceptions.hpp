@@ -6,6 +6,7 @@
 
 #include <stdexcept>
 
+/// Classes that pass between the modules of a process.
 #define BRENIXCORE_API __attribute__((visibility("default")))
 
 namespace brenixcore

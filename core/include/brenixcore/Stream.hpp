@@ -25,7 +25,7 @@ public:
     Stream& operator=(const Stream&) = delete;
     virtual ~Stream();
 
-    virtual bool isInput() const;
+    virtual bool isInput() const; ///< whether it is an InputStream
 
     /// Adds a filter behind those already there. Takes over the objects in `options`, also when it
     /// throws.
@@ -40,7 +40,7 @@ public:
     /// Discards what is buffered.
     virtual void flush();
 
-    bool isOpen() const;
+    bool isOpen() const; ///< while the channel is open
 
     /// Whether the stream has no limit; then getSpaceAvailable() has no meaning.
     bool isUnlimited() const;
@@ -53,15 +53,16 @@ public:
 
 protected:
     struct Impl;
-    explicit Stream(std::unique_ptr<Impl> state);
+    explicit Stream(std::unique_ptr<Impl> state); ///< made by the channel
     friend class Channel;
-    std::unique_ptr<Impl> impl;
+    std::unique_ptr<Impl> impl; ///< what a core keeps
 };
 
 /// From the device to the caller.
 class BRENIXCORE_API InputStream : public Stream
 {
 public:
+    /// Made by the channel.
     explicit InputStream(std::unique_ptr<Impl> state);
     ~InputStream() override;
 
@@ -89,6 +90,7 @@ public:
 class BRENIXCORE_API OutputStream : public Stream
 {
 public:
+    /// Made by the channel.
     explicit OutputStream(std::unique_ptr<Impl> state);
     ~OutputStream() override;
 

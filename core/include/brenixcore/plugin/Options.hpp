@@ -20,6 +20,7 @@ namespace brenixcore::plugin
 class Options
 {
 public:
+    /// Reads from the map, which must outlive this object.
     explicit Options(const brenixplugin::PropertyMap& optionMap) : options(optionMap) {}
 
     /// A text. Options carry it as one UTF-16 code unit for each byte of the caller's text.
@@ -81,6 +82,7 @@ public:
         }
     }
 
+    /// Throws the error.
     [[noreturn]] static void fail(const std::string& name, const std::string& problem)
     {
         throw std::invalid_argument("Option " + name + ": " + problem + ".");

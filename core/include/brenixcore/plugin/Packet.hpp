@@ -17,8 +17,8 @@ namespace brenixcore::plugin
 /// with a whole number of elements for each count is divided with it, and any other field is
 /// repeated in each part.
 struct Packet {
-    brenixplugin::OwnedDataBuffer fields{new brenixplugin::PropertyMap};
-    std::uint64_t counts = 0;
+    brenixplugin::OwnedDataBuffer fields{new brenixplugin::PropertyMap}; ///< never null
+    std::uint64_t counts = 0;                                            ///< of each field
 };
 
 /// Adds a field, or replaces the one of its name.

@@ -19,6 +19,7 @@
 #include <stdexcept>
 #include <string>
 
+/// Classes that pass between the modules of a process.
 #define BRENIXCORE_PLUGIN_SHARED __attribute__((visibility("default")))
 
 namespace brenixcore::plugin
@@ -77,9 +78,10 @@ struct StreamInfo {
     std::uint64_t countDimension = 1; ///< the dimension of the data along which it counts
 };
 
+/// The streams that a device has.
 struct DeviceInfo {
-    std::optional<StreamInfo> input;
-    std::optional<StreamInfo> output;
+    std::optional<StreamInfo> input;  ///< to the caller
+    std::optional<StreamInfo> output; ///< from the caller
 };
 
 /// A device. All operations but run() are called on the thread that uses the channel.
@@ -128,6 +130,8 @@ public:
 
     /// Changes the fields, not the number of counts. The fields must stay of the classes of Visit.hpp.
     virtual void convertInput(Packet& packet) = 0;
+
+    /// The same on the way to the device.
     virtual void convertOutput(Packet& packet) = 0;
 };
 
@@ -149,11 +153,14 @@ public:
 
 } // namespace brenixcore::plugin
 
-/// Exports the plug-in's class, which has a default constructor.
+/// Exports the plug-in's class, which has a default constructor: a Device...
 #define BRENIXCORE_EXPORT_DEVICE(Class) BRENIXCORE_EXPORT_PLUGIN(Device, Class)
+/// ... or a Converter...
 #define BRENIXCORE_EXPORT_CONVERTER(Class) BRENIXCORE_EXPORT_PLUGIN(Converter, Class)
+/// ... or a Filter.
 #define BRENIXCORE_EXPORT_FILTER(Class) BRENIXCORE_EXPORT_PLUGIN(Filter, Class)
 
+/// What the three have in common.
 #define BRENIXCORE_EXPORT_PLUGIN(Kind, Class)                                                      \
     extern "C" BRENIXCORE_PLUGIN_SHARED std::uint32_t brenixcorePluginAbiVersion()                 \
     {                                                                                              \
