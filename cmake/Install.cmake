@@ -12,3 +12,23 @@ function(brenix_install_package package)
     install(FILES ${PROJECT_BINARY_DIR}/${package}Config.cmake
         ${PROJECT_BINARY_DIR}/${package}ConfigVersion.cmake DESTINATION ${folder})
 endfunction()
+
+# What pkg-config needs to know. It follows the installation when that is moved.
+function(brenix_install_pkgconfig)
+    set(folder ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
+    file(RELATIVE_PATH up /${folder} /)
+    configure_file(${PROJECT_SOURCE_DIR}/cmake/brenixcoder.pc.in
+        ${PROJECT_BINARY_DIR}/brenixcoder.pc @ONLY)
+    install(FILES ${PROJECT_BINARY_DIR}/brenixcoder.pc DESTINATION ${folder})
+endfunction()
+
+# The documentation, laid out as in the repository, so that its links hold.
+function(brenix_install_docs)
+    set(folder ${CMAKE_INSTALL_DOCDIR})
+    install(FILES README.md DESTINATION ${folder})
+    install(DIRECTORY docs DESTINATION ${folder} FILES_MATCHING PATTERN *.md PATTERN *.svg
+        PATTERN man EXCLUDE)
+    install(DIRECTORY examples DESTINATION ${folder} FILES_MATCHING PATTERN *.c PATTERN *.h)
+    install(DIRECTORY plugins/template DESTINATION ${folder}/plugins)
+    install(FILES docs/man/brenixcoder.3 DESTINATION ${CMAKE_INSTALL_MANDIR}/man3)
+endfunction()

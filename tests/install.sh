@@ -1,0 +1,97 @@
+#!/usr/bin/env bash
+# Installs the library into a scratch folder, and does there what the documentation tells users to do:
+# the C programs and the plug-ins of its pages are built outside of this tree and run.
+# Usage: install.sh BUILD-FOLDER CC CXX
+set -euo pipefail
+build=$1
+export CC=$2 CXX=$3 CFLAGS='-Wall -Wextra -Wpedantic -Werror' CMAKE_GENERATOR=Ninja
+export CXXFLAGS=$CFLAGS
+
+scratch=$(mktemp -d)
+trap 'rm -rf "$scratch"' EXIT
+cd "$scratch"
+
+# expect PATTERN COMMAND...: what the command prints must match.
+expect() {
+    local printed
+    printed=$("${@:2}" 2>&1) || printed+=" (exit code $?)"
+    # shellcheck disable=SC2053 # it is a pattern
+    if [[ $printed != $1 ]]; then
+        printf '%s\nprinted: %s\nexpected: %s\n' "${*:2}" "$printed" "$1"
+        exit 1
+    fi
+}
+
+# pieces LANGUAGE PAGE [NUMBER]: all pieces of a page in a language, or one of them.
+pieces() {
+    awk -v start="\`\`\`$1" -v wanted="${3:-0}" '
+        $0 == start { code = 1; ++number; next }
+        $0 == "```" { code = 0 }
+        code && (wanted == 0 || wanted == number)' "$docs/$2"
+}
+
+echo "== the installation, moved after it was made"
+cmake --install "$build" --prefix "$scratch/made" >log
+mv made installed
+docs=$scratch/installed/share/doc/brenixcoder
+pkgconfig=(pkg-config "--with-path=$(dirname "$(find "$scratch/installed" -name brenixcoder.pc)")")
+read -ra flags < <("${pkgconfig[@]}" --cflags --libs brenixcoder)
+flags+=("-Wl,-rpath,$("${pkgconfig[@]}" --variable=libdir brenixcoder)" -lm)
+
+echo "== the programs of the pages with pkg-config, as C and as C++"
+read -ra warnings <<<"$CFLAGS"
+mkdir programs
+pieces c README.md >programs/first.c
+pieces c docs/generated-code.md >programs/generated.c
+cp "$docs"/examples/* programs
+for language in c:99 c++:17; do
+    for program in first generated; do
+        "$CC" -x "${language%:*}" "-std=${language/:/}" "${warnings[@]}" programs/$program.c -x none \
+            "${flags[@]}" -o $program
+    done
+    expect '1.5 2.5 3.5' env -i ./first
+    expect 'tone.wav: 48000 samples at 48000 Hz' env -i ./generated
+done
+for example in levels echo stream; do
+    "$CC" "${warnings[@]}" programs/$example.c "${flags[@]}" -o $example
+done
+expect '*char *: the same' env -i ./echo
+expect '1.000 s, 48000 Hz*Overall *1.000000 *0.707*' env -i ./levels tone.wav
+
+echo "== with CMake, as C and as C++"
+cp programs/first.c programs/first.cpp
+cat >programs/CMakeLists.txt <<'END'
+cmake_minimum_required(VERSION 3.25)
+project(programs LANGUAGES C CXX)
+find_package(brenixcoder 1.0 REQUIRED)
+foreach(language c cpp)
+    add_executable(${language} first.${language})
+    target_link_libraries(${language} PRIVATE brenixcoder::brenixcoder)
+endforeach()
+END
+export CMAKE_PREFIX_PATH=$scratch/installed
+cmake -S programs -B programs/build >>log
+cmake --build programs/build >>log
+expect '1.5 2.5 3.5' env -i programs/build/c
+expect '1.5 2.5 3.5' env -i programs/build/cpp
+
+echo "== the guide for plug-in authors"
+cp -r "$docs/plugins/template" plugins
+cd plugins
+pieces cpp docs/plugin-authors.md >numbers.cpp
+pieces c docs/plugin-authors.md >show.c
+expect '*0 1 2 3 4 5 5 5 ' bash -e <(pieces sh docs/plugin-authors.md 1)
+pieces cmake docs/plugin-authors.md >>CMakeLists.txt
+expect '*
+1.5 2.5 3.5
+brenix:InputStream:synchronousInputNotPossible: 
+device: brenix:Device:failed: broken.txt: no number after 1 lines.
+brenix:Channel:unexpectedException: Option FileName: must be given.' \
+    bash -e <(pieces sh docs/plugin-authors.md 2)
+cd ..
+
+echo "== the Debian package has the same files, and says what it needs"
+cpack --config "$build/CPackConfig.cmake" -B deb >>log 2>&1
+dpkg-deb --extract deb/*.deb deb/root
+diff <(cd installed && find . ! -type d | sort) <(cd deb/root/usr && find . ! -type d | sort)
+expect '*libc6 (>= *libsndfile1 (>= *libstdc++6 (>= *' dpkg-deb --field deb/*.deb Depends
