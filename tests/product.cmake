@@ -8,11 +8,17 @@ add_executable(product-tests
     ValuesTest.cpp
     scripted/ScriptedCore.cpp
     $<TARGET_OBJECTS:brenixcoder-objects>)
-target_include_directories(product-tests PRIVATE
-    ${PROJECT_SOURCE_DIR}
-    ${PROJECT_SOURCE_DIR}/include
-    ${PROJECT_SOURCE_DIR}/core/include
-    ${CMAKE_CURRENT_LIST_DIR})
-target_link_libraries(product-tests PRIVATE GTest::gtest_main Threads::Threads)
-brenix_warnings(product-tests)
-gtest_discover_tests(product-tests)
+add_executable(random-tests
+    RandomTest.cpp
+    scripted/ScriptedCore.cpp
+    $<TARGET_OBJECTS:brenixcoder-objects>)
+foreach(program product-tests random-tests)
+    target_include_directories(${program} PRIVATE
+        ${PROJECT_SOURCE_DIR}
+        ${PROJECT_SOURCE_DIR}/include
+        ${PROJECT_SOURCE_DIR}/core/include
+        ${CMAKE_CURRENT_LIST_DIR})
+    target_link_libraries(${program} PRIVATE GTest::gtest_main Threads::Threads)
+    brenix_warnings(${program})
+    gtest_discover_tests(${program})
+endforeach()

@@ -90,6 +90,12 @@ private:
     std::string bytes;
 };
 
+/// The bytes of a list of elements, as a buffer should hold them.
+inline std::string bytesOf(const auto* data, std::size_t count)
+{
+    return {reinterpret_cast<const char*>(data), count * sizeof *data};
+}
+
 /// Property objects that were made and not yet released.
 inline std::atomic<int> liveProperties = 0;
 
@@ -172,12 +178,6 @@ protected:
     static IPropertyInfo* scalar(const std::string& name, auto value)
     {
         return new Counted<TScalarProperty<decltype(value)>>(name, value);
-    }
-
-    /// The bytes of a list of elements, as a buffer should hold them.
-    static std::string bytesOf(const auto* data, std::size_t count)
-    {
-        return {reinterpret_cast<const char*>(data), count * sizeof *data};
     }
 
     void* create(double in = 1, double out = 2, const char* device = "d",
