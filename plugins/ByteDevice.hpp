@@ -253,6 +253,9 @@ private:
         if (!receiving && !waiting && !inputEnded) {
             receive();
         }
+        if (device.sends && (failure || (inputEnded && !waiting))) {
+            streams.endOutput(); // before the last look at it
+        }
         if (device.sends && !failure && !outputEnded) {
             sendNext();
         }
@@ -440,7 +443,7 @@ private:
         if (inputEnded) {
             reportHeld("the data from " + device.peer);
         }
-        if (failure && !closing) {
+        if (failure && (!closing || lost == 0)) {
             throw std::runtime_error("Transfer with " + device.peer +
                                      " failed: " + failure.message() + ".");
         }

@@ -61,8 +61,14 @@ int containerOf(const std::string& fileName)
     std::string ending = fileName.substr(dot + 1);
     std::transform(ending.begin(), ending.end(), ending.begin(),
                    [](unsigned char letter) { return static_cast<char>(std::tolower(letter)); });
-    if (ending == "ogg" || ending == "aif") { // libsndfile lists one ending for each format
-        ending = ending == "ogg" ? "oga" : "aiff";
+    // libsndfile lists one ending for each format.
+    constexpr std::string_view others[][2] = {{"ogg", "oga"},   {"opus", "oga"}, {"aif", "aiff"},
+                                              {"aifc", "aiff"}, {"snd", "au"},   {"mp3", "m1a"},
+                                              {"mp2", "m1a"}};
+    for (const auto& [other, listed] : others) {
+        if (ending == other) {
+            ending = listed;
+        }
     }
     int formats = 0;
     sf_command(nullptr, SFC_GET_FORMAT_MAJOR_COUNT, &formats, sizeof formats);

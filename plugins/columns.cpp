@@ -42,6 +42,11 @@ struct Deinterleave {
     template <typename Other>
     void operator()(const Other& /*several*/)
     {
+        refuse();
+    }
+
+    [[noreturn]] static void refuse()
+    {
         throw std::invalid_argument("Field data is not an array of numbers.");
     }
 };
@@ -53,7 +58,7 @@ public:
     {
         const auto data = takeField(packet, dataField);
         if (data && !visitNumbers(data.get(), Deinterleave{packet})) {
-            throw std::invalid_argument("Field data is not an array of numbers.");
+            Deinterleave::refuse();
         }
     }
 

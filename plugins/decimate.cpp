@@ -17,11 +17,9 @@ using brenixplugin::kit::coderconverter::TPointerProperty;
 class Decimate : public Filter
 {
 public:
-    void tune(const brenixplugin::PropertyMap& optionMap) override
+    void tune(Options& options) override
     {
-        Options options(optionMap);
         const auto newFactor = options.wholeNumber("Factor", 1, 1L << 53);
-        options.requireAllKnown();
         if (newFactor) {
             factor = static_cast<std::uint64_t>(*newFactor);
             skip = 0;

@@ -40,12 +40,10 @@ T nearest(double value)
 class Scale : public Filter
 {
 public:
-    void tune(const brenixplugin::PropertyMap& optionMap) override
+    void tune(Options& options) override
     {
-        Options options(optionMap);
         const double newGain = options.number("Gain").value_or(gain);
         const double newOffset = options.number("Offset").value_or(offset);
-        options.requireAllKnown();
         gain = newGain;
         offset = newOffset;
     }

@@ -95,8 +95,10 @@ public:
             const long count = frames == 0 ? blockSize : std::min(blockSize, frames - first);
             if (realTime) {
                 // A block is there when its last frame is.
-                const std::chrono::duration<double> due(static_cast<double>(first + count) /
-                                                        sampleRate);
+                constexpr double longest =
+                    1e9; // what comes later than a clock can tell never comes
+                const std::chrono::duration<double> due(
+                    std::min(static_cast<double>(first + count) / sampleRate, longest));
                 std::unique_lock lock(mutex);
                 changed.wait_until(
                     lock,

@@ -151,7 +151,7 @@ TEST(StateTest, FailuresAndErrorsOfEachOperationReachTheCaller)
             EXPECT_EQ(channel.error(), error);
             EXPECT_EQ(channel.error(coderChannelGetLastSyncError),
                       raises ? "probe:raised|" + last : "|");
-            coderChannelClose(channel.handle); // if it is open
+            coderChannelClose(channel.handle);     // if it is open
             EXPECT_EQ(initProbe(channel, "i"), 1); // and all is well again
         }
     }
@@ -367,7 +367,7 @@ TEST(ConversionTest, SpoiltPacketsGoNoFurther)
                                                  CODER_BUFFER(1, numbers),
                                                  CODER_BUFFER(1, numbers + 1)),
               0);
-    EXPECT_EQ(filtered.error(), noOutput);
+    EXPECT_EQ(filtered.error(), noOutputConversion);
     ASSERT_EQ(coderStreamAddFilter(filtered.input, filter.c_str(), 0), 1);
     EXPECT_EQ(filtered.write({1}), 1);
     ASSERT_EQ(filtered.open(), 1);
@@ -448,6 +448,29 @@ TEST(FilterTest, ScaleAndDecimate)
     ASSERT_EQ(coderInputStreamReadBuffers(channel.input, 2, 1), 1); // 70 and -70
     ASSERT_EQ(coderInputStreamReadBufferData(channel.input, 1, 0, "", "int8", 3, back), 1);
     EXPECT_EQ(std::vector<int>(back, back + 3), (std::vector<int>{-128, 127, 0}));
+}
+
+TEST(FilterTest, DifferentOnesTogether)
+{
+    Channel channel("loopback", infinity, 2);
+    ASSERT_EQ(channel.init(0), 1);
+    const int factor = 3;
+    const double gain = 10;
+    ASSERT_EQ(coderStreamAddFilter(channel.output, "decimate", 1,
+                                   CODER_OPTION("Factor", "int32", 1, &factor)),
+              1);
+    ASSERT_EQ(coderStreamAddFilter(channel.output, "scale", 0), 1);
+    ASSERT_EQ(coderStreamTuneFilters(channel.output, 1, CODER_OPTION("Gain", "double", 1, &gain)),
+              1)
+        << channel.error();
+    EXPECT_EQ(coderStreamTuneFilters(channel.output, 1, CODER_OPTION("Gian", "double", 1, &gain)),
+              0);
+    EXPECT_EQ(channel.error(), unexpected + "Option Gian: is not known.");
+    EXPECT_EQ(channel.write({0, 1}), 2);
+    EXPECT_EQ(channel.write({2, 3}), 0); // has room for one; the filters have not seen it
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(channel.write({2, 3}), 2);
+    EXPECT_EQ(channel.read(2, 2), (Numbers{0, 30}));
 }
 
 TEST(SignalTest, WaveformsChannelsAndCommands)

@@ -14,6 +14,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
+#include <tuple>
 
 using namespace driver;
 
@@ -160,6 +161,63 @@ TEST(TcpTest, ClosingSendsWhatIsLeft)
     ASSERT_EQ(writeBytes(channel, data), 1);
     EXPECT_EQ(coderChannelClose(channel.handle), 1);
     Channel::waitUntil([&] { return readFile() == data; });
+}
+
+TEST(TcpTest, NothingIsLostUnseenWhenThePeerEnds)
+{
+    Acceptor acceptor(context, any);
+    for (int round = 0; round < 40; ++round) {
+        Channel channel("tcp");
+        ASSERT_EQ(init(channel, "uint8", acceptor.local_endpoint().port()), 1);
+        ASSERT_EQ(channel.open(), 1);
+        auto socket = acceptor.accept();
+        socket.shutdown(socket.shutdown_send);
+        std::size_t accepted = 0;
+        while (writeBytes(channel, "x") == 1) { // until the device is done
+            ++accepted;
+        }
+        EXPECT_EQ(coderChannelClose(channel.handle), 1);
+        std::string got;
+        asio::error_code end;
+        asio::read(socket, asio::dynamic_buffer(got), end);
+        ASSERT_EQ(got.size(), accepted);
+    }
+}
+
+TEST(TcpTest, AResetEndsEveryWait)
+{
+    Acceptor acceptor(context, any);
+    for (const bool closes : {false, true}) {
+        Channel channel("tcp", 10);
+        ASSERT_EQ(init(channel, "uint8", acceptor.local_endpoint().port()), 1);
+        ASSERT_EQ(channel.open(infinity), 1);
+        auto socket = acceptor.accept();
+        asio::write(socket, asio::buffer(std::string(200, 'x'))); // fills the input
+        std::thread reset([&] {
+            std::this_thread::sleep_for(std::chrono::milliseconds(300));
+            socket.set_option(asio::socket_base::linger(true, 0));
+            socket.close();
+        });
+        if (closes) {
+            EXPECT_EQ(writeBytes(channel, "x"), 1);
+            EXPECT_EQ(coderChannelClose(channel.handle), 1);
+        } else {
+            while (writeBytes(channel, std::string(1 << 20, 'x')) == 1) {
+            }
+            EXPECT_EQ(channel.error(), "brenix:OutputStream:synchronousOutputNotPossible|");
+            std::ignore = coderStreamFlush(channel.input); // the device waits for room no longer
+        }
+        reset.join();
+        EXPECT_NE(channel.asyncError().find(": Connection reset by peer"), npos);
+    }
+}
+
+TEST(TcpTest, TheExampleStreams)
+{
+    const Program echo(server + "EXEC:cat");
+    const std::string run = EXAMPLE_STREAM " 127.0.0.1 " + std::to_string(port) + " >" + file;
+    Channel::waitUntil([&] { return std::system((run + " 2>/dev/null").c_str()) == 0; });
+    EXPECT_NE(readFile().find("all came back"), npos);
 }
 
 TEST(TcpTest, PeersThatDoNotAnswer)

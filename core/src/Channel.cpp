@@ -96,6 +96,7 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost, plugin::Dev
     bool tryPush(plugin::Packet& packet) override;
     std::optional<plugin::Packet> tryPull() override;
     bool isClosing() const override;
+    void endOutput() override;
 
     bool enter(plugin::Packet& packet, bool waits);
     std::optional<plugin::Packet> leave(bool waits);
@@ -209,6 +210,13 @@ std::optional<plugin::Packet> Channel::Impl::leave(bool waits)
 bool Channel::Impl::isClosing() const
 {
     return closing;
+}
+
+void Channel::Impl::endOutput()
+{
+    if (output) {
+        output->impl->setDeviceDone();
+    }
 }
 
 // --- The device's life ---

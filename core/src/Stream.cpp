@@ -3,6 +3,7 @@
 #include "Packets.hpp"
 
 #include <algorithm>
+#include <iterator>
 #include <new>
 #include <stdexcept>
 #include <string>
@@ -105,10 +106,12 @@ std::optional<plugin::Packet> Stream::Impl::pull(bool waits)
     return packet;
 }
 
-void Stream::Impl::notifyDevice()
+void Stream::Impl::notifyDevice(std::unique_lock<std::mutex>& lock)
 {
     changed.notify_all();
-    if (phase != Phase::Closed) {
+    const bool isThere = phase != Phase::Closed;
+    lock.unlock();
+    if (isThere) {
         device.wake();
     }
 }
@@ -160,7 +163,8 @@ Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
     }
     wanted = count;
     refill();
-    notifyDevice();
+    notifyDevice(lock);
+    lock.lock();
     wait(lock, [&] { return counts >= count; });
     wanted = 0;
     if (counts < count) {
@@ -168,7 +172,7 @@ Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
     }
     Packets taken = take(count);
     refill();
-    notifyDevice();
+    notifyDevice(lock);
     return taken;
 }
 
@@ -190,17 +194,21 @@ void Stream::Impl::addFilter(const std::string& name, const PropertyMap& options
     auto loaded = loadPlugin<plugin::Filter, CouldNotLoadFilter, CouldNotCreateFilter>(
         name, "brenixcoreCreateFilter");
     libraries.push_back(std::move(loaded.library));
-    loaded.object->tune(options);
+    plugin::Options given(options);
+    loaded.object->tune(given);
+    given.requireAllKnown();
     const std::lock_guard lock(filterMutex);
     filters.push_back(std::move(loaded.object));
 }
 
 void Stream::Impl::tuneFilters(const PropertyMap& options)
 {
+    plugin::Options given(options);
     const std::lock_guard lock(filterMutex);
     for (const auto& filter : filters) {
-        filter->tune(options);
+        filter->tune(given);
     }
+    given.requireAllKnown(); // to one of them
 }
 
 void Stream::Impl::applyFilters(plugin::Packet& packet)
@@ -251,11 +259,11 @@ void Stream::tuneFilters(const PropertyMap& options)
 void Stream::flush()
 {
     Impl::Packets discarded;
-    const std::lock_guard lock(impl->mutex);
+    std::unique_lock lock(impl->mutex);
     discarded.splice(discarded.end(), impl->packets);
     discarded.splice(discarded.end(), impl->pending);
     impl->counts = 0;
-    impl->notifyDevice();
+    impl->notifyDevice(lock);
 }
 
 bool Stream::isOpen() const
@@ -379,41 +387,58 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
     Impl& stream = *impl;
     Impl::Packets outgoing;
     std::uint64_t written = 0; // counts as the caller wrote them
-    std::uint64_t size = 0;    // counts as they leave the converter and the filters
     for (const void* buffer : dataList) {
         plugin::Packet packet = copyFields(*static_cast<const PropertyMap*>(buffer));
-        written += packet.counts;
         try {
             stream.convert(packet, &plugin::Converter::convertOutput);
-            stream.applyFilters(packet);
         } catch (...) {
             throw CouldNotConvertOutputData(currentExceptionText());
         }
-        if (packet.counts > stream.limit - size) {
-            throw SynchronousOutputNotPossible("Cannot write more counts than the limit of " +
-                                               std::to_string(stream.limit) + ".");
-        }
-        size += packet.counts;
-        if (packet.counts > 0) {
-            outgoing.push_back({std::move(packet)});
-        }
+        written += packet.counts;
+        outgoing.push_back({std::move(packet)});
     }
 
-    std::unique_lock lock(stream.mutex);
     const auto refuse = [&](const std::string& why) {
-        throw SynchronousOutputNotPossible("Cannot write " + std::to_string(size) +
+        throw SynchronousOutputNotPossible("Cannot write " + std::to_string(written) +
                                            " counts: " + why + ".");
     };
-    stream.wait(lock, [&] { return stream.fits(size); });
-    if (!stream.fits(size)) {
-        refuse(std::string("there is no room and ") + stream.reason());
+    const auto requirePossible = [&](std::uint64_t counts) {
+        if (!stream.fits(counts)) {
+            refuse(std::string("there is no room and ") + stream.reason());
+        }
+        if (counts > 0 && stream.phase == Phase::Open && stream.deviceDone) {
+            refuse("the device is done");
+        }
+    };
+    std::unique_lock lock(stream.mutex);
+    if (written > stream.limit) {
+        refuse("the limit is " + std::to_string(stream.limit));
     }
-    if (size > 0 && stream.phase == Phase::Open && stream.deviceDone) {
-        refuse("the device is done");
+    stream.wait(lock, [&] { return stream.fits(written); });
+    requirePossible(written);
+
+    // Only now, so that a filter does not see twice what is refused and written again. Meanwhile nobody
+    // but this thread takes the room.
+    lock.unlock();
+    std::uint64_t filtered = 0;
+    for (auto queued = outgoing.begin(); queued != outgoing.end();) {
+        const plugin::Packet& packet = queued->packet;
+        try {
+            stream.applyFilters(queued->packet);
+            if (packet.counts > stream.limit - filtered) {
+                throw std::length_error("The filters made more counts than the limit.");
+            }
+        } catch (...) {
+            throw CouldNotConvertOutputData(currentExceptionText());
+        }
+        filtered += packet.counts;
+        queued = packet.counts > 0 ? std::next(queued) : outgoing.erase(queued);
     }
+    lock.lock();
+    requirePossible(filtered);
     stream.packets.splice(stream.packets.end(), outgoing);
-    stream.counts += size;
-    stream.notifyDevice();
+    stream.counts += filtered;
+    stream.notifyDevice(lock);
     return written;
 }
 

@@ -100,8 +100,8 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     /// Moves from `pending` to `packets` what has room. Under the mutex.
     void refill();
 
-    /// Tells both sides of a change that the caller's made. Under the mutex.
-    void notifyDevice();
+    /// Tells both sides of a change that the caller's made. Unlocks the mutex.
+    void notifyDevice(std::unique_lock<std::mutex>& lock);
 
     /// Takes the `count` oldest counts: waits for them, or throws SynchronousInputNotPossible.
     Packets takeInTime(std::uint64_t count);
@@ -124,7 +124,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     std::mutex filterMutex; ///< guards the filters
     std::vector<std::unique_ptr<plugin::Filter>> filters;
 
-    mutable std::mutex mutex; ///< guards what follows
+    std::mutex mutex; ///< guards what follows
     std::condition_variable changed;
     Phase phase = Phase::Closed;
     bool deviceDone = false;

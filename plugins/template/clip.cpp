@@ -15,11 +15,9 @@ using namespace brenixcore::plugin;
 class Clip : public Filter
 {
 public:
-    void tune(const brenixplugin::PropertyMap& optionMap) override
+    void tune(Options& options) override
     {
-        Options options(optionMap);
         const double value = options.number("Highest").value_or(highest);
-        options.requireAllKnown();
         highest = value;
     }
 

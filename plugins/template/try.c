@@ -8,6 +8,8 @@ static int fail(void* channel)
     char message[CODER_ERROR_SIZE] = "";
     (void)coderChannelGetLastError(channel, id, message);
     fprintf(stderr, "%s: %s\n", id, message);
+    coderChannelClose(channel); /* these two do nothing if there is nothing to do */
+    coderChannelTerm(channel);
     coderChannelDestroy(channel);
     return 1;
 }

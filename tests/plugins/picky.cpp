@@ -53,11 +53,9 @@ public:
 class PickyFilter : public Filter
 {
 public:
-    void tune(const brenixplugin::PropertyMap& optionMap) override
+    void tune(Options& options) override
     {
-        Options options(optionMap);
         factor = options.number("Factor").value_or(factor);
-        options.requireAllKnown();
     }
 
     void apply(Packet& packet) override

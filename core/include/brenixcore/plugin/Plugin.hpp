@@ -11,6 +11,7 @@
 #ifndef BRENIXCORE_PLUGIN_PLUGIN_HPP
 #define BRENIXCORE_PLUGIN_PLUGIN_HPP
 
+#include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Packet.hpp"
 #include "brenixplugin/Property.hpp"
 
@@ -69,6 +70,10 @@ public:
     /// Whether the channel is closing: run() must return once tryPull() returns nothing.
     virtual bool isClosing() const = 0;
 
+    /// Says that the device takes no more output than what is queued, while it may go on with its
+    /// input: further writes are refused, and one that waits ends.
+    virtual void endOutput() = 0;
+
 protected:
     ~DeviceStreams() = default;
 };
@@ -114,10 +119,11 @@ public:
         throw std::invalid_argument("Unknown command: " + command);
     }
 
-    /// After run() has returned.
+    /// After run() has returned. Not called when open() has thrown.
     virtual void close() {}
 
-    /// Releases what init() prepared; may be followed by another init().
+    /// Releases what init() prepared; may be followed by another init(). Not called when init() has
+    /// thrown.
     virtual void term() {}
 };
 
@@ -142,12 +148,12 @@ class BRENIXCORE_PLUGIN_SHARED Filter
 public:
     virtual ~Filter() = default;
 
-    /// Called with the options that the filter is added with, and again whenever it is tuned.
-    virtual void tune(const brenixplugin::PropertyMap& options) = 0;
+    /// Called with the options that the filter is added with, and again whenever it is tuned. An option
+    /// that no filter of the stream asks for is refused.
+    virtual void tune(Options& options) = 0;
 
     /// May change fields, within the classes of Visit.hpp, and counts; a packet that is left without
-    /// counts is dropped. A write that then finds no room is refused, though its packets came this far;
-    /// the caller may write them again.
+    /// counts is dropped.
     virtual void apply(Packet& packet) = 0;
 };
 
