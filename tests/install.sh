@@ -34,7 +34,8 @@ echo "== the installation, moved after it was made"
 cmake --install "$build" --prefix "$scratch/made" >log
 mv made installed
 docs=$scratch/installed/share/doc/brenixcoder
-pkgconfig=(pkg-config "--with-path=$(dirname "$(find "$scratch/installed" -name brenixcoder.pc)")")
+folder=$(dirname "$(find "$scratch/installed" -name brenixcoder.pc)")
+pkgconfig=(env "PKG_CONFIG_PATH=$folder" pkg-config) # before the system's folders
 read -ra flags < <("${pkgconfig[@]}" --cflags --libs brenixcoder)
 flags+=("-Wl,-rpath,$("${pkgconfig[@]}" --variable=libdir brenixcoder)" -lm)
 
