@@ -59,7 +59,7 @@ static void* createChannel(const char* device, const char* converter, double inp
 
 /*
  * Closes and terminates a channel, if there is one, as far as it was opened and initialised, and
- * destroys it. Returns 0, after printing why, if one of the steps fails.
+ * destroys it. Returns 0, after printing why, if one of the steps or the device fails.
  */
 static int finishChannel(void* channel)
 {
@@ -74,6 +74,7 @@ static int finishChannel(void* channel)
     if (open && !check(channel, "coderChannelClose", coderChannelClose(channel))) {
         ok = 0;
     }
+    ok = checkDevice(channel) && ok;
     if (initialised && !check(channel, "coderChannelTerm", coderChannelTerm(channel))) {
         ok = 0;
     }

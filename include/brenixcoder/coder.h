@@ -145,8 +145,9 @@ extern "C" {
  * @param secondLimit   the same for the output stream
  * @return a channel handle, to be released with coderChannelDestroy(); NULL on failure
  *
- * Errors, in the two buffers: the four load and create failures with an empty message;
- * brenix:Channel:unexpectedException for anything else, such as a null path.
+ * Errors, in the two buffers: the four load and create failures with an empty message, whose reason
+ * `brenix check PLUGIN` finds; brenix:Channel:unexpectedException for anything else, such as a null
+ * path.
  */
 CODER_API void* coderChannelCreate(const char* devicePath, const char* converterPath, char* errorId,
                                    char* errorMessage, double firstLimit,

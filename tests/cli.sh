@@ -1,0 +1,122 @@
+#!/usr/bin/env bash
+# Runs brenix: a table of commands with their exit codes and output, the plug-ins' tables against their
+# documentation, and the C programs that it writes against what it did itself.
+# Usage: cli.sh SOURCE-FOLDER BUILD-FOLDER CC
+set -euo pipefail
+source=$1 build=$2 cc=$3 plugins=$2/tests/plugins
+export PATH=$build/bin:$PATH
+scratch=$(mktemp -d)
+trap 'rm -rf "$scratch"' EXIT
+cd "$scratch"
+failures=0
+
+fail() {
+    echo "FAILED: $1" >&2
+    failures=$((failures + 1))
+}
+
+# Things to check: no shared library, one that needs another that is gone, and one that is no plug-in.
+echo text >text.so
+echo 'int gone(void) { return 0; }' | "$cc" -shared -fPIC -x c - -o libgone.so
+echo 'int gone(void); int f(void) { return gone(); }' |
+    "$cc" -shared -fPIC -x c - -o needs.so -L. -lgone
+rm libgone.so
+echo 'int f(void) { return 0; }' | "$cc" -shared -fPIC -x c - -o other.so
+printf 'left,right\n1,-2\n3,-4\n' >samples.csv
+printf '1,2\n3\n' >uneven.csv
+printf '1\nx\n' >letters.csv
+
+# exit code | text in the output | arguments
+while IFS='|' read -r code text arguments; do
+    eval "set -- $arguments"
+    got=0
+    timeout 20 brenix "$@" >out 2>&1 </dev/null || got=$?
+    if [[ $got -ne $code ]] || ! grep -qF -- "$text" out; then
+        fail "brenix $arguments: exit code $got, wanted $code with: $text"
+        cat out >&2
+    fi
+done <<END
+0|signal: a device that loads|check signal
+1|notFound: $build/lib/brenix-plugins/none.so: No such file|check none
+1|wrongFileType: ./text.so|check ./text.so
+1|missingDependency: it needs a library that does not load: libgone.so: cannot open|check ./needs.so
+1|notAPlugin|check ./other.so
+1|abiVersion: it has plug-in ABI version 999, needed is 1|check $plugins/otherAbiVersion.so
+1|noFactory|check $plugins/noFactory.so
+1|factoryFailed: thrown by the factory|check $plugins/throwingFactory.so
+1|factoryFailed: the factory returned nothing|check $plugins/nullFactory.so
+1|notLoadable: $plugins/throwingStatic.so: thrown by a static object|check $plugins/throwingStatic.so
+1|"problem": "abiVersion"|check --json signal $plugins/otherAbiVersion.so
+0|does not describe its options|plugins $plugins/probe.so
+1|couldNotLoadDevice: $build/lib/brenix-plugins/none.so: No such file|info none
+1|couldNotLoadFilter: it needs a library|info signal -f ./needs.so
+1|{"error":{"id":"brenix:Channel:unexpectedException","message":"Option Foo: is not known."}}|info signal -o Foo=1 --json
+2|not a value of type int8: 300|info signal -o Foo:int8=300
+2|an option is Name=value|info signal -o Foo
+2|at most 16 options|info signal $(printf -- '-o Foo=1 %.0s' {1..17})
+0|Frequency: 1000 Hz|info signal -o Frequency:int32=1000 -o Waveform:char=sine -o Pace=fast -o Channels=1
+1|Custom property: Foo not found|info signal -p Foo:double
+2|--nonsense|info signal --nonsense
+0|wrote 2 counts|write loopback -i samples.csv -t int16
+1|uneven.csv: line 2: 1 values instead of 2|write loopback -i uneven.csv
+1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
+1|notSupported|write signal -i samples.csv
+1|the data has no field Foo|read signal -n 1 --field Foo
+0|RMS 0.7071|scope signal -o Pace=fast -n 4800 --png picture.png
+END
+file picture.png | grep -q 'PNG image data' || fail "picture.png is no picture"
+
+# What an interrupted read has read is complete.
+got=0
+timeout -s INT 1 brenix read signal -w part.raw 2>summary || got=$?
+[[ -s part.raw && $(stat -c %s part.raw) -eq $(($(awk '{ print $2 * 8 }' summary))) ]] ||
+    fail "an interrupted read: $(cat summary)"
+
+# Documented options and properties are those that the plug-ins describe.
+brenix plugins --json | jq -r '.plugins[] | .name as $p | (.options + .properties)[] |
+    [$p, .name, .type, .unit, (.default // "-"), .meaning] | join("|")' | sort >described
+awk -F'|' '/^## / { gsub("`", "", $0); n = split($0, words, " "); plugin = words[n] }
+    /^\| `/ && plugin != "" {
+        for (i = 2; i < NF; i++) { gsub(/[`"]/, "", $i); gsub(/^ +| +$/, "", $i) }
+        if (NF == 7) print plugin "|" $2 "|" $3 "|" $4 "|" $5 "|" $6
+        else if (NF == 6) print plugin "|" $2 "|" $3 "|" $4 "|-|" $5
+    }' "$source/docs/plugins.md" | sort >documented
+[[ $(wc -l <documented) -gt 30 ]] || fail "no tables found in plugins.md"
+diff described documented >&2 || fail "plug-ins and plugins.md differ"
+
+# Emitted programs: each does the same again. The result is a file, or what is printed.
+emitted() { # FILE-OF-RESULT ARGUMENTS...
+    local result=$1
+    shift
+    rm -f "$result" program
+    timeout 20 brenix "$@" --emit-c program.c >stdout
+    if [[ -e $result ]]; then mv "$result" first; else mv stdout first; fi
+    "$cc" -std=c99 -Wall -Wextra -Wpedantic -Werror "-I$source/include" program.c -o program \
+        "-L$build/lib" -lbrenixcoder -lsndfile -lm "-Wl,-rpath,$build/lib"
+    timeout 20 ./program >stdout || fail "the program fails"
+    if [[ -e $result ]]; then cp "$result" second; else mv stdout second; fi
+    if [[ ! -s first ]] || ! cmp first second; then
+        fail "the program of: brenix $*"
+    fi
+}
+signal=(signal -o Pace=fast -o Channels=2)
+emitted - info "${signal[@]}" --open -p Channels:uint32
+emitted samples.raw read "${signal[@]}" -o Frames=10000 -w samples.raw
+emitted - read "${signal[@]}" -q -s 0.1 -c columns -f 'scale Gain:float=0.1 Offset=100' -n 1000
+emitted a.wav read "${signal[@]}" -c columns -n 5000 -w a.wav
+emitted b.au write audiofile -o FileName=b.au -o Mode=write -o Channels=2 -o SampleFormat=DOUBLE -i a.wav
+emitted c.wav write audiofile -o FileName=c.wav -o Mode=write -o Channels=2 -i samples.csv -f 'scale Gain=0.1'
+emitted d.wav write audiofile -o FileName=d.wav -o Mode=write -o Channels=2 --format raw -i samples.raw -n 3000
+
+# Samples arrive as they were: a file of each format, through pipes.
+brenix read "${signal[@]}" -n 3000 --format raw -q >samples.raw
+for format in csv raw wav; do
+    brenix read "${signal[@]}" -n 3000 --format "$format" -q >"one.$format"
+    rm -f copy.wav
+    brenix write audiofile -o FileName=copy.wav -o Mode=write -o SampleFormat=DOUBLE \
+        -o Channels=2 -q --format "$format" <"one.$format"
+    brenix read audiofile -o FileName=copy.wav --format raw -q | cmp - samples.raw ||
+         fail "$format through pipes"
+done
+
+exit $((failures > 0))

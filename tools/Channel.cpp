@@ -1,0 +1,313 @@
+#include "Channel.hpp"
+
+#include "brenixcoder/coder.h"
+#include "brenixcore/plugin/Inspect.hpp"
+
+#include <array>
+#include <cstring>
+#include <sstream>
+#include <tuple>
+#include <utility>
+
+namespace brenix
+{
+
+namespace
+{
+
+/// Calls a function that ends with an option list. The list always has maxOptions options: what is
+/// behind the number that is told is not looked at.
+template <typename Call, std::size_t... I>
+int callWithOptions(const std::vector<Option>& options, const Call& call,
+                    std::index_sequence<I...> /*indexes*/)
+{
+    std::array<std::tuple<const char*, const char*, int, const void*>, maxOptions> list;
+    for (std::size_t i = 0; i < options.size(); ++i) {
+        list.at(i) = {options[i].name.c_str(), options[i].type->name, options[i].count,
+                      options[i].elements.data()};
+    }
+    return std::apply([&](auto... arguments) { return call(options.size(), arguments...); },
+                      std::tuple_cat(list[I]...));
+}
+
+template <typename Call>
+int callWithOptions(const std::vector<Option>& options, const Call& call)
+{
+    return callWithOptions(options, call, std::make_index_sequence<maxOptions>());
+}
+
+/// Adds to an error without a message why a plug-in did not load.
+Failure explained(const std::string& id, std::string message, const std::vector<std::string>& names)
+{
+    for (const std::string& name : names) {
+        if (message.empty()) {
+            message = brenixcore::plugin::inspectPlugin(name).message;
+        }
+    }
+    return {id, message};
+}
+
+} // namespace
+
+std::vector<Option> parseOptions(const std::vector<std::string>& texts)
+{
+    if (texts.size() > maxOptions) {
+        throw std::invalid_argument("at most " + std::to_string(maxOptions) +
+                                    " options are possible");
+    }
+    std::vector<Option> options;
+    for (const std::string& text : texts) {
+        options.push_back(parseOption(text));
+    }
+    return options;
+}
+
+FilterSettings parseFilter(const std::string& text)
+{
+    FilterSettings filter;
+    std::istringstream words(text);
+    words >> filter.name;
+    std::vector<std::string> options;
+    for (std::string word; words >> word;) {
+        options.push_back(word);
+    }
+    filter.options = parseOptions(options);
+    return filter;
+}
+
+Channel::Channel(const ChannelSettings& settings, bool filterOutput)
+{
+    const std::vector<Option> options = parseOptions(settings.options);
+    std::array<char, CODER_ERROR_SIZE> id{};
+    std::array<char, CODER_ERROR_SIZE> message{};
+    handle = coderChannelCreate(settings.device.c_str(), settings.converter.c_str(), id.data(),
+                                message.data(), settings.inputLimit, settings.outputLimit);
+    if (handle == nullptr) {
+        throw explained(id.data(), message.data(), {settings.converter, settings.device});
+    }
+    try {
+        check(callWithOptions(options,
+                              [&](auto... list) { return coderChannelInit(handle, list...); }));
+        initialised = true;
+        input = coderChannelGetInputStream(handle);
+        output = coderChannelGetOutputStream(handle);
+        for (const std::string& text : settings.filters) {
+            const FilterSettings filter = parseFilter(text);
+            const int added = callWithOptions(filter.options, [&](auto... list) {
+                return coderStreamAddFilter(filterOutput ? output : input, filter.name.c_str(),
+                                            list...);
+            });
+            if (added == 0) {
+                const auto [errorId, errorMessage] = lastError();
+                throw explained(errorId, errorMessage, {filter.name});
+            }
+        }
+    } catch (...) {
+        release();
+        throw;
+    }
+}
+
+Channel::~Channel()
+{
+    release();
+}
+
+void Channel::release() noexcept
+{
+    coderChannelClose(handle); // these two do nothing when there is nothing to do
+    coderChannelTerm(handle);
+    coderChannelDestroy(handle);
+}
+
+void Channel::open(const ChannelSettings& settings)
+{
+    check(callWithOptions(parseOptions(settings.openOptions),
+                          [&](auto... list) { return coderChannelOpen(handle, list...); }));
+}
+
+void Channel::finish()
+{
+    std::uint8_t isOpen = 0;
+    check(coderChannelIsOpen(handle, &isOpen));
+    if (isOpen != 0) {
+        check(coderChannelClose(handle));
+    }
+    checkDevice();
+    check(coderChannelTerm(handle));
+}
+
+std::pair<std::string, std::string> Channel::lastError() const
+{
+    std::array<char, CODER_ERROR_SIZE> id{};
+    std::array<char, CODER_ERROR_SIZE> message{};
+    coderChannelGetLastError(handle, id.data(), message.data());
+    if (id[0] == '\0') { // then a plug-in raised an error inside the call
+        coderChannelGetLastSyncError(handle, id.data(), message.data());
+    }
+    return {id.data(), message.data()};
+}
+
+void Channel::check(int result)
+{
+    if (result == 0) {
+        const auto [id, message] = lastError();
+        throw Failure(id, message);
+    }
+}
+
+std::optional<Failure> Channel::deviceError()
+{
+    std::uint8_t hasError = 0;
+    check(coderChannelHasAsyncError(handle, &hasError));
+    if (hasError == 0) {
+        return std::nullopt;
+    }
+    std::array<char, CODER_ERROR_SIZE> id{};
+    std::array<char, CODER_ERROR_SIZE> message{};
+    coderChannelGetLastAsyncError(handle, id.data(), message.data());
+    return Failure(id.data(), message.data());
+}
+
+void Channel::checkDevice()
+{
+    if (const auto error = deviceError()) {
+        throw Failure(*error);
+    }
+}
+
+bool Channel::isSupported(void* stream)
+{
+    std::uint8_t supported = 0;
+    check(coderStreamIsSupported(stream, &supported));
+    return supported != 0;
+}
+
+bool Channel::isDone(void* stream)
+{
+    std::uint8_t done = 0;
+    check(coderStreamIsDeviceDone(stream, &done));
+    return done != 0;
+}
+
+double Channel::nextBuffer(double most)
+{
+    double total = 0;
+    double counts = 0;
+    double buffers = 1;
+    check(coderInputStreamPeek(input, &total, &counts, &buffers, most));
+    if (buffers == 0) {
+        return 0;
+    }
+    check(coderInputStreamReadBuffers(input, counts, 1));
+    return counts;
+}
+
+/// Whether the last call failed because the value is of the type, but larger than the capacity.
+bool Channel::isTooSmall() const
+{
+    return lastError().second.rfind("Property value: ", 0) == 0;
+}
+
+/// Copies a value of which nobody tells how many elements it has: they are as many as the smallest
+/// capacity that is enough. Returns false when there is no value of the type.
+bool Channel::readAll(const ElementType& type, const Copy& copy, std::size_t guess, Bytes& elements)
+{
+    std::size_t enough = guess;
+    elements.resize(enough * type.size);
+    while (copy(enough, elements.data()) == 0) {
+        if (!isTooSmall()) {
+            return false;
+        }
+        enough *= 2;
+        elements.resize(enough * type.size);
+    }
+    std::size_t tooSmall = enough / 2;
+    if (enough == guess) { // mostly it is right
+        tooSmall = copy(guess - 1, elements.data()) == 0 ? guess - 1 : 0;
+    }
+    while (enough - tooSmall > 1) {
+        const std::size_t middle = tooSmall + (enough - tooSmall) / 2;
+        (copy(middle, elements.data()) == 0 ? tooSmall : enough) = middle;
+    }
+    elements.resize(enough * type.size);
+    return true;
+}
+
+std::optional<Bytes> Channel::property(const std::string& name, const ElementType& type)
+{
+    Bytes elements;
+    const auto copy = [&](std::size_t capacity, void* destination) {
+        return coderChannelGetPropertyValue(handle, name.c_str(), type.name,
+                                            static_cast<int>(capacity), destination);
+    };
+    return readAll(type, copy, 1, elements) ? std::optional(elements) : std::nullopt;
+}
+
+std::optional<double> Channel::number(const std::string& name, const char* type)
+{
+    const auto value = property(name, elementType(type));
+    return value ? std::optional(elementType(type).toDouble(value->data())) : std::nullopt;
+}
+
+Channel::Copy Channel::fieldCopier(const Field& field) const
+{
+    return [this, &field](std::size_t capacity, void* destination) {
+        return coderInputStreamReadBufferData(input, 1, 0, field.name.c_str(), field.type->name,
+                                              static_cast<int>(capacity), destination);
+    };
+}
+
+std::optional<Field> Channel::findField(const std::string& name, double counts)
+{
+    Field field;
+    field.name = name;
+    for (const ElementType& type : elementTypes()) {
+        field.type = &type;
+        if (readAll(type, fieldCopier(field), static_cast<std::size_t>(counts), field.elements)) {
+            field.perCount = field.elements.size() / type.size / static_cast<std::size_t>(counts);
+            return field;
+        }
+    }
+    return std::nullopt;
+}
+
+std::vector<Field> Channel::findFields(const std::vector<std::string>& names, double counts)
+{
+    std::vector<Field> fields;
+    const auto add = [&](const std::string& name) {
+        auto field = findField(name, counts);
+        if (field) {
+            fields.push_back(*std::move(field));
+        }
+        return field.has_value();
+    };
+    for (const std::string& name : names) {
+        if (!add(name)) {
+            throw Failure("", "the data has no field " + name);
+        }
+    }
+    if (names.empty()) {
+        while (add("Data" + std::to_string(fields.size() + 1))) {
+        }
+        if (fields.empty() && !add("data") && !add("")) {
+            throw Failure("", "the data has no field that can be read");
+        }
+    }
+    return fields;
+}
+
+void Channel::readField(Field& field, double counts)
+{
+    const auto rows = static_cast<std::size_t>(counts);
+    if (!readAll(*field.type, fieldCopier(field), rows * field.perCount, field.elements)) {
+        const auto [id, message] = lastError();
+        throw Failure(id, message);
+    }
+    if (field.type->isText || field.elements.size() != rows * field.perCount * field.type->size) {
+        throw Failure("",
+                      "field " + field.name + " has no fixed number of elements for each count");
+    }
+}
+
+} // namespace brenix

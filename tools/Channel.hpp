@@ -1,0 +1,120 @@
+// A channel as the commands use it: the functions of coder.h, with exceptions for errors.
+#ifndef BRENIX_TOOLS_CHANNEL_HPP
+#define BRENIX_TOOLS_CHANNEL_HPP
+
+#include "Values.hpp"
+
+#include <cstddef>
+#include <functional>
+#include <optional>
+#include <stdexcept>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace brenix
+{
+
+/// What an option list of a command line can have at most.
+constexpr std::size_t maxOptions = 16;
+
+/// A failed call of the library, an error of the device, or what else ends a command with exit code 1.
+class Failure : public std::runtime_error
+{
+public:
+    Failure(std::string errorId, const std::string& message)
+        : std::runtime_error(message), id(std::move(errorId))
+    {
+    }
+    const std::string& getId() const { return id; }
+
+private:
+    std::string id;
+};
+
+/// What the command line says of a channel.
+struct ChannelSettings {
+    std::string device;
+    std::string converter = "identity";
+    std::vector<std::string> options;     ///< of init, as parseOption() takes them
+    std::vector<std::string> openOptions; ///< of open
+    std::vector<std::string> filters;     ///< each a plug-in and its options, with spaces
+    double inputLimit = 65536;
+    double outputLimit = 65536;
+};
+
+struct FilterSettings {
+    std::string name;
+    std::vector<Option> options;
+};
+FilterSettings parseFilter(const std::string& text);
+std::vector<Option> parseOptions(const std::vector<std::string>& texts);
+
+/// One field of the buffers of an input stream.
+struct Field {
+    std::string name; ///< empty for the first field
+    const ElementType* type = nullptr;
+    std::size_t perCount = 0; ///< elements of each count
+    Bytes elements;           ///< of the buffer that was read last
+};
+
+class Channel
+{
+public:
+    /// Creates and initialises a channel. The filters go to its input or its output stream.
+    Channel(const ChannelSettings& settings, bool filterOutput);
+    Channel(const Channel&) = delete;
+    Channel& operator=(const Channel&) = delete;
+    ~Channel();
+
+    void open(const ChannelSettings& settings);
+
+    /// Closes, when it is open, and terminates. Errors of closing are thrown.
+    void finish();
+
+    /// Throws the error of a call that returned 0.
+    void check(int result);
+
+    /// The device's asynchronous error, if there is one.
+    std::optional<Failure> deviceError();
+    void checkDevice();
+
+    /// The value of a property; nothing when there is none of that name and type.
+    std::optional<Bytes> property(const std::string& name, const ElementType& type);
+    std::optional<double> number(const std::string& name, const char* type);
+
+    void* inputStream() const { return input; }
+    void* outputStream() const { return output; }
+    bool isSupported(void* stream);
+    bool isDone(void* stream);
+
+    /// Takes the next buffer, or as much of it as `most` counts, if one is there. Returns its counts.
+    double nextBuffer(double most);
+
+    /// The fields of the buffer that was taken: those of the names given, or else Data1, Data2..., or
+    /// else the first.
+    std::vector<Field> findFields(const std::vector<std::string>& names, double counts);
+
+    /// Copies out a field of the buffer that was taken.
+    void readField(Field& field, double counts);
+
+private:
+    void release() noexcept;
+
+    using Copy = std::function<int(std::size_t capacity, void* destination)>;
+
+    bool readAll(const ElementType& type, const Copy& copy, std::size_t guess, Bytes& elements);
+    Copy fieldCopier(const Field& field) const;
+    bool isTooSmall() const;
+    std::pair<std::string, std::string> lastError() const;
+    std::optional<Field> findField(const std::string& name, double counts);
+
+    void* handle = nullptr;
+    void* input = nullptr;
+    void* output = nullptr;
+    bool initialised = false;
+};
+
+} // namespace brenix
+
+#endif

@@ -1,0 +1,86 @@
+// The commands. Each returns an exit code or throws a Failure, std::invalid_argument for wrong usage.
+#ifndef BRENIX_TOOLS_COMMANDS_HPP
+#define BRENIX_TOOLS_COMMANDS_HPP
+
+#include "Channel.hpp"
+#include "Samples.hpp"
+#include "Terminal.hpp"
+
+#include <chrono>
+#include <cstddef>
+#include <limits>
+#include <string>
+#include <vector>
+
+namespace brenix
+{
+
+enum ExitCode { Success = 0, Failed = 1, WrongUsage = 2, Interrupted = 130 };
+
+/// All that the command line can say; each command has its part of it.
+struct Settings {
+    std::string commandLine; ///< as a shell takes it
+    bool json = false;
+    bool quiet = false;
+
+    std::vector<std::string> plugins;
+    bool namesOnly = false;
+
+    ChannelSettings channel;
+    std::vector<std::string> properties; ///< Name:type
+    bool open = false;
+
+    SampleFile file;
+    std::vector<std::string> fields;
+    std::string type = "double";
+    double counts = std::numeric_limits<double>::infinity();
+    double seconds = std::numeric_limits<double>::infinity();
+    std::size_t block = 1024;
+
+    std::size_t window = 1024; ///< counts that the scope shows
+    std::string png;
+    std::string emitC;
+};
+
+ExitCode listPlugins(const Settings& settings);
+ExitCode checkPlugins(const Settings& settings);
+ExitCode showInfo(const Settings& settings);
+ExitCode readSamples(const Settings& settings);
+ExitCode writeSamples(const Settings& settings);
+ExitCode showScope(const Settings& settings);
+
+/// Waits for counts and hands them over, one buffer after another, until the settings, the device or
+/// an interruption end it.
+class Reading
+{
+public:
+    Reading(Channel& channel, const Settings& settings, double countRate);
+
+    /// Reads the next buffer into `fields`. Returns its counts; 0 when none has come and, with
+    /// isOver(), none will.
+    std::size_t next();
+    bool isOver() const;
+
+    const std::vector<Field>& getFields() const { return fields; }
+    double getCounts() const { return counts; }
+    double getMostCounts() const { return mostCounts; } ///< infinity when there is no limit
+    double getMostSeconds() const { return mostSeconds; }
+    double getSeconds() const { return secondsSince(start); }
+
+private:
+    Channel& channel;
+    const std::vector<std::string>& fieldNames;
+    double mostCounts;
+    double mostSeconds;
+    double counts = 0;
+    bool done = false;
+    std::vector<Field> fields;
+    std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();
+};
+
+/// The rate that is given or that the device tells; 0 when neither is.
+double countRate(Channel& channel, const SampleFile& file);
+
+} // namespace brenix
+
+#endif

@@ -1,0 +1,121 @@
+// The command info.
+
+#include "Commands.hpp"
+#include "EmitC.hpp"
+#include "brenixcoder/coder.h"
+#include "brenixcore/plugin/Inspect.hpp"
+
+#include <nlohmann/json.hpp>
+
+#include <iostream>
+#include <optional>
+
+namespace brenix
+{
+
+namespace
+{
+
+using Json = nlohmann::ordered_json;
+
+/// The properties that the device describes, and those that are asked for.
+std::vector<PropertyValue> findProperties(Channel& channel, const Settings& settings)
+{
+    std::vector<PropertyValue> values;
+    for (const auto& row : brenixcore::plugin::inspectPlugin(settings.channel.device).properties) {
+        const ElementType& type = elementType(row.type);
+        if (const auto elements = channel.property(row.name, type)) {
+            values.push_back({row.name, row.unit, &type, *elements});
+        }
+    }
+    for (const std::string& text : settings.properties) {
+        const std::size_t colon = text.find(':');
+        if (colon == std::string::npos) {
+            throw std::invalid_argument("a property is Name:type, not " + text);
+        }
+        const ElementType& type = elementType(std::string_view(text).substr(colon + 1));
+        const std::string name = text.substr(0, colon);
+        const auto elements = channel.property(name, type);
+        if (!elements) {
+            channel.check(0); // says what is wrong
+        }
+        values.push_back({name, "", &type, *elements});
+    }
+    return values;
+}
+
+Json toJson(const PropertyValue& value)
+{
+    const std::string text = printElements(*value.type, value.elements);
+    if (value.type->isText) {
+        return text;
+    }
+    // What JSON has no number for, such as infinity, is null.
+    Json list = Json::array();
+    for (std::size_t i = 0; i < value.elements.size(); i += value.type->size) {
+        std::string element;
+        value.type->print(&value.elements[i], element);
+        const Json number = Json::parse(element, nullptr, false);
+        list.push_back(number.is_discarded() ? Json(nullptr) : number);
+    }
+    return list.size() == 1 ? list[0] : list;
+}
+
+/// The dimension along which a stream counts; nothing when the device has no such stream.
+std::optional<double> countDimension(Channel& channel, void* stream)
+{
+    double dimension = 0;
+    if (!channel.isSupported(stream)) {
+        return std::nullopt;
+    }
+    channel.check(coderStreamGetCountDimension(stream, &dimension));
+    return dimension;
+}
+
+} // namespace
+
+ExitCode showInfo(const Settings& settings)
+{
+    Channel channel(settings.channel, false);
+    if (settings.open) {
+        channel.open(settings.channel);
+    }
+    const auto properties = findProperties(channel, settings);
+    Json streams;
+    for (const auto& [name, stream] :
+         {std::pair("input", channel.inputStream()), std::pair("output", channel.outputStream())}) {
+        const auto dimension = countDimension(channel, stream);
+        streams[name] = dimension ? Json({{"countDimension", *dimension}}) : Json(nullptr);
+        if (settings.json) {
+            continue;
+        }
+        std::cout << name << ": ";
+        if (dimension) {
+            std::cout << "counts along dimension " << *dimension << '\n';
+        } else {
+            std::cout << "none\n";
+        }
+    }
+    channel.finish();
+    Json list = Json::array();
+    for (const PropertyValue& property : properties) {
+        if (settings.json) {
+            list.push_back({{"name", property.name},
+                            {"type", property.type->name},
+                            {"unit", property.unit},
+                            {"value", toJson(property)}});
+        } else {
+            std::cout << property.name << ": " << printElements(*property.type, property.elements)
+                      << (property.unit.empty() ? "" : " ") << property.unit << '\n';
+        }
+    }
+    if (settings.json) {
+        std::cout << Json({{"streams", streams}, {"properties", list}}).dump(2) << '\n';
+    }
+    if (!settings.emitC.empty()) {
+        emitInfo(settings, properties);
+    }
+    return Success;
+}
+
+} // namespace brenix

@@ -1,0 +1,152 @@
+// The commands plugins and check.
+
+#include "Commands.hpp"
+#include "brenixcore/plugin/Inspect.hpp"
+
+#include <nlohmann/json.hpp>
+
+#include <algorithm>
+#include <cctype>
+#include <filesystem>
+#include <iostream>
+
+namespace brenix
+{
+
+namespace
+{
+
+using brenixcore::plugin::DescribedValue;
+using brenixcore::plugin::PluginReport;
+using Json = nlohmann::ordered_json;
+
+std::vector<std::string> installedPlugins()
+{
+    std::vector<std::string> names;
+    std::error_code noFolder;
+    for (const auto& entry :
+         std::filesystem::directory_iterator(brenixcore::plugin::pluginFolder(), noFolder)) {
+        if (entry.path().extension() == ".so") {
+            names.push_back(entry.path().stem());
+        }
+    }
+    std::sort(names.begin(), names.end());
+    return names;
+}
+
+std::string kindOf(const PluginReport& report)
+{
+    std::string kind = report.kind.empty() ? "unknown" : report.kind;
+    kind[0] = static_cast<char>(std::tolower(static_cast<unsigned char>(kind[0])));
+    return kind;
+}
+
+Json toJson(const std::vector<DescribedValue>& values, bool defaults)
+{
+    Json list = Json::array();
+    for (const DescribedValue& value : values) {
+        Json entry = {{"name", value.name}, {"type", value.type}, {"unit", value.unit}};
+        if (defaults) {
+            entry["default"] = value.defaultValue;
+        }
+        entry["meaning"] = value.meaning;
+        list.push_back(entry);
+    }
+    return list;
+}
+
+Json toJson(const std::string& name, const PluginReport& report)
+{
+    Json entry = {{"name", name},
+                  {"path", report.path},
+                  {"kind", kindOf(report)},
+                  {"loads", report.problem.empty()}};
+    if (!report.problem.empty()) {
+        entry["problem"] = report.problem;
+        entry["message"] = report.message;
+    }
+    return entry;
+}
+
+void print(const std::vector<DescribedValue>& values)
+{
+    std::size_t width = 0;
+    for (const DescribedValue& value : values) {
+        width = std::max(width, value.name.size());
+    }
+    for (const DescribedValue& value : values) {
+        std::cout << "  " << value.name << std::string(width + 2 - value.name.size(), ' ')
+                  << value.type << (value.unit.empty() ? "" : " in " + value.unit);
+        if (!value.defaultValue.empty()) {
+            std::cout << ", "
+                      << (value.defaultValue == "(required)" ? "required"
+                                                             : "default " + value.defaultValue);
+        }
+        std::cout << (value.meaning.empty() ? "" : ": " + value.meaning) << '\n';
+    }
+}
+
+} // namespace
+
+ExitCode listPlugins(const Settings& settings)
+{
+    Json list = Json::array();
+    for (const std::string& name :
+         settings.plugins.empty() ? installedPlugins() : settings.plugins) {
+        if (settings.namesOnly) {
+            std::cout << name << '\n';
+            continue;
+        }
+        const PluginReport report = brenixcore::plugin::inspectPlugin(name);
+        if (settings.json) {
+            Json entry = toJson(name, report);
+            entry["options"] =
+                report.describesOptions ? toJson(report.options, true) : Json(nullptr);
+            entry["properties"] = toJson(report.properties, false);
+            list.push_back(entry);
+            continue;
+        }
+        std::cout << name << ": " << kindOf(report) << '\n';
+        if (!report.problem.empty()) {
+            std::cout << "  does not load: " << report.message << '\n';
+        } else if (!report.describesOptions) {
+            std::cout << "  does not describe its options\n";
+        }
+        print(report.options);
+        if (!report.properties.empty()) {
+            std::cout << "  properties:\n";
+            print(report.properties);
+        }
+    }
+    if (settings.json) {
+        std::cout
+            << Json({{"folder", brenixcore::plugin::pluginFolder()}, {"plugins", list}}).dump(2)
+            << '\n';
+    }
+    return Success;
+}
+
+ExitCode checkPlugins(const Settings& settings)
+{
+    Json list = Json::array();
+    ExitCode result = Success;
+    for (const std::string& name : settings.plugins) {
+        const PluginReport report = brenixcore::plugin::inspectPlugin(name);
+        if (!report.problem.empty()) {
+            result = Failed;
+        }
+        if (settings.json) {
+            list.push_back(toJson(name, report));
+        } else if (report.problem.empty()) {
+            std::cout << name << ": a " << kindOf(report) << " that loads, " << report.path << '\n';
+        } else {
+            std::cout << name << ": " << report.problem << ": " << report.message << '\n';
+        }
+    }
+    if (settings.json) {
+        std::cout << list.dump(2) << '\n';
+    }
+    return result;
+}
+
+} // namespace brenix

@@ -1,0 +1,462 @@
+#include "Samples.hpp"
+
+#include <sndfile.h>
+
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iostream>
+#include <string_view>
+#include <system_error>
+
+namespace brenix
+{
+
+namespace
+{
+
+struct Encoding {
+    std::string_view type;
+    int format;
+    const char* formatName;
+    const char* functions;
+};
+
+// WAV keeps the elements of these types as they are in memory.
+constexpr std::array encodings = {
+    Encoding{"double", SF_FORMAT_DOUBLE, "SF_FORMAT_DOUBLE", "double"},
+    Encoding{"float", SF_FORMAT_FLOAT, "SF_FORMAT_FLOAT", "float"},
+    Encoding{"int32", SF_FORMAT_PCM_32, "SF_FORMAT_PCM_32", "int"},
+    Encoding{"int16", SF_FORMAT_PCM_16, "SF_FORMAT_PCM_16", "short"},
+    Encoding{"uint8", SF_FORMAT_PCM_U8, "SF_FORMAT_PCM_U8", nullptr},
+};
+
+const Encoding& encodingOf(const ElementType& type)
+{
+    for (const Encoding& encoding : encodings) {
+        if (encoding.type == type.name) {
+            return encoding;
+        }
+    }
+    throw Failure("", std::string("a WAV file cannot hold samples of type ") + type.name);
+}
+
+[[noreturn]] void fail(const std::string& file, const std::string& problem)
+{
+    throw Failure("", (file == "-" ? "" : file + ": ") + problem);
+}
+
+struct CloseFile {
+    void operator()(std::FILE* file) const noexcept { std::fclose(file); }
+};
+using OwnedFile = std::unique_ptr<std::FILE, CloseFile>;
+
+struct CloseSound {
+    void operator()(SNDFILE* sound) const noexcept { sf_close(sound); }
+};
+using OwnedSound = std::unique_ptr<SNDFILE, CloseSound>;
+
+std::size_t rowSize(const std::vector<Field>& fields)
+{
+    std::size_t size = 0;
+    for (const Field& field : fields) {
+        size += field.perCount * field.type->size;
+    }
+    return size;
+}
+
+/// The elements of all fields, row by row.
+Bytes interleave(const std::vector<Field>& fields, std::size_t counts)
+{
+    Bytes rows(rowSize(fields) * counts);
+    unsigned char* next = rows.data();
+    for (std::size_t row = 0; row < counts; ++row) {
+        for (const Field& field : fields) {
+            const std::size_t size = field.perCount * field.type->size;
+            std::memcpy(next, &field.elements[row * size], size);
+            next += size;
+        }
+    }
+    return rows;
+}
+
+void requireOneType(const std::vector<Field>& fields, const char* format)
+{
+    for (const Field& field : fields) {
+        if (field.type != fields[0].type) {
+            fail("-", "the fields are of different types, which " + std::string(format) +
+                          " cannot hold: choose one with --field");
+        }
+    }
+}
+
+/// CSV and raw elements.
+class PlainWriter : public SampleWriter
+{
+public:
+    PlainWriter(const SampleFile& sampleFile, const std::vector<Field>& fields)
+        : name(sampleFile.name), csv(sampleFile.format == "csv")
+    {
+        if (!csv) {
+            requireOneType(fields, "raw");
+        }
+        file.reset(sampleFile.isPipe() ? ::fdopen(::dup(STDOUT_FILENO), "wb")
+                                       : std::fopen(name.c_str(), "wb"));
+        if (!file) {
+            fail(name, std::generic_category().message(errno));
+        }
+        if (csv) {
+            std::string header;
+            for (const std::string& column : columnNames(fields)) {
+                header += (header.empty() ? "" : ",") + column;
+            }
+            put(header.data(), header.size());
+            put("\n", 1);
+        }
+    }
+
+    void write(const std::vector<Field>& fields, std::size_t counts) override
+    {
+        if (!csv) {
+            const Bytes rows = fields.size() == 1 ? Bytes() : interleave(fields, counts);
+            const Bytes& elements = fields.size() == 1 ? fields[0].elements : rows;
+            put(elements.data(), elements.size());
+            return;
+        }
+        text.clear();
+        for (std::size_t row = 0; row < counts; ++row) {
+            const char* separator = "";
+            for (const Field& field : fields) {
+                for (std::size_t i = 0; i < field.perCount; ++i) {
+                    text += separator;
+                    field.type->print(
+                        &field.elements[(row * field.perCount + i) * field.type->size], text);
+                    separator = ",";
+                }
+            }
+            text += '\n';
+        }
+        put(text.data(), text.size());
+        if (std::fflush(file.get()) != 0) { // a reader of a pipe wants them now
+            fail(name, std::generic_category().message(errno));
+        }
+    }
+
+    void finish() override
+    {
+        if (std::fclose(file.release()) != 0) {
+            fail(name, std::generic_category().message(errno));
+        }
+    }
+
+private:
+    void put(const void* data, std::size_t size)
+    {
+        if (std::fwrite(data, 1, size, file.get()) != size) {
+            fail(name, std::generic_category().message(errno));
+        }
+    }
+
+    std::string name;
+    bool csv;
+    OwnedFile file;
+    std::string text;
+};
+
+class WavWriter : public SampleWriter
+{
+public:
+    WavWriter(const SampleFile& sampleFile, const std::vector<Field>& fields)
+        : name(sampleFile.name)
+    {
+        requireOneType(fields, "WAV");
+        SF_INFO info{};
+        info.format = SF_FORMAT_WAV | encodingOf(*fields[0].type).format;
+        info.channels = static_cast<int>(rowSize(fields) / fields[0].type->size);
+        info.samplerate = static_cast<int>(sampleFile.rate);
+        if (info.samplerate <= 0) {
+            fail("-",
+                 "a WAV file needs a sample rate, which the device does not tell: give --rate");
+        }
+        // The length stands at the front: a pipe gets the file when it is complete.
+        if (sampleFile.isPipe()) {
+            whole.reset(std::tmpfile());
+            if (!whole) {
+                fail("a temporary file", std::generic_category().message(errno));
+            }
+        }
+        sound.reset(whole ? sf_open_fd(::fileno(whole.get()), SFM_WRITE, &info, SF_FALSE)
+                          : sf_open(name.c_str(), SFM_WRITE, &info));
+        if (!sound) {
+            fail(name, sf_strerror(nullptr));
+        }
+        sf_command(sound.get(), SFC_SET_ADD_PEAK_CHUNK, nullptr, SF_FALSE); // raw writes have none
+    }
+
+    void write(const std::vector<Field>& fields, std::size_t counts) override
+    {
+        const Bytes rows = interleave(fields, counts);
+        if (sf_write_raw(sound.get(), rows.data(), static_cast<sf_count_t>(rows.size())) !=
+            static_cast<sf_count_t>(rows.size())) {
+            fail(name, sf_strerror(sound.get()));
+        }
+    }
+
+    void finish() override
+    {
+        if (const int error = sf_close(sound.release()); error != SF_ERR_NO_ERROR) {
+            fail(name, sf_error_number(error));
+        }
+        if (whole) {
+            std::rewind(whole.get());
+            std::array<char, 65536> block{};
+            while (const std::size_t size =
+                       std::fread(block.data(), 1, block.size(), whole.get())) {
+                if (std::fwrite(block.data(), 1, size, stdout) != size) {
+                    fail(name, std::generic_category().message(errno));
+                }
+            }
+            if (std::fflush(stdout) != 0) {
+                fail(name, std::generic_category().message(errno));
+            }
+        }
+    }
+
+private:
+    std::string name;
+    OwnedFile whole;
+    OwnedSound sound;
+};
+
+std::ifstream openInput(const SampleFile& file)
+{
+    std::ifstream stream(file.isPipe() ? "/dev/stdin" : file.name, std::ios::binary);
+    if (!stream) {
+        fail(file.name, std::generic_category().message(errno));
+    }
+    return stream;
+}
+
+class CsvReader : public SampleReader
+{
+public:
+    CsvReader(const SampleFile& file, const ElementType& elementType)
+        : name(file.name), type(elementType), stream(openInput(file))
+    {
+        if (readLine()) {
+            std::string wrong;
+            header = !parseRow(type, line, first, wrong);
+            if (header) {
+                first.clear();
+                if (readLine()) {
+                    parseLine(first);
+                }
+            }
+            columns = std::max<std::size_t>(first.size() / type.size, 1);
+        }
+    }
+
+    std::size_t read(std::size_t rows, Bytes& elements) override
+    {
+        std::size_t count = 0;
+        if (!first.empty() && rows > 0) {
+            elements.insert(elements.end(), first.begin(), first.end());
+            first.clear();
+            count = 1;
+        }
+        for (; count < rows && readLine(); ++count) {
+            const std::size_t size = elements.size();
+            parseLine(elements);
+            if (const std::size_t cells = (elements.size() - size) / type.size; cells != columns) {
+                fail(name, place() + std::to_string(cells) + " values instead of " +
+                               std::to_string(columns));
+            }
+        }
+        return count;
+    }
+
+private:
+    /// The next line that is not empty.
+    bool readLine()
+    {
+        while (std::getline(stream, line)) {
+            ++lineNumber;
+            if (line.find_first_not_of(" \t\r") != std::string::npos) {
+                return true;
+            }
+        }
+        return false;
+    }
+
+    void parseLine(Bytes& elements)
+    {
+        std::string wrong;
+        if (!parseRow(type, line, elements, wrong)) {
+            fail(name, place() + "not a number of type " + type.name + ": " + wrong);
+        }
+    }
+
+    std::string place() const { return "line " + std::to_string(lineNumber) + ": "; }
+
+    std::string name;
+    const ElementType& type;
+    std::ifstream stream;
+    std::string line;
+    std::size_t lineNumber = 0;
+    Bytes first; ///< the row that told the number of columns
+};
+
+class RawReader : public SampleReader
+{
+public:
+    RawReader(const SampleFile& file, const ElementType& elementType)
+        : name(file.name), type(elementType), stream(openInput(file))
+    {
+        std::error_code notAFile;
+        const auto size = std::filesystem::file_size(file.name, notAFile);
+        total = notAFile ? 0 : static_cast<double>(size / type.size);
+    }
+
+    std::size_t read(std::size_t rows, Bytes& elements) override
+    {
+        const std::size_t size = elements.size();
+        elements.resize(size + rows * type.size);
+        stream.read(reinterpret_cast<char*>(&elements[size]),
+                    static_cast<std::streamsize>(rows * type.size));
+        const auto length = static_cast<std::size_t>(stream.gcount());
+        if (length % type.size != 0) {
+            fail(name, "the last element has " + std::to_string(length % type.size) + " of " +
+                           std::to_string(type.size) + " bytes");
+        }
+        elements.resize(size + length);
+        return length / type.size;
+    }
+
+private:
+    std::string name;
+    const ElementType& type;
+    std::ifstream stream;
+};
+
+class WavReader : public SampleReader
+{
+public:
+    WavReader(const SampleFile& file, const ElementType& elementType)
+        : name(file.name), type(elementType)
+    {
+        if (soundFunctions(type) == nullptr) {
+            fail("-",
+                 std::string("WAV samples can be double, float, int32 or int16, not ") + type.name);
+        }
+        SF_INFO info{};
+        sound.reset(file.isPipe() ? sf_open_fd(STDIN_FILENO, SFM_READ, &info, SF_FALSE)
+                                  : sf_open(name.c_str(), SFM_READ, &info));
+        if (!sound) {
+            fail(name, sf_strerror(nullptr));
+        }
+        columns = static_cast<std::size_t>(info.channels);
+        rate = info.samplerate;
+        total = file.isPipe() ? 0 : static_cast<double>(info.frames);
+    }
+
+    std::size_t read(std::size_t rows, Bytes& elements) override
+    {
+        const std::size_t size = elements.size();
+        elements.resize(size + rows * columns * type.size);
+        const sf_count_t frames =
+            readFrames(&elements[size], static_cast<sf_count_t>(rows)); // 0 at the end
+        if (const int error = sf_error(sound.get()); error != SF_ERR_NO_ERROR) {
+            fail(name, sf_error_number(error));
+        }
+        elements.resize(size + static_cast<std::size_t>(frames) * columns * type.size);
+        return static_cast<std::size_t>(frames);
+    }
+
+private:
+    sf_count_t readFrames(void* to, sf_count_t frames)
+    {
+        const std::string_view functions = soundFunctions(type);
+        if (functions == "double") {
+            return sf_readf_double(sound.get(), static_cast<double*>(to), frames);
+        }
+        if (functions == "float") {
+            return sf_readf_float(sound.get(), static_cast<float*>(to), frames);
+        }
+        if (functions == "int") {
+            return sf_readf_int(sound.get(), static_cast<int*>(to), frames);
+        }
+        return sf_readf_short(sound.get(), static_cast<short*>(to), frames);
+    }
+
+    std::string name;
+    const ElementType& type;
+    OwnedSound sound;
+};
+
+} // namespace
+
+const char* wavEncoding(const ElementType& type)
+{
+    return encodingOf(type).formatName;
+}
+
+const char* soundFunctions(const ElementType& type)
+{
+    for (const Encoding& encoding : encodings) {
+        if (encoding.type == type.name) {
+            return encoding.functions;
+        }
+    }
+    return nullptr;
+}
+
+void settleFormat(SampleFile& file)
+{
+    if (file.format.empty()) {
+        const std::string ending = std::filesystem::path(file.name).extension().string();
+        file.format = ending == ".wav"                       ? "wav"
+                      : ending == ".raw" || ending == ".bin" ? "raw"
+                                                             : "csv";
+    }
+}
+
+std::vector<std::string> columnNames(const std::vector<Field>& fields)
+{
+    std::vector<std::string> names;
+    for (const Field& field : fields) {
+        const std::string name = field.name.empty() ? "first" : field.name;
+        for (std::size_t i = 1; i <= field.perCount; ++i) {
+            names.push_back(field.perCount == 1 ? name : name + std::to_string(i));
+        }
+    }
+    return names;
+}
+
+std::unique_ptr<SampleWriter> openWriter(const SampleFile& file, const std::vector<Field>& fields)
+{
+    if (file.format == "wav") {
+        return std::make_unique<WavWriter>(file, fields);
+    }
+    return std::make_unique<PlainWriter>(file, fields);
+}
+
+std::unique_ptr<SampleReader> openReader(const SampleFile& file, const ElementType& type)
+{
+    if (type.isText) {
+        fail("-", "samples are numbers, not char");
+    }
+    if (file.format == "wav") {
+        return std::make_unique<WavReader>(file, type);
+    }
+    if (file.format == "raw") {
+        return std::make_unique<RawReader>(file, type);
+    }
+    return std::make_unique<CsvReader>(file, type);
+}
+
+} // namespace brenix

@@ -1,0 +1,73 @@
+// Samples in files and pipes: CSV, raw elements and WAV.
+#ifndef BRENIX_TOOLS_SAMPLES_HPP
+#define BRENIX_TOOLS_SAMPLES_HPP
+
+#include "Channel.hpp"
+#include "Values.hpp"
+
+#include <cstddef>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace brenix
+{
+
+/// Where samples go to or come from.
+struct SampleFile {
+    std::string name = "-"; ///< "-" is the standard output or input
+    std::string format;     ///< "csv", "raw" or "wav"; empty: as the name's ending has it, or "csv"
+    double rate = 0;        ///< counts a second; 0 when it is not known
+
+    bool isPipe() const { return name == "-"; }
+};
+
+/// Sets the format from the name's ending.
+void settleFormat(SampleFile& file);
+
+/// Takes the fields of one buffer after another. Errors are Failures.
+class SampleWriter
+{
+public:
+    virtual ~SampleWriter() = default;
+    virtual void write(const std::vector<Field>& fields, std::size_t counts) = 0;
+    virtual void finish() = 0;
+};
+
+/// Opens the file for fields like these.
+std::unique_ptr<SampleWriter> openWriter(const SampleFile& file, const std::vector<Field>& fields);
+
+/// Gives the elements of one row after another. Errors are Failures.
+class SampleReader
+{
+public:
+    virtual ~SampleReader() = default;
+
+    /// Appends up to that many rows, none at the end. Returns how many.
+    virtual std::size_t read(std::size_t rows, Bytes& elements) = 0;
+    std::size_t getColumns() const { return columns; }
+    double getRate() const { return rate; }       ///< 0 when the file does not tell
+    bool hasHeader() const { return header; }     ///< a first line that names columns
+    double getTotalRows() const { return total; } ///< 0 when it is not known
+
+protected:
+    std::size_t columns = 1;
+    double rate = 0;
+    double total = 0;
+    bool header = false;
+};
+
+std::unique_ptr<SampleReader> openReader(const SampleFile& file, const ElementType& type);
+
+/// The names of the columns of CSV.
+std::vector<std::string> columnNames(const std::vector<Field>& fields);
+
+/// libsndfile's name of the encoding of a WAV file, such as "SF_FORMAT_DOUBLE".
+const char* wavEncoding(const ElementType& type);
+
+/// The end of libsndfile's functions for the type, such as "double"; null if there are none.
+const char* soundFunctions(const ElementType& type);
+
+} // namespace brenix
+
+#endif

@@ -1,0 +1,283 @@
+// The command scope.
+
+#include "Commands.hpp"
+#include "brenixcoder/coder.h"
+
+#include <nlohmann/json.hpp>
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+#include <cstdio>
+#include <deque>
+#include <iostream>
+
+namespace brenix
+{
+
+namespace
+{
+
+struct Range {
+    double low = INFINITY;
+    double high = -INFINITY;
+
+    void add(const Range& other)
+    {
+        low = std::min(low, other.low);
+        high = std::max(high, other.high);
+    }
+};
+
+/// A whole signal in a bounded number of ranges, each over the same number of samples.
+class Envelope
+{
+public:
+    void add(double sample)
+    {
+        if (inLast == samplesOfEach) {
+            if (ranges.size() == most) { // halve their number
+                for (std::size_t i = 0; i < most / 2; ++i) {
+                    ranges[i] = ranges[2 * i];
+                    ranges[i].add(ranges[2 * i + 1]);
+                }
+                ranges.resize(most / 2);
+                samplesOfEach *= 2;
+            }
+            inLast = 0;
+            ranges.emplace_back();
+        }
+        ranges.back().add({sample, sample});
+        ++inLast;
+    }
+
+    const std::vector<Range>& getRanges() const { return ranges; }
+    double getSamplesOfEach() const { return samplesOfEach; }
+
+private:
+    static constexpr std::size_t most = 2048;
+    std::vector<Range> ranges;
+    double samplesOfEach = 1;
+    double inLast = 1; ///< so that the first sample makes a range
+};
+
+/// What is kept of one channel.
+struct Trace {
+    std::string name;
+    std::deque<double> latest;
+    double peak = 0;
+    double sumOfSquares = 0;
+    double count = 0;
+    Envelope envelope;
+
+    void add(double sample, std::size_t window)
+    {
+        latest.push_back(sample);
+        if (latest.size() > window) {
+            latest.pop_front();
+        }
+        peak = std::max(peak, std::fabs(sample));
+        sumOfSquares += sample * sample;
+        ++count;
+        envelope.add(sample);
+    }
+
+    double rms() const { return std::sqrt(sumOfSquares / count); }
+};
+
+/// A trace as lines of half blocks, its largest value at the upper and the lower edge.
+std::string drawTrace(const Trace& trace, int columns, int rows)
+{
+    std::vector<Range> ranges(static_cast<std::size_t>(columns));
+    double scale = 0;
+    for (std::size_t i = 0; i < trace.latest.size(); ++i) {
+        ranges[i * ranges.size() / trace.latest.size()].add({trace.latest[i], trace.latest[i]});
+        scale = std::max(scale, std::fabs(trace.latest[i]));
+    }
+    for (std::size_t i = 1; i < ranges.size(); ++i) { // joins neighbours
+        Range& range = ranges[i];
+        const Range& before = ranges[i - 1];
+        range.low = std::min(range.low, std::max(before.high, -scale));
+        range.high = std::max(range.high, std::min(before.low, scale));
+    }
+    scale = scale > 0 ? scale : 1;
+    std::string text;
+    for (int row = 0; row < rows; ++row) {
+        // The upper and the lower half of the row.
+        const double step = scale / rows;
+        const double middle = scale - (2 * row + 1) * step;
+        for (const Range& range : ranges) {
+            const bool upper = range.high >= middle && range.low <= middle + step;
+            const bool lower = range.low <= middle && range.high >= middle - step;
+            text += upper ? (lower ? "█" : "▀") : (lower ? "▄" : " ");
+        }
+        text += '\n';
+    }
+    return text;
+}
+
+std::string printed(const char* format, double value)
+{
+    std::array<char, 64> text{};
+    std::snprintf(text.data(), text.size(), format, value);
+    return text.data();
+}
+
+/// The whole picture, lines that end with a newline.
+std::string draw(const Settings& settings, const std::vector<Trace>& traces, double seconds,
+                 double fill, const std::string& error)
+{
+    const TerminalSize size = terminalSize();
+    const int height =
+        std::max(1, (size.rows - 3) / std::max<int>(1, static_cast<int>(traces.size())) - 1);
+    const double counts = traces.empty() ? 0 : traces[0].count;
+    std::string text =
+        settings.channel.device + printed("  %.1f s", seconds) + printed("  %.0f counts", counts) +
+        printed("  %.4g counts/s", counts / seconds) + printed("  buffer %.0f%%\n", 100 * fill);
+    for (const Trace& trace : traces) {
+        text += trace.name + printed("  peak %.4g", trace.peak) +
+                printed("  RMS %.4g\n", trace.rms()) +
+                drawTrace(trace, size.columns - 1, std::min(height, 12));
+    }
+    return text + (error.empty() ? "" : error + '\n');
+}
+
+/// Draws the picture anew in the place of the last one.
+void show(const std::string& picture, bool first)
+{
+    static int lines = 0; // of the last one
+    if (!first) {
+        std::printf("\033[%dA\033[J", lines);
+    }
+    std::fputs(picture.c_str(), stdout);
+    std::fflush(stdout);
+    lines = static_cast<int>(std::count(picture.begin(), picture.end(), '\n'));
+}
+
+/// A text of gnuplot's.
+std::string quoted(const std::string& text)
+{
+    std::string result = "'";
+    for (const char character : text) {
+        result += character == '\'' ? "''" : std::string(1, character);
+    }
+    return result + "'";
+}
+
+/// Has gnuplot draw everything that was read, one plot for each channel.
+void savePicture(const Settings& settings, const std::vector<Trace>& traces, double rate)
+{
+    std::FILE* const plot = ::popen("gnuplot", "w");
+    if (plot == nullptr) {
+        throw Failure("", "gnuplot cannot be started");
+    }
+    const double unit = rate > 0 ? 1 / rate : 1;
+    std::fprintf(plot,
+                 "set terminal png size 1000,%zu\nset output %s\nset multiplot layout %zu,1\n"
+                 "set xlabel '%s'\nset grid\nunset key\n",
+                 100 + 200 * traces.size(), quoted(settings.png).c_str(), traces.size(),
+                 rate > 0 ? "seconds" : "counts");
+    for (const Trace& trace : traces) {
+        const double step = trace.envelope.getSamplesOfEach() * unit;
+        std::fprintf(plot,
+                     "set title %s noenhanced\nplot '-' with filledcurves, '-' with lines lc 1\n",
+                     quoted(trace.name).c_str());
+        for (int twice = 0; twice < 2; ++twice) { // the area between, and its upper edge
+            double x = 0;
+            for (const Range& range : trace.envelope.getRanges()) {
+                std::fprintf(plot, twice == 0 ? "%.9g %.9g %.9g\n" : "%.9g %.9g\n", x, range.high,
+                             range.low);
+                x += step;
+            }
+            std::fputs("e\n", plot);
+        }
+    }
+    std::fputs("unset multiplot\n", plot);
+    if (::pclose(plot) != 0) {
+        throw Failure("", "gnuplot could not write " + settings.png + "; is it installed?");
+    }
+}
+
+/// Adds the samples of a buffer.
+void add(std::vector<Trace>& traces, const Reading& reading, std::size_t counts, std::size_t window)
+{
+    if (traces.empty()) {
+        for (const std::string& name : columnNames(reading.getFields())) {
+            traces.emplace_back().name = name;
+        }
+    }
+    std::size_t trace = 0;
+    for (const Field& field : reading.getFields()) {
+        for (std::size_t channel = 0; channel < field.perCount; ++channel, ++trace) {
+            for (std::size_t row = 0; row < counts; ++row) {
+                traces[trace].add(
+                    field.type->toDouble(
+                        &field.elements[(row * field.perCount + channel) * field.type->size]),
+                    window);
+            }
+        }
+    }
+}
+
+double bufferFill(Channel& channel)
+{
+    double available = 0;
+    double space = 0;
+    channel.check(coderStreamGetDataAvailable(channel.inputStream(), &available));
+    channel.check(coderStreamGetSpaceAvailable(channel.inputStream(), &space));
+    return available > 0 ? available / (available + space) : 0;
+}
+
+} // namespace
+
+ExitCode showScope(const Settings& settings)
+{
+    Channel channel(settings.channel, false);
+    const double rate = countRate(channel, settings.file);
+    channel.open(settings.channel);
+    Reading reading(channel, settings, rate);
+    const bool live = !settings.json && isatty(STDOUT_FILENO) != 0;
+    std::vector<Trace> traces;
+    std::string error;
+    double drawn = -1;
+    double fill = 0;
+    while (!reading.isOver()) {
+        fill = bufferFill(channel);
+        if (const std::size_t counts = reading.next(); counts > 0) {
+            add(traces, reading, counts, settings.window);
+        }
+        if (const auto raised = channel.deviceError()) {
+            error = raised->getId() + ": " + raised->what();
+            if (!live) {
+                std::cerr << error << '\n';
+            }
+        }
+        if (live && reading.getSeconds() - drawn > 0.04) {
+            show(draw(settings, traces, reading.getSeconds(), fill, error), drawn < 0);
+            drawn = reading.getSeconds();
+        }
+    }
+    const double seconds = reading.getSeconds();
+    if (settings.json) {
+        auto list = nlohmann::ordered_json::array();
+        for (const Trace& trace : traces) {
+            list.push_back({{"name", trace.name}, {"peak", trace.peak}, {"rms", trace.rms()}});
+        }
+        std::cout << nlohmann::ordered_json({{"counts", reading.getCounts()},
+                                             {"seconds", seconds},
+                                             {"channels", list}})
+                         .dump(2)
+                  << '\n';
+    } else {
+        show(draw(settings, traces, seconds, fill, error), drawn < 0);
+    }
+    channel.finish();
+    if (!settings.png.empty() && !traces.empty()) {
+        savePicture(settings, traces, rate);
+    }
+    return error.empty() ? Success : Failed;
+}
+
+} // namespace brenix

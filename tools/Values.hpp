@@ -1,0 +1,52 @@
+// Typed values on the command line: their types, their texts, and options made of them.
+#ifndef BRENIX_TOOLS_VALUES_HPP
+#define BRENIX_TOOLS_VALUES_HPP
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace brenix
+{
+
+using Bytes = std::vector<unsigned char>;
+
+/// One of the twelve element types of coder.h.
+struct ElementType {
+    const char* name;
+    const char* cName;   ///< in C
+    const char* cFormat; ///< conversion of printf and, but for double and float, of scanf
+    std::size_t size;
+    bool isText;
+    void (*print)(const unsigned char* element, std::string& text); ///< appends
+    bool (*parse)(std::string_view text, unsigned char* element);   ///< whether it is one
+    double (*toDouble)(const unsigned char* element);
+};
+
+const std::vector<ElementType>& elementTypes();
+
+/// Throws std::invalid_argument for a name that is none.
+const ElementType& elementType(std::string_view name);
+
+/// Appends the elements of a list with commas. On false `wrong` is the first that is not of the type.
+bool parseRow(const ElementType& type, std::string_view list, Bytes& elements, std::string& wrong);
+
+/// Elements as text: a char array as it stands up to its NUL, all others with commas.
+std::string printElements(const ElementType& type, const Bytes& elements);
+
+/// An option of a channel, as coder.h takes it.
+struct Option {
+    std::string name;
+    const ElementType* type;
+    int count;
+    Bytes elements;
+};
+
+/// Reads "Name:type=value,value...". Without a type numbers are "double" and the rest is "char".
+/// Throws std::invalid_argument.
+Option parseOption(const std::string& text);
+
+} // namespace brenix
+
+#endif

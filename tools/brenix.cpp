@@ -1,0 +1,211 @@
+// brenix: lists and checks plug-ins, and reads and writes samples through a channel.
+
+#include "Commands.hpp"
+
+#include <CLI/CLI.hpp>
+#include <nlohmann/json.hpp>
+
+#include <functional>
+#include <iostream>
+#include <map>
+
+namespace
+{
+
+using namespace brenix;
+
+/// The arguments as a shell takes them.
+std::string commandLine(int count, char** arguments)
+{
+    std::string line = "brenix";
+    for (int i = 1; i < count; ++i) {
+        const std::string argument = arguments[i];
+        const bool plain =
+            !argument.empty() &&
+            argument.find_first_not_of("abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQ"
+                                       "RSTUVWXYZ0123456789-_./:=,+") == std::string::npos;
+        line += ' ';
+        if (plain) {
+            line += argument;
+            continue;
+        }
+        line += '\'';
+        for (const char character : argument) {
+            line += character == '\'' ? "'\\''" : std::string(1, character);
+        }
+        line += '\'';
+    }
+    return line;
+}
+
+void addList(CLI::App& command, const char* name, std::vector<std::string>& list, const char* help,
+             const char* value)
+{
+    command.add_option(name, list, help)->type_name(value)->allow_extra_args(false);
+}
+
+void addChannel(CLI::App& command, Settings& settings)
+{
+    ChannelSettings& channel = settings.channel;
+    command.add_option("device", channel.device, "Device plug-in: a name or a path")
+        ->type_name("PLUGIN")
+        ->required();
+    command.add_option("-c,--converter", channel.converter, "Converter plug-in")
+        ->type_name("PLUGIN")
+        ->capture_default_str();
+    addList(command, "-o,--option", channel.options,
+            "Option of the device: Name=value or Name:type=value,value...", "OPTION");
+    addList(command, "--open-option", channel.openOptions, "Option at open, such as Timeout",
+            "OPTION");
+    addList(command, "-f,--filter", channel.filters,
+            "Filter plug-in and its options, such as \"scale Gain=0.5\"", "FILTER");
+    command
+        .add_option_function<double>(
+            "--limit",
+            [&channel](double limit) { channel.inputLimit = channel.outputLimit = limit; },
+            "Counts that a stream buffers at most (default 65536)")
+        ->type_name("COUNTS")
+        ->check(CLI::PositiveNumber);
+}
+
+void addExtent(CLI::App& command, Settings& settings)
+{
+    command.add_option("-n,--counts", settings.counts, "End after so many counts")
+        ->type_name("COUNTS")
+        ->check(CLI::PositiveNumber);
+    command
+        .add_option(
+            "-s,--seconds", settings.seconds,
+            "End after so many seconds: of the signal if its rate is known, or else of time")
+        ->type_name("SECONDS")
+        ->check(CLI::PositiveNumber);
+    command
+        .add_option("-r,--rate", settings.file.rate,
+                    "Counts a second, if the device has no property SampleRate")
+        ->type_name("HZ")
+        ->check(CLI::PositiveNumber);
+}
+
+void addFields(CLI::App& command, Settings& settings)
+{
+    addList(command, "--field", settings.fields,
+            "Field to read (default: Data1, Data2... or data, or the first)", "NAME");
+}
+
+void addFile(CLI::App& command, Settings& settings, const char* name, const char* help)
+{
+    command.add_option(name, settings.file.name, help)->type_name("FILE");
+    command
+        .add_option(
+            "--format", settings.file.format,
+            "csv, raw or wav (default: as the file's ending .csv, .raw, .bin or .wav has it)")
+        ->check(CLI::IsMember({"csv", "raw", "wav"}));
+    command.add_flag("-q,--quiet", settings.quiet, "No progress and no summary");
+}
+
+void addEmit(CLI::App& command, Settings& settings)
+{
+    command.add_option("--emit-c", settings.emitC, "Write the C program that does the same")
+        ->type_name("FILE");
+}
+
+void report(const Settings& settings, const std::string& id, const std::string& message)
+{
+    if (settings.json) {
+        std::cerr << nlohmann::ordered_json({{"error", {{"id", id}, {"message", message}}}})
+                  << '\n';
+    } else {
+        std::cerr << "brenix: " << id << (id.empty() || message.empty() ? "" : ": ") << message
+                  << '\n';
+    }
+}
+
+int run(int count, char** arguments)
+{
+    Settings settings;
+    settings.commandLine = commandLine(count, arguments);
+    std::function<ExitCode()> action;
+
+    CLI::App app("Lists and checks plug-ins, and reads and writes samples through a channel.",
+                 "brenix");
+    app.set_version_flag("--version", "brenix " BRENIX_VERSION);
+    app.require_subcommand(1);
+    app.footer("Exit codes: 0 done, 1 an error or a plug-in that does not load, 2 wrong usage, 130 "
+               "interrupted.\nSee brenix(1).");
+    const auto add = [&](const char* name, const char* help, ExitCode (*command)(const Settings&)) {
+        CLI::App* const subcommand = app.add_subcommand(name, help);
+        subcommand->add_flag("--json", settings.json, "Results and errors as JSON");
+        subcommand->callback([&, command] { action = [&, command] { return command(settings); }; });
+        return subcommand;
+    };
+
+    CLI::App* command = add("plugins", "List plug-ins and their options", listPlugins);
+    command->add_option("plugin", settings.plugins, "Plug-ins (default: all that are installed)");
+    command->add_flag("--names", settings.namesOnly, "Names alone");
+
+    command = add("check", "Tell why plug-ins do not load", checkPlugins);
+    command->add_option("plugin", settings.plugins, "Plug-ins: names or paths")->required();
+
+    command = add("info", "Show the properties and streams of a device", showInfo);
+    addChannel(*command, settings);
+    addList(*command, "-p,--property", settings.properties,
+            "Property that the plug-in does not describe: Name:type", "PROPERTY");
+    command->add_flag("--open", settings.open, "Open the channel, too");
+    addEmit(*command, settings);
+
+    command = add("read", "Read samples from a device", readSamples);
+    addChannel(*command, settings);
+    addExtent(*command, settings);
+    addFields(*command, settings);
+    addFile(*command, settings, "-w,--to", "File for the samples (default: standard output)");
+    addEmit(*command, settings);
+
+    command = add("write", "Write samples to a device", writeSamples);
+    addChannel(*command, settings);
+    addExtent(*command, settings);
+    addFile(*command, settings, "-i,--from", "File of the samples (default: standard input)");
+    command->add_option("-t,--type", settings.type, "Element type to write")->capture_default_str();
+    command->add_option("-b,--block", settings.block, "Counts of one buffer")
+        ->check(CLI::Range(1, 1 << 20))
+        ->capture_default_str();
+    addEmit(*command, settings);
+
+    command = add("scope", "Show a live signal", showScope);
+    addChannel(*command, settings);
+    addExtent(*command, settings);
+    addFields(*command, settings);
+    command->add_option("--window", settings.window, "Counts across the screen")
+        ->check(CLI::Range(1, 1 << 24))
+        ->capture_default_str();
+    command
+        ->add_option("--png", settings.png, "Write a picture of all that was read (needs gnuplot)")
+        ->type_name("FILE");
+
+    try {
+        app.parse(count, arguments);
+    } catch (const CLI::ParseError& error) {
+        return app.exit(error) == 0 ? Success : WrongUsage;
+    }
+    try {
+        catchInterrupts();
+        return action();
+    } catch (const Failure& failure) {
+        report(settings, failure.getId(), failure.what());
+        return Failed;
+    } catch (const std::invalid_argument& error) {
+        report(settings, "", error.what());
+        return WrongUsage;
+    }
+}
+
+} // namespace
+
+int main(int count, char** arguments)
+{
+    try {
+        return run(count, arguments);
+    } catch (const std::exception& error) {
+        std::cerr << "brenix: " << error.what() << '\n';
+        return Failed;
+    }
+}
