@@ -56,6 +56,7 @@ std::vector<Option> parseOptions(const std::vector<std::string>& texts)
                                     " options are possible");
     }
     std::vector<Option> options;
+    options.reserve(texts.size());
     for (const std::string& text : texts) {
         options.push_back(parseOption(text));
     }
@@ -277,10 +278,11 @@ std::vector<Field> Channel::findFields(const std::vector<std::string>& names, do
     std::vector<Field> fields;
     const auto add = [&](const std::string& name) {
         auto field = findField(name, counts);
-        if (field) {
-            fields.push_back(*std::move(field));
+        if (!field) {
+            return false;
         }
-        return field.has_value();
+        fields.push_back(*std::move(field));
+        return true;
     };
     for (const std::string& name : names) {
         if (!add(name)) {

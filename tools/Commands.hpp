@@ -45,8 +45,8 @@ struct Settings {
 ExitCode listPlugins(const Settings& settings);
 ExitCode checkPlugins(const Settings& settings);
 ExitCode showInfo(const Settings& settings);
-ExitCode readSamples(const Settings& settings);
-ExitCode writeSamples(const Settings& settings);
+ExitCode readSamples(const Settings& given);
+ExitCode writeSamples(const Settings& given);
 ExitCode showScope(const Settings& settings);
 
 /// Waits for counts and hands them over, one buffer after another, until the settings, the device or

@@ -319,7 +319,8 @@ public:
     {
         std::error_code notAFile;
         const auto size = std::filesystem::file_size(file.name, notAFile);
-        total = notAFile ? 0 : static_cast<double>(size / type.size);
+        const auto elements = notAFile ? 0 : size / type.size;
+        total = static_cast<double>(elements);
     }
 
     std::size_t read(std::size_t rows, Bytes& elements) override

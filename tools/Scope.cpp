@@ -13,6 +13,7 @@
 #include <cstdio>
 #include <deque>
 #include <iostream>
+#include <limits>
 
 namespace brenix
 {
@@ -21,8 +22,8 @@ namespace
 {
 
 struct Range {
-    double low = INFINITY;
-    double high = -INFINITY;
+    double low = std::numeric_limits<double>::infinity();
+    double high = -std::numeric_limits<double>::infinity();
 
     void add(const Range& other)
     {
@@ -169,6 +170,7 @@ std::string quoted(const std::string& text)
 /// Has gnuplot draw everything that was read, one plot for each channel.
 void savePicture(const Settings& settings, const std::vector<Trace>& traces, double rate)
 {
+    // NOLINTNEXTLINE(cert-env33-c): nothing of the command comes from outside
     std::FILE* const plot = ::popen("gnuplot", "w");
     if (plot == nullptr) {
         throw Failure("", "gnuplot cannot be started");
