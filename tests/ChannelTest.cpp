@@ -57,27 +57,6 @@ TEST_F(ChannelTest, InitReplacesHandlesAndDestructionGoesInOrder)
                               "~Channel()", "~Converter()"}));
 }
 
-TEST_F(ChannelTest, FailedInitLeavesUsableHandles)
-{
-    // Which handles are still there, and which of them can flush their core stream.
-    const auto failInit = [&](const char* operation) {
-        core.on = {{operation, [] { throw std::runtime_error("no"); }}};
-        EXPECT_EQ(coderChannelInit(channel, 0), 0);
-        EXPECT_EQ(lastError(), unexpected + "no");
-        core.on.clear();
-        void* const handles[] = {coderChannelGetInputStream(channel),
-                                 coderChannelGetOutputStream(channel)};
-        return std::vector{handles[0] == input, handles[1] == output,
-                           coderStreamFlush(handles[0]) == 1, coderStreamFlush(handles[1]) == 1};
-    };
-    for (const bool before : {false, true}) {
-        EXPECT_EQ(failInit("init"), std::vector({true, true, before, before}));
-        EXPECT_EQ(failInit("getInputStream"), std::vector({true, true, false, false}));
-        EXPECT_EQ(failInit("getOutputStream"), std::vector({false, true, true, false}));
-        init();
-    }
-}
-
 TEST_F(ChannelTest, UpdatesReplaceKnownPropertiesAndDelegatedEventsAreInvoked)
 {
     init(scalar("p", 1));
