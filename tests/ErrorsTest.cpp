@@ -1,4 +1,4 @@
-// The three error records, the translation of exceptions, and the events that raise errors.
+// The error records, and the translation of exceptions. How the records live is in RandomTest.
 
 #include "channel/ErrorText.hpp"
 #include "channel/Exceptions.hpp"
