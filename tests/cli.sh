@@ -45,7 +45,7 @@ done <<END
 1|noFactory|check $plugins/noFactory.so
 1|factoryFailed: thrown by the factory|check $plugins/throwingFactory.so
 1|factoryFailed: the factory returned nothing|check $plugins/nullFactory.so
-1|notLoadable: $plugins/throwingStatic.so: thrown by a static object|check $plugins/throwingStatic.so
+1|notLoadable: thrown by a static object|check $plugins/throwingStatic.so
 1|"problem": "abiVersion"|check --json signal $plugins/otherAbiVersion.so
 0|does not describe its options|plugins $plugins/probe.so
 1|couldNotLoadDevice: $build/lib/brenix-plugins/none.so: No such file|info none

@@ -53,10 +53,7 @@ public:
 class PickyFilter : public Filter
 {
 public:
-    void tune(Options& options) override
-    {
-        factor = options.number("Factor").value_or(factor);
-    }
+    void tune(Options& options) override { factor = options.number("Factor").value_or(factor); }
 
     void apply(Packet& packet) override
     {
