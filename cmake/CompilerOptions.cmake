@@ -17,3 +17,10 @@ else()
     set(BRENIX_C_LINKER_LANGUAGE C)
     set(BRENIX_NO_UNDEFINED -Wl,-z,defs)
 endif()
+
+# What hardens a program in use, as Debian builds its packages. The sanitizers watch the rest.
+add_link_options(-Wl,-z,relro,-z,now,-z,noexecstack,-z,text)
+if(NOT CMAKE_CXX_FLAGS MATCHES "-fsanitize")
+    add_compile_options(
+        "$<$<CONFIG:Release,RelWithDebInfo>:-fstack-protector-strong;-U_FORTIFY_SOURCE;-D_FORTIFY_SOURCE=2>")
+endif()
