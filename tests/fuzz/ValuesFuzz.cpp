@@ -27,7 +27,9 @@ struct Option {
     {
         const unsigned int choice = input.byte();
         type = choice < 128 ? types[choice % std::size(types)].first : input.text().c_str();
-        size = choice < 128 ? types[choice % std::size(types)].second : 1;
+        for (const auto& [known, bytes] : types) {
+            size = type == known ? bytes : size;
+        }
         const std::string given = input.text();
         data.assign(given.begin(), given.end()); // no byte more: the sanitizer sees the end
         count = static_cast<int>(data.size() / size);
@@ -39,7 +41,7 @@ struct Option {
         }
     }
     std::string name, type;
-    std::size_t size;
+    std::size_t size = 1;
     std::vector<char> data;
     int count;
 };
