@@ -59,6 +59,7 @@ int callStream(void* handle, Body&& body) noexcept
 template <typename Value, typename Query>
 int queryStream(void* handle, Value* answer, const char* argument, Query query) noexcept
 {
+    // cppcheck-suppress throwInNoexceptFunction ; the frame catches what the body throws
     return callStream(handle, [&](Stream& stream) {
         requireArgument(answer, argument);
         *answer = static_cast<Value>((stream.*query)());

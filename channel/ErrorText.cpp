@@ -22,6 +22,7 @@ void translateCurrentException(ErrorText& id, ErrorText& message) noexcept
     id.clear();
     message.clear();
     try {
+        // cppcheck-suppress rethrowNoCurrentException ; called inside a handler
         throw;
     } catch (const PluginException&) {
         // The plug-in's own error is the channel's synchronous error.

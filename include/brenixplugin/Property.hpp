@@ -107,6 +107,7 @@ public:
     /// Takes over `elements`, made with array new and holding `elementCount` elements (or null
     /// with a count of 0). Does not throw: on a failure before the call the array is still the
     /// caller's, after it the object's.
+    // cppcheck-suppress passedByValue ; it is moved
     TPointerProperty(std::string propertyName, T* elements, std::uint64_t elementCount) noexcept
         : name(std::move(propertyName)), data(elements), count(elementCount)
     {
