@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <iterator>
-#include <new>
 #include <stdexcept>
 #include <string>
 #include <utility>
@@ -64,7 +63,7 @@ void Stream::Impl::push(plugin::Packet packet)
 }
 
 void Stream::Impl::refill()
-try {
+{
     while (!pending.empty()) {
         QueuedPacket& next = pending.front();
         std::uint64_t part = next.counts();
@@ -87,7 +86,6 @@ try {
         }
         counts += part;
     }
-} catch (const std::bad_alloc&) { // the rest waits on, and the next read tries again
 }
 
 std::optional<plugin::Packet> Stream::Impl::pull(bool waits)
@@ -144,7 +142,6 @@ Stream::Impl::Packets Stream::Impl::take(std::uint64_t count)
 
 void Stream::Impl::putBack(Packets& taken) noexcept
 {
-    const std::lock_guard lock(mutex);
     for (const QueuedPacket& queued : taken) {
         counts += queued.counts();
     }
@@ -162,7 +159,12 @@ Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
         refuse("the limit is " + std::to_string(limit));
     }
     wanted = count;
-    refill();
+    try {
+        refill();
+    } catch (...) {
+        wanted = 0;
+        throw;
+    }
     notifyDevice(lock);
     lock.lock();
     wait(lock, [&] { return counts >= count; });
@@ -171,7 +173,12 @@ Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
         refuse("there are " + std::to_string(counts) + " and " + reason());
     }
     Packets taken = take(count);
-    refill();
+    try {
+        refill();
+    } catch (...) { // what waits on would be missed by whoever waits for it to arrive
+        putBack(taken);
+        throw;
+    }
     notifyDevice(lock);
     return taken;
 }
@@ -333,6 +340,7 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
         ~Taken()
         {
             if (!packets.empty()) {
+                const std::lock_guard lock(stream.mutex);
                 stream.putBack(packets);
             }
         }

@@ -97,7 +97,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
         }
     }
 
-    /// Moves from `pending` to `packets` what has room. Under the mutex.
+    /// Moves from `pending` to `packets` what has room. When it throws, the rest stays. Under the mutex.
     void refill();
 
     /// Tells both sides of a change that the caller's made. Unlocks the mutex.
@@ -109,7 +109,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     /// Takes the `count` oldest counts, which are there. Under the mutex.
     Packets take(std::uint64_t count);
 
-    /// Puts packets that were taken back in their place.
+    /// Puts packets that were taken back in their place. Under the mutex.
     void putBack(Packets& taken) noexcept;
 
     /// Why a wait ended without what it waited for. Under the mutex.
