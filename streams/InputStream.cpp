@@ -1,7 +1,6 @@
 #include "streams/InputStream.hpp"
 
 #include "properties/CopyProperty.hpp"
-#include "streams/DataList.hpp"
 #include "util/Numbers.hpp"
 
 #include <algorithm>
@@ -34,7 +33,7 @@ void InputStream::readBuffers(double countsToRead, double expectedBuffers)
 {
     DataList delivered;
     {
-        std::vector<void*> buffers;
+        std::vector<void*> buffers; // the core's until read() returns
         unsigned long countRead = 0;
         coreInput().read(toUint64Saturated(countsToRead), buffers, countRead);
         delivered.buffers = std::move(buffers);
@@ -42,22 +41,14 @@ void InputStream::readBuffers(double countsToRead, double expectedBuffers)
     if (static_cast<double>(delivered.buffers.size()) != expectedBuffers) {
         throw std::runtime_error("The number of buffers read did not match the expected number.");
     }
-
-    dataBuffers.reserve(delivered.buffers.size()); // the last step that can fail
-    for (auto& buffer : dataBuffers) {
-        buffer.reset();
-    }
-    dataBuffers.clear();
-    for (void*& buffer : delivered.buffers) {
-        dataBuffers.emplace_back(
-            static_cast<brenixplugin::PropertyMap*>(std::exchange(buffer, nullptr)));
-    }
+    dataBuffers.buffers.swap(
+        delivered.buffers); // needs no memory, with which the data would be lost
 }
 
 std::size_t InputStream::positionOf(int32_t bufferIndex) const
 {
     const auto position = static_cast<std::size_t>(bufferIndex) - 1; // wraps below 1, to too large
-    if (position >= dataBuffers.size() || !dataBuffers[position]) {
+    if (position >= dataBuffers.buffers.size() || dataBuffers.buffers[position] == nullptr) {
         throw std::runtime_error("Data buffer index: " + std::to_string(bufferIndex) +
                                  " not found.");
     }
@@ -68,7 +59,8 @@ void InputStream::readBufferData(int32_t bufferIndex, int32_t fieldIndex,
                                  const std::string& fieldName, const std::string& typeName,
                                  int32_t capacity, void* destination) const
 {
-    const brenixplugin::PropertyMap& buffer = *dataBuffers[positionOf(bufferIndex)];
+    const auto& buffer = *static_cast<const brenixplugin::PropertyMap*>(
+        dataBuffers.buffers[positionOf(bufferIndex)]);
     auto field = buffer.begin();
     if (!fieldName.empty()) {
         field = buffer.find(fieldName);
@@ -90,7 +82,8 @@ void InputStream::readBufferData(int32_t bufferIndex, int32_t fieldIndex,
 
 void InputStream::freeBuffer(int32_t bufferIndex)
 {
-    dataBuffers[positionOf(bufferIndex)].reset();
+    void* const buffer = std::exchange(dataBuffers.buffers[positionOf(bufferIndex)], nullptr);
+    brenixplugin::OwnedDataBuffer released(static_cast<brenixplugin::PropertyMap*>(buffer));
 }
 
 } // namespace brenixcoder

@@ -1,12 +1,11 @@
 #ifndef BRENIXCODER_STREAMS_INPUTSTREAM_HPP
 #define BRENIXCODER_STREAMS_INPUTSTREAM_HPP
 
-#include "brenixplugin/Property.hpp"
+#include "streams/DataList.hpp"
 #include "streams/Stream.hpp"
 
 #include <cstdint>
 #include <string>
-#include <vector>
 
 namespace brenixcoder
 {
@@ -39,7 +38,7 @@ private:
     /// The store's position for a buffer; throws when no buffer is there.
     std::size_t positionOf(int32_t bufferIndex) const;
 
-    std::vector<brenixplugin::OwnedDataBuffer> dataBuffers;
+    DataList dataBuffers; ///< null where a buffer was freed
 };
 
 } // namespace brenixcoder

@@ -363,8 +363,7 @@ CODER_API int coderInputStreamPeek(void* stream, double* totalCounts, double* bu
  * @param expectedBuffers in how many buffers they must arrive, as coderInputStreamPeek() told
  * @return 1, or 0 with the last error: brenix:InputStream:synchronousInputNotPossible,
  *         ...:couldNotConvertInputData, or brenix:Channel:unexpectedException with "The number of
- *         buffers read did not match the expected number." (the data read is then lost, as it
- *         is when memory runs out at the last step)
+ *         buffers read did not match the expected number." (the data read is then lost)
  */
 CODER_API int coderInputStreamReadBuffers(void* stream, double countsToRead,
                                           double expectedBuffers) CODER_NOEXCEPT;
