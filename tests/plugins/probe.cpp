@@ -4,6 +4,7 @@
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
+#include <atomic>
 #include <memory>
 #include <stdexcept>
 #include <string>
@@ -32,7 +33,8 @@ struct UnknownProperty : interfaces::IPropertyInfo {
 
 /// Options: Packets (counts of the packets to push, as int32; of those below 0 each is a mistake of
 /// its own), Streams ("i", "o", "io", ""), FailIn and RaiseIn (an operation: init, open, run, execute,
-/// close, term), FailAs (what is thrown: "", "int", "own", "silent", "long").
+/// close, term), FailAs (what is thrown: "", "int", "own", "silent", "long"), Threads (how
+/// many report things from init to term).
 class Probe : public Device
 {
 public:
@@ -64,6 +66,10 @@ public:
             info.output = StreamInfo{2};
         }
         hasOutput = info.output.has_value();
+        ending = false;
+        for (long left = options.wholeNumber("Threads", 0, 9).value_or(0); left > 0; --left) {
+            threads.emplace_back([this] { report(); });
+        }
         return info;
     }
 
@@ -143,9 +149,29 @@ public:
     }
 
     void close() override { reach("close"); }
-    void term() override { reach("term"); }
+    void term() override
+    {
+        ending = true;
+        for (std::thread& thread : threads) {
+            thread.join();
+        }
+        threads.clear();
+        reach("term");
+    }
 
 private:
+    /// Reports property values, warnings, and errors with one text for both of their parts.
+    void report()
+    {
+        while (!ending) {
+            const int number = ++reports;
+            const std::string text = std::to_string(number);
+            host->updateProperty(makeScalar("Level", static_cast<double>(number)));
+            host->raise("warning", text.c_str(), "is dropped");
+            host->raise("error", text.c_str(), text.c_str());
+        }
+    }
+
     void reach(const std::string& operation)
     {
         if (operation == raiseIn) {
@@ -189,6 +215,9 @@ private:
     std::string raiseIn;
     std::vector<int> packets;
     bool hasOutput = false;
+    std::atomic<bool> ending = false;
+    std::atomic<int> reports = 0;
+    std::vector<std::thread> threads;
 };
 
 } // namespace

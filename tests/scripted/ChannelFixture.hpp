@@ -3,6 +3,7 @@
 #ifndef BRENIXCODER_TESTS_SCRIPTED_CHANNELFIXTURE_HPP
 #define BRENIXCODER_TESTS_SCRIPTED_CHANNELFIXTURE_HPP
 
+#include "Allocations.hpp"
 #include "brenixcoder/coder.h"
 #include "brenixcore/Channel.hpp"
 
@@ -45,19 +46,10 @@ struct Core {
 
 inline Core core;
 
-/// Which allocation from now on fails on this thread: 1 is the next, 0 is none.
-inline thread_local long failingAllocation = 0;
-
-/// Exempts the core and the tests themselves from failing allocations.
-struct AllocationsAllowed {
-    ~AllocationsAllowed() { failingAllocation = suspended; }
-    const long suspended = std::exchange(failingAllocation, 0);
-};
-
 /// Logs "what(argument)".
 inline void log(const std::string_view what, const std::string& argument = "")
 {
-    const AllocationsAllowed allowed;
+    const allocations::Allowed allowed;
     core.log.push_back(std::string(what) + '(' + argument + ')');
 }
 
@@ -151,7 +143,10 @@ inline void raiseEvent(const std::string& name, const std::string& id, const std
         void onAccepted() override { log("accept"); }
         Log texts;
     } event;
-    event.texts = {name, id, message};
+    {
+        const allocations::Allowed allowed;
+        event.texts = {name, id, message};
+    }
     core.handler->onCustomEvent(event);
 }
 

@@ -1,29 +1,8 @@
 #include "scripted/ChannelFixture.hpp"
 
-#include <new>
 #include <sstream>
 
 using namespace scripted;
-
-// The allocation functions of the test program, which fail when a test says so. The array forms end
-// here as well, except under a sanitizer that brings its own. Not inline: GCC would see memory of
-// operator new go to free.
-[[gnu::noinline]] void* operator new(std::size_t size)
-{
-    const bool fails = failingAllocation > 0 && --failingAllocation == 0;
-    void* const memory = fails ? nullptr : std::malloc(size);
-    return memory != nullptr ? memory : throw std::bad_alloc();
-}
-
-[[gnu::noinline]] void operator delete(void* memory) noexcept
-{
-    std::free(memory);
-}
-
-[[gnu::noinline]] void operator delete(void* memory, std::size_t) noexcept
-{
-    std::free(memory);
-}
 
 namespace
 {
@@ -41,7 +20,7 @@ std::ostream& operator<<(std::ostream& out, const PropertyMap& options)
 /// Keeps the fields of the buffers written; the buffers stay.
 unsigned long takeFields(const std::vector<void*>& buffers)
 {
-    const AllocationsAllowed allowed;
+    const allocations::Allowed allowed;
     core.written.clear();
     for (void* buffer : buffers) {
         core.written.emplace_back(new PropertyMap)->swap(*static_cast<PropertyMap*>(buffer));
@@ -54,7 +33,7 @@ template <typename... Types>
 void called(const void* object, const std::string_view operation, const Types&... arguments)
 {
     {
-        const AllocationsAllowed allowed;
+        const allocations::Allowed allowed;
         const bool isInput = object == core.input.get();
         const char* side = isInput ? "input." : object == core.output.get() ? "output." : "";
         std::ostringstream text;

@@ -1,0 +1,346 @@
+// Memory runs out in the built libraries and in plug-ins, at each place where it can.
+
+#include "Allocations.hpp"
+#include "Calls.hpp"
+#include "Driver.hpp"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <functional>
+#include <string_view>
+
+using namespace driver;
+using allocations::Failing;
+
+namespace
+{
+
+const std::string probe = TEST_PLUGINS "/probe.so";
+const std::string pickyFilter = TEST_PLUGINS "/pickyFilter.so";
+
+/// Whether an error is one of those that come of a failed allocation.
+bool isOutOfMemory(const std::string& error)
+{
+    constexpr std::string_view errors[] = {
+        "brenix:Channel:unexpectedException|std::bad_alloc",
+        "brenix:Channel:couldNotLoadDevice|",
+        "brenix:Channel:couldNotLoadConverter|",
+        "brenix:Channel:couldNotCreateDevice|",
+        "brenix:Channel:couldNotCreateConverter|",
+        "brenix:Stream:couldNotLoadFilter|",
+        "brenix:Stream:couldNotCreateFilter|",
+        "brenix:InputStream:couldNotConvertInputData|",
+        "brenix:OutputStream:couldNotConvertOutputData|",
+        "brenix:Device:failed|std::bad_alloc",
+        "brenix:Stream:filterFailed|std::bad_alloc",
+    };
+    return std::find(std::begin(errors), std::end(errors), error) != std::end(errors);
+}
+
+/// Like allocations::sweep(), of points that leave no memory behind.
+template <typename Point>
+void sweepWithoutLeak(const Point& point)
+{
+    allocations::sweep([&](long number, bool lasts) {
+        const long before = allocations::live;
+        const bool failed = point(number, lasts);
+        EXPECT_EQ(allocations::live, before);
+        return failed;
+    });
+}
+
+/// What goes through a channel.
+struct Program {
+    const char* device;
+    const char* converter;
+    const char* filter; ///< with an option Factor; of the input stream, if there is one
+    double limit;       ///< of the input stream
+    int writes;         ///< numbers
+    double reads;       ///< counts, twice
+    const char* field;
+    std::function<int(void* channel)> init;
+};
+
+/// A run of a program, step by step. A step that fails can be repeated. Needs no memory itself.
+class Life
+{
+public:
+    enum Step {
+        Create,
+        Init,
+        AddFilter,
+        Open,
+        Write,
+        Read,
+        Copy,
+        ReadOn,
+        CopyOn,
+        Close,
+        Term,
+        End
+    };
+
+    explicit Life(const Program& theProgram) : program(theProgram) {}
+    Life(const Life&) = delete;
+    Life& operator=(const Life&) = delete;
+    ~Life() { coderChannelDestroy(channel); }
+
+    bool step(int number)
+    {
+        const int factor = 2;
+        const bool hasInput = program.reads > 0;
+        switch (number) {
+        case Create:
+            channel = coderChannelCreate(program.device, program.converter, id, message,
+                                         program.limit, infinity);
+            return channel != nullptr;
+        case Init:
+            return program.init(channel) == 1;
+        case AddFilter:
+            return program.filter == nullptr ||
+                   coderStreamAddFilter(hasInput ? input() : output(), program.filter, 1,
+                                        CODER_OPTION("Factor", "int32", 1, &factor)) == 1;
+        case Open:
+            return coderChannelOpen(channel, 0) == 1;
+        case Write:
+            return program.writes == 0 ||
+                   coderOutputStreamWriteTypedDataOld(output(), &written, 1, "double",
+                                                      CODER_BUFFER(program.writes, numbers)) == 1;
+        case Read:
+        case ReadOn:
+            return !hasInput || (await() && read());
+        case Copy:
+        case CopyOn:
+            return !hasInput || copy();
+        case Close:
+            return coderChannelClose(channel) == 1;
+        default:
+            return coderChannelTerm(channel) == 1;
+        }
+    }
+
+    /// Does steps up to the first that fails.
+    int run(int first)
+    {
+        while (first < End && step(first)) {
+            ++first;
+        }
+        return first;
+    }
+
+    std::string error(int (*query)(void*, char*, char*) noexcept = coderChannelGetLastError)
+    {
+        if (channel != nullptr) {
+            query(channel, id, message);
+        }
+        return id + "|"s + message;
+    }
+
+    double sum = 0; ///< of the values read
+
+private:
+    void* input() const { return coderChannelGetInputStream(channel); }
+    void* output() const { return coderChannelGetOutputStream(channel); }
+
+    /// Waits for the counts; false when they will not come.
+    bool await() const
+    {
+        const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+        double available = 0;
+        uint8_t failed = 0;
+        while (failed == 0 && std::chrono::steady_clock::now() < end) {
+            coderChannelHasAsyncError(channel, &failed); // before the last look at the data
+            coderStreamGetDataAvailable(input(), &available);
+            if (available >= program.reads) {
+                return true;
+            }
+            std::this_thread::sleep_for(std::chrono::microseconds(50));
+        }
+        return false;
+    }
+
+    bool read()
+    {
+        double total = 0;
+        double counts[8];
+        buffers = 8;
+        return coderInputStreamPeek(input(), &total, counts, &buffers, program.reads) == 1 &&
+               coderInputStreamReadBuffers(input(), program.reads, buffers) == 1;
+    }
+
+    bool copy()
+    {
+        double all = 0;
+        for (int32_t index = 1; index <= static_cast<int32_t>(buffers); ++index) {
+            double values[8] = {};
+            if (coderInputStreamReadBufferData(input(), index, 0, program.field, "double", 8,
+                                               values) == 0) {
+                return false;
+            }
+            all = std::accumulate(values, values + 8, all);
+        }
+        sum += all;
+        return true;
+    }
+
+    static constexpr double numbers[] = {1, 2, 4, 8, 16, 32, 64, 128};
+    const Program& program;
+    void* channel = nullptr;
+    double written = 0, buffers = 0;
+    char id[CODER_ERROR_SIZE] = "", message[CODER_ERROR_SIZE] = "";
+};
+
+class SweepTest : public testing::Test
+{
+protected:
+    allocations::PrintPoints print;
+
+    const std::string file = testing::TempDir() + "sweep-" + std::to_string(getpid()) + ".wav";
+    const std::string host = "127.1." + std::to_string(getpid() >> 8 & 255) + "." +
+                             std::to_string(getpid() & 255); // of this process alone
+    const int counts[2] = {7, 1}, port = 47110, block = 4, frames = 8, channels = 2;
+
+    /// The devices, converters and filters.
+    const std::vector<Program> programs = {
+        {probe.c_str(), "identity", pickyFilter.c_str(), 4, 0, 4, "data",
+         [this](void* channel) {
+             return coderChannelInit(channel, 1, CODER_OPTION("Packets", "int32", 2, counts));
+         }},
+        {"loopback", "identity", "decimate", infinity, 8, 2, "data",
+         [](void* channel) { return coderChannelInit(channel, 0); }},
+        {"signal", "columns", nullptr, infinity, 0, 4, "Data1",
+         [this](void* channel) {
+             return coderChannelInit(channel, 4, CODER_OPTION("Pace", "char", 9, "fast"),
+                                     CODER_OPTION("BlockSize", "int32", 1, &block),
+                                     CODER_OPTION("Frames", "int32", 1, &frames),
+                                     CODER_OPTION("Channels", "int32", 1, &channels));
+         }},
+        {"audiofile", "identity", "decimate", infinity, 8, 0, "",
+         [this](void* channel) {
+             return coderChannelInit(channel, 3,
+                                     CODER_OPTION("FileName", "char", 999, file.c_str()),
+                                     CODER_OPTION("Mode", "char", 9, "write"),
+                                     CODER_OPTION("SampleFormat", "char", 9, "DOUBLE"));
+         }},
+        {"audiofile", "columns", nullptr, infinity, 0, 2, "Data1",
+         [this](void* channel) {
+             return coderChannelInit(channel, 1,
+                                     CODER_OPTION("FileName", "char", 999, file.c_str()));
+         }},
+        {"udp", "identity", nullptr, infinity, 8, 4, "data",
+         [this](void* channel) {
+             return coderChannelInit(channel, 5, CODER_OPTION("Host", "char", 99, host.c_str()),
+                                     CODER_OPTION("LocalHost", "char", 99, host.c_str()),
+                                     CODER_OPTION("Port", "int32", 1, &port),
+                                     CODER_OPTION("LocalPort", "int32", 1, &port),
+                                     CODER_OPTION("ElementType", "char", 9, "double"));
+         }},
+    };
+};
+
+} // namespace
+
+TEST_F(SweepTest, EveryCall)
+{
+    Calls calls{"Level", "Stamp", "scale", "Gain"};
+    for (const Call& call : calls.rows) {
+        const std::size_t handles = call.handles(nullptr, nullptr, nullptr).size();
+        for (std::size_t i = 0; i < handles; ++i) {
+            SCOPED_TRACE(std::to_string(&call - calls.rows.data()) + " " + call.operation);
+            sweepWithoutLeak([&](long number, bool lasts) {
+                const int packets[] = {10, 10};
+                Channel channel(probe);
+                channel.init(2, CODER_OPTION("Streams", "char", 9, "io"),
+                             CODER_OPTION("Packets", "int32", 2, packets));
+                coderStreamAddFilter(channel.input, "scale", 0);
+                coderStreamAddFilter(channel.output, "scale", 0);
+                channel.open();
+                Channel::waitUntil(
+                    [&] { return channel.ask(coderStreamGetDataAvailable, channel.input) == 20; });
+                EXPECT_EQ(channel.read(5, 1), range(0, 5));
+                if (call.operation != "close") {
+                    coderChannelClose(channel.handle);
+                }
+                void* const handle = call.handles(channel.handle, channel.input, channel.output)[i];
+                const double unwritten = 0x1.23456789p3;
+                double answer = unwritten;
+                Failing failing(number, lasts);
+                const bool result = call.run(handle, &answer);
+                const bool failed = Failing::end();
+                EXPECT_EQ(result, !failed);
+                if (failed) {
+                    EXPECT_TRUE(isOutOfMemory(channel.error())) << channel.error();
+                    EXPECT_EQ(answer, call.resets() ? 0 : unwritten);
+                    EXPECT_TRUE(call.run(handle, &answer)) << channel.error(); // the next call
+                }
+                if (call.target == Inputs && call.operation == "read") {
+                    EXPECT_EQ(channel.read(14, 2), range(6, 20)); // nothing is lost
+                }
+                const Failing all(1); // no end needs memory
+                coderInputStreamFreeBuffer(coderChannelGetInputStream(channel.handle), 1);
+                coderInputStreamFreeBuffer(coderChannelGetInputStream(channel.handle), 9);
+                coderChannelClose(channel.handle);
+                coderChannelTerm(channel.handle);
+                coderChannelDestroy(std::exchange(channel.handle, nullptr));
+                return failed;
+            });
+        }
+    }
+}
+
+TEST_F(SweepTest, EveryPlugInOnEitherThread)
+{
+    for (const Program& program : programs) {
+        SCOPED_TRACE(program.device);
+        Life undisturbed(program);
+        ASSERT_EQ(undisturbed.run(0), Life::End) << undisturbed.error();
+        sweepWithoutLeak([&](long number, bool lasts) {
+            Life run(program);
+            Failing failing(number, lasts);
+            int step = run.run(0);
+            const bool failed = Failing::end();
+            if (step < Life::End) {
+                const std::string error = run.error();
+                EXPECT_TRUE(failed && isOutOfMemory(error)) << step << error;
+                if ((step == Life::Read || step == Life::ReadOn) &&
+                    program.converter != std::string_view("identity")) {
+                    EXPECT_EQ(run.run(Life::Close), Life::End) << run.error();
+                    return failed; // for a converter that fails loses its packet
+                }
+                step = run.run(step); // the next call works, and nothing is lost
+            }
+            EXPECT_EQ(step, Life::End) << run.error();
+            EXPECT_EQ(run.sum, undisturbed.sum);
+            return failed;
+        });
+        sweepWithoutLeak([&](long number, bool lasts) {
+            Life run(program);
+            Failing failing(number, lasts, true);
+            const int step = run.run(0);
+            const int end = step < Life::End ? run.run(Life::Close) : step;
+            const bool failed = Failing::end();
+            EXPECT_EQ(end, Life::End) << run.error();
+            const std::string error = run.error(coderChannelGetLastAsyncError);
+            EXPECT_EQ(error != "|", failed) << step;
+            EXPECT_TRUE(!failed || isOutOfMemory(error)) << error;
+            return failed;
+        });
+    }
+    std::remove(file.c_str());
+}
+
+TEST_F(SweepTest, AnErrorOfAPlugInIsKept)
+{
+    sweepWithoutLeak([&](long number, bool lasts) {
+        Channel channel(probe);
+        channel.init(1, CODER_OPTION("RaiseIn", "char", 9, "term"));
+        Failing failing(number, lasts);
+        const int result = coderChannelTerm(channel.handle);
+        const bool failed = Failing::end();
+        EXPECT_EQ(result, 0);
+        EXPECT_EQ(channel.error(), failed ? unexpected + "std::bad_alloc" : "|");
+        EXPECT_EQ(channel.error(coderChannelGetLastSyncError), "probe:raised|term");
+        return failed;
+    });
+}
