@@ -254,7 +254,7 @@ private:
             receive();
         }
         if (device.sends && (failure || (inputEnded && !waiting))) {
-            streams.endOutput(); // before the last look at it
+            streams.refuseOutput(); // before the last look at it
         }
         if (device.sends && !failure && !outputEnded) {
             sendNext();

@@ -96,7 +96,7 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost, plugin::Dev
     bool tryPush(plugin::Packet& packet) override;
     std::optional<plugin::Packet> tryPull() override;
     bool isClosing() const override;
-    void endOutput() override;
+    void refuseOutput() override;
 
     bool enter(plugin::Packet& packet, bool waits);
     std::optional<plugin::Packet> leave(bool waits);
@@ -212,7 +212,7 @@ bool Channel::Impl::isClosing() const
     return closing;
 }
 
-void Channel::Impl::endOutput()
+void Channel::Impl::refuseOutput()
 {
     if (output) {
         output->impl->setDeviceDone();

@@ -64,6 +64,8 @@ struct Bench : Base, DeviceStreams, DeviceHost {
         return packet;
     }
 
+    void refuseOutput() override {}
+
     bool isClosing() const override
     {
         std::array<char, 4096> buffer{};

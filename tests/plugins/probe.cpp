@@ -120,8 +120,8 @@ public:
             return;
         }
         if (command == "storm") {
-            std::vector<std::thread> threads(4);
-            for (std::thread& thread : threads) {
+            std::vector<std::thread> storm(4);
+            for (std::thread& thread : storm) {
                 thread = std::thread([&] {
                     for (int i = 0; i < 500; ++i) {
                         host->updateProperty(makeScalar("Level", 3.0));
@@ -130,7 +130,7 @@ public:
                     }
                 });
             }
-            for (std::thread& thread : threads) {
+            for (std::thread& thread : storm) {
                 thread.join();
             }
             return;

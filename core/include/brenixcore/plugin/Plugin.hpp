@@ -72,7 +72,7 @@ public:
 
     /// Says that the device takes no more output than what is queued, while it may go on with its
     /// input: further writes are refused, and one that waits ends.
-    virtual void endOutput() = 0;
+    virtual void refuseOutput() = 0;
 
 protected:
     ~DeviceStreams() = default;
