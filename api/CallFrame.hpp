@@ -8,20 +8,25 @@
 #include "channel/Exceptions.hpp"
 #include "util/Arguments.hpp"
 
+#include <exception>
+
 namespace brenixcoder
 {
 
-/// Runs the body. On an exception runs `onFailure` inside the handler and returns 0, else 1.
+/// Runs the body and returns 1. On an exception runs `onFailure` with it, or with null if it is no
+/// std::exception, and returns 0.
 template <typename Body, typename OnFailure>
 int guarded(Body&& body, OnFailure&& onFailure) noexcept
 {
     try {
         body();
         return 1;
+    } catch (const std::exception& exception) {
+        onFailure(&exception);
     } catch (...) {
-        onFailure();
-        return 0;
+        onFailure(nullptr);
     }
+    return 0;
 }
 
 /// Runs the body with the channel and records an exception as its last error. A null channel fails
@@ -33,7 +38,8 @@ int callKeepingLastError(void* handle, Body&& body) noexcept
     if (channel == nullptr) {
         return 0;
     }
-    return guarded([&] { body(*channel); }, [&] { channel->recordLastError(); });
+    return guarded([&] { body(*channel); },
+                   [&](const std::exception* exception) { channel->recordLastError(exception); });
 }
 
 /// The call frame: clears the channel's last error first.
@@ -56,8 +62,8 @@ int callStream(void* handle, Body&& body) noexcept
 }
 
 /// The call frame for a query, whose answer is written only when there is one.
-template <typename Value, typename Query>
-int queryStream(void* handle, Value* answer, const char* argument, Query query) noexcept
+template <auto query, typename Value>
+int queryStream(void* handle, Value* answer, const char* argument) noexcept
 {
     // cppcheck-suppress throwInNoexceptFunction ; the frame catches what the body throws
     return callStream(handle, [&](Stream& stream) {

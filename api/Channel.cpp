@@ -19,10 +19,10 @@ void* coderChannelCreate(const char* devicePath, const char* converterPath, char
             channel = new Channel(device, converter, toUint64Saturated(firstLimit),
                                   toUint64Saturated(secondLimit));
         },
-        [&] {
+        [&](const std::exception* exception) {
             ErrorText id;
             ErrorText message;
-            translateCurrentException(id, message);
+            translateException(exception, id, message);
             if (errorId != nullptr) {
                 copyToBuffer(id.view(), errorId, errorBufferSize);
             }

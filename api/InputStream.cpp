@@ -48,6 +48,7 @@ int coderInputStreamReadBufferData(void* stream, int32_t bufferIndex, int32_t fi
 
 void coderInputStreamFreeBuffer(void* stream, int32_t bufferIndex) noexcept
 {
-    callStream(stream,
-               [&](Stream& s) { guarded([&] { input(s).freeBuffer(bufferIndex); }, [] {}); });
+    callStream(stream, [&](Stream& s) {
+        guarded([&] { input(s).freeBuffer(bufferIndex); }, [](const std::exception*) {});
+    });
 }

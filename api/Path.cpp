@@ -10,6 +10,7 @@ void coderComputeAbsolutePath(const char* path, char* absolutePath) noexcept
         return;
     }
     std::string result;
-    guarded([&] { result = to_string(canonical(to_ustring(path), u"")); }, [] {});
+    guarded([&] { result = to_string(canonical(to_ustring(path), u"")); },
+            [](const std::exception*) {});
     copyToBuffer(result, absolutePath, CODER_PATH_SIZE);
 }

@@ -12,32 +12,32 @@ void* coderStreamGetChannel(void* stream) noexcept
 
 int coderStreamIsSupported(void* stream, uint8_t* supported) noexcept
 {
-    return queryStream(stream, supported, "supported", &Stream::isSupported);
+    return queryStream<&Stream::isSupported>(stream, supported, "supported");
 }
 
 int coderStreamIsDeviceDone(void* stream, uint8_t* done) noexcept
 {
-    return queryStream(stream, done, "done", &Stream::isDeviceDone);
+    return queryStream<&Stream::isDeviceDone>(stream, done, "done");
 }
 
 int coderStreamIsOpen(void* stream, uint8_t* open) noexcept
 {
-    return queryStream(stream, open, "open", &Stream::isOpen);
+    return queryStream<&Stream::isOpen>(stream, open, "open");
 }
 
 int coderStreamGetCountDimension(void* stream, double* dimension) noexcept
 {
-    return queryStream(stream, dimension, "dimension", &Stream::getCountDimension);
+    return queryStream<&Stream::getCountDimension>(stream, dimension, "dimension");
 }
 
 int coderStreamGetDataAvailable(void* stream, double* available) noexcept
 {
-    return queryStream(stream, available, "available", &Stream::getDataAvailable);
+    return queryStream<&Stream::getDataAvailable>(stream, available, "available");
 }
 
 int coderStreamGetSpaceAvailable(void* stream, double* space) noexcept
 {
-    return queryStream(stream, space, "space", &Stream::getSpaceAvailable);
+    return queryStream<&Stream::getSpaceAvailable>(stream, space, "space");
 }
 
 int coderStreamFlush(void* stream) noexcept

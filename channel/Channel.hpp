@@ -10,6 +10,7 @@
 
 #include <cstdarg>
 #include <cstdint>
+#include <exception>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -60,9 +61,13 @@ public:
     void getPropertyValue(const std::string& name, const std::string& typeName, int capacity,
                           va_list* rest);
 
-    void clearLastError() noexcept;
-    /// Stores the exception in flight. Only inside a catch handler.
-    void recordLastError() noexcept;
+    void clearLastError() noexcept
+    {
+        lastErrorId.clear();
+        lastErrorMessage.clear();
+    }
+    /// Stores what ended a call; null stands for what is no std::exception.
+    void recordLastError(const std::exception* exception) noexcept;
     void getLastError(ErrorText& id, ErrorText& message) const noexcept;
 
     bool hasSyncError() const noexcept;

@@ -5,21 +5,15 @@
 namespace brenixcoder
 {
 
-void Channel::clearLastError() noexcept
+void Channel::recordLastError(const std::exception* exception) noexcept
 {
-    lastErrorId.clear();
-    lastErrorMessage.clear();
-}
-
-void Channel::recordLastError() noexcept
-{
-    translateCurrentException(lastErrorId, lastErrorMessage);
+    translateException(exception, lastErrorId, lastErrorMessage);
 }
 
 void Channel::getLastError(ErrorText& id, ErrorText& message) const noexcept
 {
-    id = lastErrorId;
-    message = lastErrorMessage;
+    id = lastErrorId.view();
+    message = lastErrorMessage.view();
 }
 
 bool Channel::hasSyncError() const noexcept
@@ -29,8 +23,8 @@ bool Channel::hasSyncError() const noexcept
 
 void Channel::getLastSyncError(ErrorText& id, ErrorText& message) noexcept
 {
-    id = syncErrorId;
-    message = syncErrorMessage;
+    id = syncErrorId.view();
+    message = syncErrorMessage.view();
     syncErrorId.clear();
     syncErrorMessage.clear();
 }
@@ -50,8 +44,8 @@ bool Channel::hasAsyncError() noexcept
 void Channel::getLastAsyncError(ErrorText& id, ErrorText& message) noexcept
 {
     const std::lock_guard lock(asyncErrorMutex);
-    id = asyncErrorId;
-    message = asyncErrorMessage;
+    id = asyncErrorId.view();
+    message = asyncErrorMessage.view();
     asyncErrorId.clear();
     asyncErrorMessage.clear();
 }

@@ -5,10 +5,54 @@
 
 #include <algorithm>
 #include <cstring>
-#include <exception>
+#include <iterator>
+#include <typeinfo>
 
 namespace brenixcoder
 {
+
+namespace
+{
+
+/// The identifier of a class of exceptions, whose message is not passed on.
+struct Translation {
+    const std::type_info& type;
+    bool (*isBaseOf)(const std::exception& exception);
+    std::string_view id;
+};
+
+template <typename Exception>
+constexpr Translation translated(std::string_view id)
+{
+    return {typeid(Exception),
+            [](const std::exception& exception) {
+                return dynamic_cast<const Exception*>(&exception) != nullptr;
+            },
+            id};
+}
+
+// A plug-in's own error is the channel's synchronous error.
+constexpr Translation translations[] = {
+    translated<PluginException>(""),
+    translated<InputStreamNotSupported>("brenix:InputStream:notSupported"),
+    translated<OutputStreamNotSupported>("brenix:OutputStream:notSupported"),
+    translated<brenixcore::CouldNotLoadDevice>("brenix:Channel:couldNotLoadDevice"),
+    translated<brenixcore::CouldNotLoadConverter>("brenix:Channel:couldNotLoadConverter"),
+    translated<brenixcore::CouldNotLoadFilter>("brenix:Stream:couldNotLoadFilter"),
+    translated<brenixcore::CouldNotCreateDevice>("brenix:Channel:couldNotCreateDevice"),
+    translated<brenixcore::CouldNotCreateConverter>("brenix:Channel:couldNotCreateConverter"),
+    translated<brenixcore::CouldNotCreateFilter>("brenix:Stream:couldNotCreateFilter"),
+    translated<brenixcore::SynchronousInputNotPossible>(
+        "brenix:InputStream:synchronousInputNotPossible"),
+    translated<brenixcore::SynchronousOutputNotPossible>(
+        "brenix:OutputStream:synchronousOutputNotPossible"),
+    translated<brenixcore::CouldNotConvertInputData>("brenix:InputStream:couldNotConvertInputData"),
+    translated<brenixcore::CouldNotConvertOutputData>(
+        "brenix:OutputStream:couldNotConvertOutputData"),
+    translated<brenixcore::CannotAddFilterWhileOpen>("brenix:Stream:cannotAddFilterWhileOpen"),
+};
+
+} // namespace
 
 void copyToBuffer(std::string_view text, char* destination, std::size_t size) noexcept
 {
@@ -17,47 +61,27 @@ void copyToBuffer(std::string_view text, char* destination, std::size_t size) no
     destination[length] = '\0';
 }
 
-void translateCurrentException(ErrorText& id, ErrorText& message) noexcept
+void translateException(const std::exception* exception, ErrorText& id, ErrorText& message) noexcept
 {
-    id.clear();
-    message.clear();
-    try {
-        // cppcheck-suppress rethrowNoCurrentException ; called inside a handler
-        throw;
-    } catch (const PluginException&) {
-        // The plug-in's own error is the channel's synchronous error.
-    } catch (const InputStreamNotSupported&) {
-        id = "brenix:InputStream:notSupported";
-    } catch (const OutputStreamNotSupported&) {
-        id = "brenix:OutputStream:notSupported";
-    } catch (const brenixcore::CouldNotLoadDevice&) {
-        id = "brenix:Channel:couldNotLoadDevice";
-    } catch (const brenixcore::CouldNotLoadConverter&) {
-        id = "brenix:Channel:couldNotLoadConverter";
-    } catch (const brenixcore::CouldNotLoadFilter&) {
-        id = "brenix:Stream:couldNotLoadFilter";
-    } catch (const brenixcore::CouldNotCreateDevice&) {
-        id = "brenix:Channel:couldNotCreateDevice";
-    } catch (const brenixcore::CouldNotCreateConverter&) {
-        id = "brenix:Channel:couldNotCreateConverter";
-    } catch (const brenixcore::CouldNotCreateFilter&) {
-        id = "brenix:Stream:couldNotCreateFilter";
-    } catch (const brenixcore::SynchronousInputNotPossible&) {
-        id = "brenix:InputStream:synchronousInputNotPossible";
-    } catch (const brenixcore::SynchronousOutputNotPossible&) {
-        id = "brenix:OutputStream:synchronousOutputNotPossible";
-    } catch (const brenixcore::CouldNotConvertInputData&) {
-        id = "brenix:InputStream:couldNotConvertInputData";
-    } catch (const brenixcore::CouldNotConvertOutputData&) {
-        id = "brenix:OutputStream:couldNotConvertOutputData";
-    } catch (const brenixcore::CannotAddFilterWhileOpen&) {
-        id = "brenix:Stream:cannotAddFilterWhileOpen";
-    } catch (const std::exception& exception) {
-        id = "brenix:Channel:unexpectedException";
-        message = exception.what();
-    } catch (...) {
-        id = "brenix:Channel:unexpectedException";
+    id = "brenix:Channel:unexpectedException";
+    if (exception == nullptr) {
         message = "Unrecognized error.";
+        return;
+    }
+    // Nearly always it is of just one of these classes, and to compare is less than to cast.
+    const auto* found = std::find_if(
+        std::begin(translations), std::end(translations),
+        [&](const Translation& translation) { return typeid(*exception) == translation.type; });
+    if (found == std::end(translations)) {
+        found = std::find_if(
+            std::begin(translations), std::end(translations),
+            [&](const Translation& translation) { return translation.isBaseOf(*exception); });
+    }
+    if (found == std::end(translations)) {
+        message = exception->what();
+    } else {
+        id = found->id;
+        message.clear();
     }
 }
 

@@ -3,6 +3,7 @@
 
 #include <array>
 #include <cstddef>
+#include <exception>
 #include <string_view>
 
 namespace brenixcoder
@@ -34,15 +35,16 @@ public:
 
 private:
     std::size_t length = 0;
-    std::array<char, errorBufferSize - 1> characters{};
+    std::array<char, errorBufferSize - 1> characters; ///< of which `length` are set
 };
 
 /// Copies a text into a caller's buffer of `size` bytes: at most size - 1 bytes and a NUL. A NUL in
 /// the text ends it; the rest of its bytes are then NUL as well. Bytes after them are left alone.
 void copyToBuffer(std::string_view text, char* destination, std::size_t size) noexcept;
 
-/// Turns the exception in flight into an identifier and a message. Only inside a catch handler.
-void translateCurrentException(ErrorText& id, ErrorText& message) noexcept;
+/// Turns an exception into an identifier and a message; null stands for what is no std::exception.
+void translateException(const std::exception* exception, ErrorText& id,
+                        ErrorText& message) noexcept;
 
 } // namespace brenixcoder
 

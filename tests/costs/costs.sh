@@ -12,15 +12,16 @@ trap 'rm -r "$dumps"' EXIT
 
 valgrind --quiet --tool=callgrind --callgrind-out-file="$dumps/dump" "$1" >"$dumps/allocations"
 
-# A dump names its objects (ob=) and lists the costs of their code by line; the line behind a calls=
-# is what the callee cost.
+# A dump names the object of the code (ob=) and lists the costs by line; the line behind a calls= is
+# what the callee cost. An object has its full name only where it, as caller or callee (cob=), is
+# first named.
 mapfile -t files < <(printf '%s\n' "$dumps"/dump.* | sort --version-sort)
 awk '
     FILENAME ~ /allocations$/         { allocations[$1] = $2 }
     /^desc: Trigger: Client Request:/ { name = $NF; order[++calls] = name }
-    /^ob=/          { split($0, part, /[()]/)
-                      if ($0 ~ / /) { object[part[2]] = $0 }
-                      ours = object[part[2]] ~ /brenixcoder-on-null-core/ }
+    /^c?ob=/        { split($0, part, /[()]/)
+                      if ($0 ~ / /) { object[part[2]] = $0 } }
+    /^ob=/          { ours = object[part[2]] ~ /brenixcoder-on-null-core/ }
     /^calls=/       { getline; next }
     /^[-+*0-9]/ && ours { split($0, cost, " "); own[name] += cost[2] }
     END {
@@ -36,8 +37,8 @@ fi
 awk '
     FNR == NR { allocations[$1] = $2; instructions[$1] = $3; ++expected; next }
     {
-        off = $3 / instructions[$1] - 1
-        if (!($1 in instructions) || $2 != allocations[$1] || off > 0.05 || off < -0.05) {
+        off = $3 - instructions[$1]
+        if ($2 != allocations[$1] || (off < 0 ? -off : off) > 0.05 * instructions[$1]) {
             printf "%s: %d allocations and %d instructions, not %d and %d\n",
                    $1, $2, $3, allocations[$1], instructions[$1]
             failed = 1
