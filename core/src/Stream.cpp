@@ -56,10 +56,14 @@ void Stream::Impl::push(plugin::Packet packet)
 {
     Packets pushed;
     pushed.push_back({std::move(packet)});
-    const std::lock_guard lock(mutex);
+    std::unique_lock lock(mutex);
     pending.splice(pending.end(), pushed);
     refill();
-    changed.notify_all();
+    const bool ends = wanted > 0 && counts >= wanted; // the wait of a read
+    lock.unlock();
+    if (ends) {
+        changed.notify_all();
+    }
 }
 
 void Stream::Impl::refill()
@@ -100,16 +104,17 @@ std::optional<plugin::Packet> Stream::Impl::pull(bool waits)
     plugin::Packet packet = std::move(packets.front().packet);
     packets.pop_front();
     counts -= packet.counts;
+    lock.unlock();
     changed.notify_all();
     return packet;
 }
 
 void Stream::Impl::notifyDevice(std::unique_lock<std::mutex>& lock)
 {
-    changed.notify_all();
-    const bool isThere = phase != Phase::Closed;
+    const bool running = phase != Phase::Closed;
     lock.unlock();
-    if (isThere) {
+    changed.notify_all();
+    if (running) {
         device.wake();
     }
 }
@@ -165,8 +170,10 @@ Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
         wanted = 0;
         throw;
     }
-    notifyDevice(lock);
-    lock.lock();
+    if (counts < count) { // the device may be waiting for this
+        notifyDevice(lock);
+        lock.lock();
+    }
     wait(lock, [&] { return counts >= count; });
     wanted = 0;
     if (counts < count) {

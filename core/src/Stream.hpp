@@ -90,6 +90,9 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     void wait(std::unique_lock<std::mutex>& lock, const Condition& condition)
     {
         const auto over = [&] { return condition() || !isFlowing(); };
+        if (over()) {
+            return; // without a look at the clock
+        }
         if (timeout) {
             changed.wait_for(lock, *timeout, over);
         } else {
@@ -100,7 +103,8 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     /// Moves from `pending` to `packets` what has room. When it throws, the rest stays. Under the mutex.
     void refill();
 
-    /// Tells both sides of a change that the caller's made. Unlocks the mutex.
+    /// Tells both sides of a change that the caller's made. Unlocks the mutex first, so that who
+    /// wakes finds it free.
     void notifyDevice(std::unique_lock<std::mutex>& lock);
 
     /// Takes the `count` oldest counts: waits for them, or throws SynchronousInputNotPossible.
