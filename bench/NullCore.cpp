@@ -23,8 +23,9 @@ void* makeDataBuffer(std::size_t fields, std::size_t elements)
     brenixplugin::OwnedDataBuffer buffer(new PropertyMap);
     for (std::size_t i = 0; i < fields; ++i) {
         const std::string name = numbered("data", i);
-        storeProperty(*buffer, name,
-                      makeArray(name, std::make_unique<double[]>(elements), elements));
+        auto data = std::make_unique<double[]>(elements);
+        nullCore().lastElements = data.get();
+        storeProperty(*buffer, name, makeArray(name, std::move(data), elements));
     }
     return buffer.release();
 }

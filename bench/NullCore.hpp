@@ -15,7 +15,8 @@ struct NullCore {
     std::size_t properties = 1;         ///< how many init() delivers: doubles "p0", "p1", ...
     std::vector<void*> stock;           ///< data buffers; read() of n counts hands over the last n
     std::vector<unsigned long> waiting; ///< what peekCounts() lists
-    bool fails = false;                 ///< whether flush() throws
+    const double* lastElements = nullptr; ///< of the array that was made last
+    bool fails = false;                   ///< whether flush() throws
     std::unique_ptr<brenixcore::InputStream> input;
     std::unique_ptr<brenixcore::OutputStream> output;
 };

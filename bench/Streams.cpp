@@ -1,0 +1,121 @@
+// Data through the whole library, and through its peers, side by side. Run it on one processor and on
+// two: what two threads on two processors take depends on where the machine has put them.
+
+#include "Peers.hpp"
+
+#include <benchmark/benchmark.h>
+
+#include <fstream>
+#include <memory>
+#include <numeric>
+
+namespace
+{
+
+using namespace peers;
+using benchmark::State;
+
+/// Blocks there and back, as many on their way as wanted or as the peer holds.
+template <typename Peer>
+void echo(State& state, std::size_t elements, std::size_t inFlight, std::size_t batch)
+{
+    std::vector<double> out(elements);
+    std::iota(out.begin(), out.end(), 1.0);
+    std::vector<double> in(elements);
+    Peer peer(elements);
+    const std::size_t most = std::clamp(peer.capacity, 1UL, inFlight);
+    std::size_t flying = 0;
+    for (auto _ : state) {
+        peer.send(out.data());
+        if (++flying == most) {
+            peer.receive(in.data());
+            --flying;
+        }
+    }
+    for (; flying > 0; --flying) {
+        peer.receive(in.data());
+    }
+    require(in == out, "the blocks came back changed");
+    state.SetBytesProcessed(state.iterations() * static_cast<int64_t>(peer.bytes * batch));
+}
+
+template <typename Peer>
+void add(const std::string& name, std::size_t elements, std::size_t inFlight, std::size_t batch = 1)
+{
+    benchmark::RegisterBenchmark(name.c_str(), [=](State& state) {
+        echo<Peer>(state, elements, inFlight, batch);
+    })->UseRealTime();
+}
+
+void addPeers(const std::string& row, std::size_t elements, std::size_t inFlight)
+{
+    add<VectorQueue>(row + "/queue", elements, inFlight);
+#ifdef BENCH_ZMQ
+    add<Zmq>(row + "/zmq", elements, inFlight);
+#endif
+#ifdef BENCH_NNG
+    add<Nng>(row + "/nng", elements, inFlight);
+#endif
+#ifdef BENCH_GSTREAMER
+    add<Gstreamer>(row + "/gstreamer", elements, inFlight);
+#endif
+    add<SocketPair>(row + "/socketpair", elements, inFlight);
+    add<Pipe>(row + "/pipe", elements, inFlight);
+}
+
+/// Pages of the process that are in memory.
+double residentBytes()
+{
+    std::size_t total = 0;
+    std::size_t resident = 0;
+    std::ifstream("/proc/self/statm") >> total >> resident;
+    return static_cast<double>(resident) * static_cast<double>(sysconf(_SC_PAGESIZE));
+}
+
+/// From create to destroy.
+void cycle(State& state)
+{
+    for (auto _ : state) {
+        const OpenChannel channel;
+    }
+}
+
+/// Memory of channels that are open and idle, with what their threads touch of their stacks.
+void idle(State& state)
+{
+    constexpr std::size_t count = 1000;
+    for (auto _ : state) {
+        const double before = residentBytes();
+        std::vector<std::unique_ptr<OpenChannel>> channels;
+        for (std::size_t i = 0; i < count; ++i) {
+            channels.push_back(std::make_unique<OpenChannel>());
+        }
+        state.counters["residentBytes"] = (residentBytes() - before) / count;
+    }
+}
+
+} // namespace
+
+int main(int argc, char** argv)
+{
+    add<Loopback<1>>("roundTrip/ours", 1, 1);
+    addPeers("roundTrip", 1, 1);
+    for (const std::size_t bytes : {64UL, 4UL << 10, 64UL << 10, 1UL << 20}) {
+        const std::string row = "echo/" + std::to_string(bytes);
+        add<Loopback<1>>(row + "/ours", bytes / sizeof(double), 16);
+        addPeers(row, bytes / sizeof(double), 16);
+    }
+    // As many blocks on their way, which the peers take one by one.
+    constexpr std::size_t batch = 64;
+    add<Loopback<batch>>("echo/64x64/ours", 64 / sizeof(double), 16, batch);
+    addPeers("echo/64x64", 64 / sizeof(double), 16 * batch);
+    benchmark::RegisterBenchmark("channel/cycle", cycle)->UseRealTime();
+    benchmark::RegisterBenchmark("channel/idle", idle)->UseRealTime()->Iterations(1);
+
+    benchmark::Initialize(&argc, argv);
+    if (benchmark::ReportUnrecognizedArguments(argc, argv)) {
+        return 1;
+    }
+    benchmark::RunSpecifiedBenchmarks();
+    return 0;
+}
