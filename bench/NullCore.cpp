@@ -30,6 +30,7 @@ void* makeDataBuffer(std::size_t fields, std::size_t elements)
     return buffer.release();
 }
 
+// NOLINTBEGIN(readability-convert-member-functions-to-static): the contract says what they are
 namespace brenixcore
 {
 
@@ -168,3 +169,4 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
 }
 
 } // namespace brenixcore
+// NOLINTEND(readability-convert-member-functions-to-static)
