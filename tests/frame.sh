@@ -32,6 +32,6 @@ for function in $functions; do
     grep -qE "CODER_API [^;]*\b$function\(.*\) CODER_NOEXCEPT *$" <<<"$declarations" ||
         complain "$function is not declared CODER_NOEXCEPT"
     [[ $body == *") noexcept"$'\n{'* ]] || complain "$function is not noexcept"
-    [[ $helper == none || $body == *"$helper("* ]] || complain "$function does not use $helper"
+    [[ $helper == none || $body == *"$helper"[\(\<]* ]] || complain "$function does not use $helper"
 done
 exit $status
