@@ -49,7 +49,7 @@ bool isLoaded(const std::string& path)
 
 TEST(LoadTest, ErrorsSayWhatWasTriedAndWhy)
 {
-    const std::string text = testing::TempDir() + "text.so";
+    const std::string text = testing::TempDir() + "longText.so";
     std::ofstream(text) << "This is a text and not a shared library, though it is as long as one.";
     std::ifstream probeFile(testPlugins + "probe.so", std::ios::binary);
     std::string bytes(std::istreambuf_iterator<char>(probeFile), {});
