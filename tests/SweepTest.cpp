@@ -199,13 +199,18 @@ protected:
     const std::string file = testing::TempDir() + "sweep-" + std::to_string(getpid()) + ".wav";
     const std::string host = "127.1." + std::to_string(getpid() >> 8 & 255) + "." +
                              std::to_string(getpid() & 255); // of this process alone
-    const int counts[2] = {7, 1}, port = 47110, block = 4, frames = 8, channels = 2;
+    const int large[2] = {7, 1}, uneven[2] = {3, 5}, port = 47110, block = 4, frames = 8,
+              channels = 2;
 
     /// The devices, converters and filters.
     const std::vector<Program> programs = {
         {probe.c_str(), "identity", pickyFilter.c_str(), 4, 0, 4, "data",
          [this](void* channel) {
-             return coderChannelInit(channel, 1, CODER_OPTION("Packets", "int32", 2, counts));
+             return coderChannelInit(channel, 1, CODER_OPTION("Packets", "int32", 2, large));
+         }},
+        {probe.c_str(), "identity", nullptr, infinity, 0, 4, "data",
+         [this](void* channel) {
+             return coderChannelInit(channel, 1, CODER_OPTION("Packets", "int32", 2, uneven));
          }},
         {"loopback", "identity", "decimate", infinity, 8, 2, "data",
          [](void* channel) { return coderChannelInit(channel, 0); }},

@@ -41,6 +41,7 @@ public:
     DeviceInfo init(const PropertyMap& optionMap, PropertyMap& properties,
                     DeviceHost& deviceHost) override
     {
+        enter(isInitialised);
         host = &deviceHost;
         Options options(optionMap);
         failIn = options.text("FailIn").value_or("");
@@ -70,10 +71,16 @@ public:
         for (long left = options.wholeNumber("Threads", 0, 9).value_or(0); left > 0; --left) {
             threads.emplace_back([this] { report(); });
         }
+        isInitialised = true;
         return info;
     }
 
-    void open(const PropertyMap& /*options*/) override { reach("open"); }
+    void open(const PropertyMap& /*options*/) override
+    {
+        enter(isOpen);
+        reach("open");
+        isOpen = true;
+    }
 
     /// Pushes packets of running numbers in "data", with a "Stamp", seven numbers "Odd" and the
     /// "Address" of the numbers each; then takes all output.
@@ -148,9 +155,15 @@ public:
         }).join();
     }
 
-    void close() override { reach("close"); }
+    void close() override
+    {
+        isOpen = false;
+        reach("close");
+    }
+
     void term() override
     {
+        isInitialised = false;
         ending = true;
         for (std::thread& thread : threads) {
             thread.join();
@@ -160,6 +173,13 @@ public:
     }
 
 private:
+    static void enter(bool isThere)
+    {
+        if (isThere) {
+            throw std::logic_error("init or open came twice");
+        }
+    }
+
     /// Reports property values, warnings, and errors with one text for both of their parts.
     void report()
     {
@@ -215,6 +235,8 @@ private:
     std::string raiseIn;
     std::vector<int> packets;
     bool hasOutput = false;
+    bool isInitialised = false;
+    bool isOpen = false;
     std::atomic<bool> ending = false;
     std::atomic<int> reports = 0;
     std::vector<std::thread> threads;
