@@ -131,13 +131,15 @@ TEST(StateTest, FailuresAndErrorsOfEachOperationReachTheCaller)
             {"silent", unexpected},
             {"long", (failed + std::string(5000, '!')).substr(0, unexpected.size() + 1023)},
             {"raised", "|"}};
-        for (const auto& [as, error] : rows) {
+        for (const auto& row : rows) {
+            const auto& [as, error] = row;
             SCOPED_TRACE(last + " " + as);
             const bool raises = as == "raised";
             Channel channel(probe);
             const std::function<int()> steps[] = {
                 [&] {
-                    return initProbe(channel, "i", {}, raises ? "" : last, raises ? last : "", as);
+                    return initProbe(channel, "i", {}, raises ? "" : last, raises ? last : "",
+                                     row.first);
                 },
                 [&] { return channel.open(); },
                 [&] { return coderChannelExecute(channel.handle, "updateFromThread", 0); },
