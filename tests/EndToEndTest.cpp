@@ -288,6 +288,27 @@ TEST(EventTest, AFailureOfTheDevicesThreadIsAnError)
     }
 }
 
+TEST(EventTest, SlowAndEarlyEnds)
+{
+    Channel channel(probe);
+    for (const std::string failAs : {"slow", "early"}) {
+        SCOPED_TRACE(failAs);
+        const bool slow = failAs == "slow";
+        ASSERT_EQ(initProbe(channel, "i", {}, slow ? "run" : "", "", failAs), 1);
+        ASSERT_EQ(channel.open(), 1);
+        const auto begin = std::chrono::steady_clock::now();
+        if (!slow) {
+            channel.waitForEnd();
+        }
+        EXPECT_EQ(coderChannelClose(channel.handle), 1) << channel.error();
+        const auto time = std::chrono::steady_clock::now() - begin;
+        EXPECT_GE(time, std::chrono::milliseconds(slow ? 290 : 0)); // close waits for the device
+        uint8_t failed = 1;
+        EXPECT_EQ(coderChannelHasAsyncError(channel.handle, &failed), 1);
+        EXPECT_EQ(failed, 0);
+    }
+}
+
 TEST(EventTest, StormsAndStreamsAfterTheEnd)
 {
     Channel channel(probe, 4);

@@ -5,6 +5,7 @@
 #include "brenixcore/plugin/Plugin.hpp"
 
 #include <atomic>
+#include <chrono>
 #include <memory>
 #include <stdexcept>
 #include <string>
@@ -33,7 +34,7 @@ struct UnknownProperty : interfaces::IPropertyInfo {
 
 /// Options: Packets (counts of the packets to push, as int32; of those below 0 each is a mistake of
 /// its own), Streams ("i", "o", "io", ""), FailIn and RaiseIn (an operation: init, open, run, execute,
-/// close, term), FailAs (what is thrown: "", "int", "own", "silent", "long"), Threads (how
+/// close, term), FailAs (what is thrown: "", "int", "own", "silent", "long"; or "slow"), Threads (how
 /// many report things from init to term).
 class Probe : public Device
 {
@@ -198,6 +199,10 @@ private:
             host->raise("error", "probe:raised", operation.c_str());
         }
         if (operation == failIn) {
+            if (failAs == "slow") {
+                std::this_thread::sleep_for(std::chrono::milliseconds(300));
+                return;
+            }
             if (failAs == "int") {
                 throw 5;
             }
