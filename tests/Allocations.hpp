@@ -69,7 +69,11 @@ void sweep(const Point& point)
 
 /// Says so at the end of a test.
 struct PrintPoints {
-    ~PrintPoints() { std::printf("%ld allocations failed\n", std::exchange(points, 0)); }
+    ~PrintPoints()
+    {
+        EXPECT_GT(points, 0);
+        std::printf("%ld allocations failed\n", std::exchange(points, 0));
+    }
 };
 
 } // namespace allocations

@@ -295,10 +295,12 @@ TEST(EventTest, SlowAndEarlyEnds)
         SCOPED_TRACE(failAs);
         const bool slow = failAs == "slow";
         ASSERT_EQ(initProbe(channel, "i", {}, slow ? "run" : "", "", failAs), 1);
-        ASSERT_EQ(channel.open(), 1);
         const auto begin = std::chrono::steady_clock::now();
+        ASSERT_EQ(channel.open(), 1);
         if (!slow) {
             channel.waitForEnd();
+            EXPECT_EQ(channel.read(1, 1), Numbers{});
+            EXPECT_EQ(channel.error(), noInput);
         }
         EXPECT_EQ(coderChannelClose(channel.handle), 1) << channel.error();
         const auto time = std::chrono::steady_clock::now() - begin;

@@ -27,11 +27,12 @@ functions=$(nm --dynamic --defined-only --format=posix "$library" | awk '/^coder
 [[ -n $functions ]] || complain "$library exports no function"
 for function in $functions; do
     helper=$(sed -nE "s/^(\w+) .*\b${function#coder}\b.*/\1/p" <<<"$rows")
-    body=$(sed -n "/^[a-z].*[ *]$function(/,/^}/p" "$sources"/api/*.cpp)
+    body=$(sed -n "/^[a-z].*[ *]$function(/,/^}/p" "$sources"/api/*.cpp | sed 's,//.*,,')
     [[ -n $helper ]] || complain "$function has no row"
     grep -qE "CODER_API [^;]*\b$function\(.*\) CODER_NOEXCEPT *$" <<<"$declarations" ||
         complain "$function is not declared CODER_NOEXCEPT"
     [[ $body == *") noexcept"$'\n{'* ]] || complain "$function is not noexcept"
+    [[ $helper == none || $body != *')->'* ]] || complain "$function calls past $helper"
     [[ $helper == none || $body == *"$helper"[\(\<]* ]] || complain "$function does not use $helper"
 done
 exit $status

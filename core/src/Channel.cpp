@@ -201,8 +201,8 @@ std::optional<plugin::Packet> Channel::Impl::leave(bool waits)
         throw std::logic_error("The device pulled a packet but has no output stream.");
     }
     auto packet = output->impl->pull(waits);
-    if (!packet && input && closing) {
-        input->impl->setPhase(Phase::Stopping); // nothing more will come of the output
+    if (!packet && input) {
+        input->impl->endDraining(); // nothing more will come of the output
     }
     return packet;
 }

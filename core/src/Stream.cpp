@@ -25,6 +25,15 @@ void Stream::Impl::setPhase(Phase newPhase)
     changed.notify_all();
 }
 
+void Stream::Impl::endDraining()
+{
+    const std::lock_guard lock(mutex);
+    if (phase == Phase::Draining) {
+        phase = Phase::Stopping;
+        changed.notify_all();
+    }
+}
+
 void Stream::Impl::setDeviceDone()
 {
     const std::lock_guard lock(mutex);

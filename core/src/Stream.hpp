@@ -61,6 +61,9 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     void setPhase(Phase newPhase);
     void setDeviceDone();
 
+    /// Draining becomes stopping; any other phase stays.
+    void endDraining();
+
     /// How long read and write wait: seconds, infinity for ever.
     void setTimeout(double seconds);
 

@@ -3,7 +3,12 @@
 #include "brenixcoder/coder.h"
 #include "brenixplugin/Property.hpp"
 
+#include <type_traits>
+
 static_assert(noexcept(coderChannelInit(nullptr, 0)));
+
+// Every data buffer is one, though no function of the library names it.
+static_assert(std::is_same_v<brenixplugin::PropertyMap, std::map<std::string, void*>>);
 
 namespace device = brenixplugin::kit::device;
 
