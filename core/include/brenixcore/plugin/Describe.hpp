@@ -15,19 +15,19 @@ namespace brenixcore::plugin
 
 /// One option. Tables end with a null name; no other text of theirs is null.
 struct OptionInfo {
-    const char* name;
+    const char* name;         ///< under which it is given
     const char* type;         ///< what it must be: "text", "number", "whole number"
     const char* unit;         ///< empty when it has none
     const char* defaultValue; ///< "(required)" when it must be given
-    const char* meaning;
+    const char* meaning;      ///< in a few words
 };
 
-/// One property of a device, all as above; `type` is the type name under which it is read.
+/// One property of a device. Tables end as those of options do.
 struct PropertyInfo {
-    const char* name;
-    const char* type;
-    const char* unit;
-    const char* meaning;
+    const char* name;    ///< under which it is read
+    const char* type;    ///< the type name with which it is read
+    const char* unit;    ///< empty when it has none
+    const char* meaning; ///< in a few words
 };
 
 /// The table of a plug-in that has no options.
@@ -35,13 +35,15 @@ constexpr OptionInfo noOptions[] = {{}};
 
 } // namespace brenixcore::plugin
 
-/// Exports a table, which must have static storage.
+/// Exports a table of options, which must have static storage.
 #define BRENIXCORE_DESCRIBE_OPTIONS(table)                                                         \
     extern "C" BRENIXCORE_PLUGIN_SHARED const brenixcore::plugin::OptionInfo*                      \
     brenixcorePluginOptions()                                                                      \
     {                                                                                              \
         return table;                                                                              \
     }
+
+/// Exports a table of properties, which must have static storage.
 #define BRENIXCORE_DESCRIBE_PROPERTIES(table)                                                      \
     extern "C" BRENIXCORE_PLUGIN_SHARED const brenixcore::plugin::PropertyInfo*                    \
     brenixcorePluginProperties()                                                                   \

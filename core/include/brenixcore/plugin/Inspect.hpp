@@ -4,6 +4,8 @@
 #ifndef BRENIXCORE_PLUGIN_INSPECT_HPP
 #define BRENIXCORE_PLUGIN_INSPECT_HPP
 
+#include "brenixcore/plugin/Plugin.hpp"
+
 #include <string>
 #include <vector>
 
@@ -12,13 +14,14 @@ namespace brenixcore::plugin
 
 /// A row of a plug-in's description: OptionInfo, or PropertyInfo, which has no default.
 struct DescribedValue {
-    std::string name;
-    std::string type;
-    std::string unit;
-    std::string defaultValue;
-    std::string meaning;
+    std::string name;         ///< of the option or property
+    std::string type;         ///< as in OptionInfo and PropertyInfo
+    std::string unit;         ///< empty when it has none
+    std::string defaultValue; ///< of an option
+    std::string meaning;      ///< in a few words
 };
 
+/// What is known of a plug-in.
 struct PluginReport {
     std::string path; ///< where the core looks for it
 
@@ -26,20 +29,20 @@ struct PluginReport {
     /// readable), "wrongFileType", "missingDependency", "notLoadable", "notAPlugin", "abiVersion",
     /// "noFactory" or "factoryFailed"; then `message` says what exactly.
     std::string problem;
-    std::string message;
+    std::string message; ///< why, when there is a problem
 
     std::string kind; ///< "Device", "Converter" or "Filter"; empty when it has no factory
-    bool describesOptions = false; ///< or else what its options are is not known
-    std::vector<DescribedValue> options;
-    std::vector<DescribedValue> properties;
+    bool describesOptions = false;          ///< or else what its options are is not known
+    std::vector<DescribedValue> options;    ///< in the order of the plug-in's table
+    std::vector<DescribedValue> properties; ///< the same
 };
 
 /// Loads the plug-in of a path or a bare name, makes its object and releases both. Throws only when
 /// memory runs out.
-__attribute__((visibility("default"))) PluginReport inspectPlugin(const std::string& name);
+BRENIXCORE_PLUGIN_SHARED PluginReport inspectPlugin(const std::string& name);
 
 /// The folder of the bare names, with a slash at its end.
-__attribute__((visibility("default"))) std::string pluginFolder();
+BRENIXCORE_PLUGIN_SHARED std::string pluginFolder();
 
 } // namespace brenixcore::plugin
 
