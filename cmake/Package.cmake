@@ -12,6 +12,7 @@ set(CPACK_DEBIAN_PACKAGE_DESCRIPTION
 guides for authors of code generators and of plug-ins, example programs,
 and a template for plug-ins.")
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
+set(CPACK_DEBIAN_PACKAGE_SUGGESTS "gnuplot-nox, libsndfile1-dev, bash-completion")
 set(CPACK_DEBIAN_PACKAGE_CONTROL_EXTRA ${PROJECT_SOURCE_DIR}/cmake/debian/shlibs
     ${PROJECT_SOURCE_DIR}/cmake/debian/triggers)
 include(CPack)

@@ -4,6 +4,7 @@
 #include "Calls.hpp"
 #include "Driver.hpp"
 
+#include <filesystem>
 #include <unistd.h>
 
 #include <algorithm>
@@ -270,6 +271,7 @@ TEST_F(SweepTest, EveryCall)
                 void* const handle = call.handles(channel.handle, channel.input, channel.output)[i];
                 const double unwritten = 0x1.23456789p3;
                 double answer = unwritten;
+                calls.counts = unwritten;
                 Failing failing(number, lasts);
                 const bool result = call.run(handle, &answer);
                 const bool failed = Failing::end();
@@ -277,6 +279,8 @@ TEST_F(SweepTest, EveryCall)
                 if (failed) {
                     EXPECT_TRUE(isOutOfMemory(channel.error())) << channel.error();
                     EXPECT_EQ(answer, call.resets() ? 0 : unwritten);
+                    EXPECT_EQ(calls.counts, unwritten);
+                    EXPECT_EQ(calls.buffers, 1);
                     EXPECT_TRUE(call.run(handle, &answer)) << channel.error(); // the next call
                 }
                 if (call.target == Inputs && call.operation == "read") {
@@ -292,6 +296,19 @@ TEST_F(SweepTest, EveryCall)
             });
         }
     }
+}
+
+TEST_F(SweepTest, PathsWithoutMemory)
+{
+    const std::string path = std::filesystem::current_path();
+    sweepWithoutLeak([&](long number, bool lasts) {
+        char absolute[CODER_PATH_SIZE] = "unwritten";
+        Failing failing(number, lasts);
+        coderComputeAbsolutePath(path.c_str(), absolute);
+        const bool failed = Failing::end();
+        EXPECT_EQ(absolute, failed ? "" : path);
+        return failed;
+    });
 }
 
 TEST_F(SweepTest, EveryPlugInOnEitherThread)
