@@ -91,6 +91,7 @@ void print(const std::vector<DescribedValue>& values)
 ExitCode listPlugins(const Settings& settings)
 {
     Json list = Json::array();
+    ExitCode result = Success;
     for (const std::string& name :
          settings.plugins.empty() ? installedPlugins() : settings.plugins) {
         if (settings.namesOnly) {
@@ -98,6 +99,9 @@ ExitCode listPlugins(const Settings& settings)
             continue;
         }
         const PluginReport report = brenixcore::plugin::inspectPlugin(name);
+        if (!report.problem.empty()) {
+            result = Failed;
+        }
         if (settings.json) {
             Json entry = toJson(name, report);
             entry["options"] =
@@ -123,7 +127,7 @@ ExitCode listPlugins(const Settings& settings)
             << Json({{"folder", brenixcore::plugin::pluginFolder()}, {"plugins", list}}).dump(2)
             << '\n';
     }
-    return Success;
+    return result;
 }
 
 ExitCode checkPlugins(const Settings& settings)

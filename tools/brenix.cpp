@@ -5,6 +5,8 @@
 #include <CLI/CLI.hpp>
 #include <nlohmann/json.hpp>
 
+#include <cmath>
+#include <cstdio>
 #include <functional>
 #include <iostream>
 #include <map>
@@ -44,6 +46,21 @@ void addList(CLI::App& command, const char* name, std::vector<std::string>& list
     command.add_option(name, list, help)->type_name(value)->allow_extra_args(false);
 }
 
+/// Counts cannot be divided.
+const CLI::Validator& wholeCounts()
+{
+    static const CLI::Validator check(
+        [](std::string& text) {
+            double value = 0;
+            return CLI::detail::lexical_cast(text, value) && value >= 1 && std::isfinite(value) &&
+                           value == std::floor(value)
+                       ? std::string()
+                       : text + " is not a whole number of at least 1";
+        },
+        "");
+    return check;
+}
+
 void addChannel(CLI::App& command, Settings& settings)
 {
     ChannelSettings& channel = settings.channel;
@@ -65,14 +82,14 @@ void addChannel(CLI::App& command, Settings& settings)
             [&channel](double limit) { channel.inputLimit = channel.outputLimit = limit; },
             "Counts that a stream buffers at most (default 65536)")
         ->type_name("COUNTS")
-        ->check(CLI::PositiveNumber);
+        ->check(wholeCounts());
 }
 
 void addExtent(CLI::App& command, Settings& settings)
 {
     command.add_option("-n,--counts", settings.counts, "End after so many counts")
         ->type_name("COUNTS")
-        ->check(CLI::PositiveNumber);
+        ->check(wholeCounts());
     command
         .add_option(
             "-s,--seconds", settings.seconds,
@@ -188,7 +205,11 @@ int run(int count, char** arguments)
     }
     try {
         catchInterrupts();
-        return action();
+        const ExitCode result = action();
+        if (!std::cout.flush() || std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {
+            throw Failure("", "standard output: cannot be written");
+        }
+        return result;
     } catch (const Failure& failure) {
         report(settings, failure.getId(), failure.what());
         return Failed;
