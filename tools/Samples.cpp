@@ -242,6 +242,14 @@ std::ifstream openInput(const SampleFile& file)
     return stream;
 }
 
+/// At the end of the input: whether it was its end.
+void requireRead(const std::string& file, const std::ifstream& stream)
+{
+    if (stream.bad()) {
+        fail(file == "-" ? "standard input" : file, "cannot be read");
+    }
+}
+
 class CsvReader : public SampleReader
 {
 public:
@@ -250,14 +258,17 @@ public:
     {
         if (readLine()) {
             std::string wrong;
-            header = !parseRow(type, line, first, wrong);
+            const bool isRow = parseRow(type, line, first, wrong);
+            columns = first.size() / type.size;
+            header = !isRow && !hasNumber(line);
             if (header) {
                 first.clear();
                 if (readLine()) {
                     parseLine(first);
                 }
+            } else if (!isRow) {
+                failAt(wrong);
             }
-            columns = std::max<std::size_t>(first.size() / type.size, 1);
         }
     }
 
@@ -270,12 +281,7 @@ public:
             count = 1;
         }
         for (; count < rows && readLine(); ++count) {
-            const std::size_t size = elements.size();
             parseLine(elements);
-            if (const std::size_t cells = (elements.size() - size) / type.size; cells != columns) {
-                fail(name, place() + std::to_string(cells) + " values instead of " +
-                               std::to_string(columns));
-            }
         }
         return count;
     }
@@ -290,15 +296,26 @@ private:
                 return true;
             }
         }
+        requireRead(name, stream);
         return false;
     }
 
     void parseLine(Bytes& elements)
     {
+        const std::size_t size = elements.size();
         std::string wrong;
         if (!parseRow(type, line, elements, wrong)) {
-            fail(name, place() + "not a number of type " + type.name + ": " + wrong);
+            failAt(wrong);
         }
+        if (const std::size_t cells = (elements.size() - size) / type.size; cells != columns) {
+            fail(name,
+                 place() + std::to_string(cells) + " values instead of " + std::to_string(columns));
+        }
+    }
+
+    [[noreturn]] void failAt(const std::string& cell) const
+    {
+        fail(name, place() + "not a number of type " + type.name + ": " + cell);
     }
 
     std::string place() const { return "line " + std::to_string(lineNumber) + ": "; }
@@ -329,6 +346,7 @@ public:
         elements.resize(size + rows * type.size);
         stream.read(reinterpret_cast<char*>(&elements[size]),
                     static_cast<std::streamsize>(rows * type.size));
+        requireRead(name, stream);
         const auto length = static_cast<std::size_t>(stream.gcount());
         if (length % type.size != 0) {
             fail(name, "the last element has " + std::to_string(length % type.size) + " of " +

@@ -130,6 +130,17 @@ bool parseRow(const ElementType& type, std::string_view list, Bytes& elements, s
     return ok;
 }
 
+bool hasNumber(std::string_view list)
+{
+    const ElementType& type = elementType("double");
+    bool found = false;
+    splitCommas(list, [&](std::string_view part) {
+        double value = 0;
+        found = found || type.parse(part, reinterpret_cast<unsigned char*>(&value));
+    });
+    return found;
+}
+
 std::string printElements(const ElementType& type, const Bytes& elements)
 {
     std::string text;
