@@ -157,11 +157,16 @@ void Channel::check(int result)
     }
 }
 
-std::optional<Failure> Channel::deviceError()
+bool Channel::hasDeviceError()
 {
     std::uint8_t hasError = 0;
     check(coderChannelHasAsyncError(handle, &hasError));
-    if (hasError == 0) {
+    return hasError != 0;
+}
+
+std::optional<Failure> Channel::deviceError()
+{
+    if (!hasDeviceError()) {
         return std::nullopt;
     }
     std::array<char, CODER_ERROR_SIZE> id{};
@@ -175,6 +180,26 @@ void Channel::checkDevice()
     if (const auto error = deviceError()) {
         throw Failure(*error);
     }
+}
+
+void Channel::fail(const Failure& failure)
+{
+    coderChannelClose(handle); // the device may tell its error only now
+    const auto error = deviceError();
+    if (!error) {
+        throw Failure(failure);
+    }
+    const std::string message = failure.what();
+    throw Failure(error->getId(), std::string(error->what()) + "; also: " + failure.getId() +
+                                      (failure.getId().empty() || message.empty() ? "" : ": ") +
+                                      message);
+}
+
+double Channel::inputAvailable()
+{
+    double available = 0;
+    check(coderStreamGetDataAvailable(input, &available));
+    return available;
 }
 
 bool Channel::isSupported(void* stream)

@@ -75,9 +75,15 @@ public:
     /// Throws the error of a call that returned 0.
     void check(int result);
 
-    /// The device's asynchronous error, if there is one.
+    bool hasDeviceError();
+
+    /// Takes the device's asynchronous error, if there is one.
     std::optional<Failure> deviceError();
     void checkDevice();
+
+    /// Closes and throws the failure that ended a transfer, behind the device's error if there is one:
+    /// mostly that is the reason.
+    [[noreturn]] void fail(const Failure& failure);
 
     /// The value of a property; nothing when there is none of that name and type.
     std::optional<Bytes> property(const std::string& name, const ElementType& type);
@@ -87,6 +93,8 @@ public:
     void* outputStream() const { return output; }
     bool isSupported(void* stream);
     bool isDone(void* stream);
+
+    double inputAvailable(); ///< counts that the input stream has
 
     /// Takes the next buffer, or as much of it as `most` counts, if one is there. Returns its counts.
     double nextBuffer(double most);

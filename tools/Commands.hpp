@@ -6,6 +6,7 @@
 #include "Samples.hpp"
 #include "Terminal.hpp"
 
+#include <algorithm>
 #include <chrono>
 #include <cstddef>
 #include <limits>
@@ -60,6 +61,12 @@ public:
     /// isOver(), none will.
     std::size_t next();
     bool isOver() const;
+
+    /// Ends with what the stream has now.
+    void endWithAvailable()
+    {
+        mostCounts = std::min(mostCounts, counts + channel.inputAvailable());
+    }
 
     const std::vector<Field>& getFields() const { return fields; }
     double getCounts() const { return counts; }

@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <array>
 #include <cmath>
+#include <csignal>
 #include <cstdio>
 #include <deque>
 #include <iostream>
@@ -170,6 +171,7 @@ std::string quoted(const std::string& text)
 /// Has gnuplot draw everything that was read, one plot for each channel.
 void savePicture(const Settings& settings, const std::vector<Trace>& traces, double rate)
 {
+    auto* const onPipe = std::signal(SIGPIPE, SIG_IGN); // a gnuplot that ends early is told below
     // NOLINTNEXTLINE(cert-env33-c): nothing of the command comes from outside
     std::FILE* const plot = ::popen("gnuplot", "w");
     if (plot == nullptr) {
@@ -197,7 +199,9 @@ void savePicture(const Settings& settings, const std::vector<Trace>& traces, dou
         }
     }
     std::fputs("unset multiplot\n", plot);
-    if (::pclose(plot) != 0) {
+    const int result = ::pclose(plot);
+    std::signal(SIGPIPE, onPipe);
+    if (result != 0) {
         throw Failure("", "gnuplot could not write " + settings.png + "; is it installed?");
     }
 }
@@ -225,9 +229,8 @@ void add(std::vector<Trace>& traces, const Reading& reading, std::size_t counts,
 
 double bufferFill(Channel& channel)
 {
-    double available = 0;
+    const double available = channel.inputAvailable();
     double space = 0;
-    channel.check(coderStreamGetDataAvailable(channel.inputStream(), &available));
     channel.check(coderStreamGetSpaceAvailable(channel.inputStream(), &space));
     return available > 0 ? available / (available + space) : 0;
 }

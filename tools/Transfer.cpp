@@ -92,22 +92,31 @@ ExitCode readSamples(const Settings& given)
     Progress progress(std::min(most, channel.number("Frames", "int64").value_or(INFINITY)),
                       settings.quiet);
     std::unique_ptr<SampleWriter> writer;
-    while (!reading.isOver()) {
-        if (const std::size_t counts = reading.next(); counts > 0) {
-            if (!writer) {
-                writer = openWriter(settings.file, reading.getFields());
+    double seconds = 0;
+    try {
+        bool broken = false;
+        while (!reading.isOver()) {
+            if (const std::size_t counts = reading.next(); counts > 0) {
+                if (!writer) {
+                    writer = openWriter(settings.file, reading.getFields());
+                }
+                writer->write(reading.getFields(), counts);
+                progress.update(reading.getCounts());
             }
-            writer->write(reading.getFields(), counts);
-            progress.update(reading.getCounts());
+            if (!broken && channel.hasDeviceError()) { // finish() throws it
+                broken = true;
+                reading.endWithAvailable();
+            }
         }
-        channel.checkDevice();
+        progress.finish();
+        seconds = reading.getSeconds();
+        if (writer) {
+            writer->finish();
+        }
+        channel.finish();
+    } catch (const Failure& failure) {
+        channel.fail(failure);
     }
-    progress.finish();
-    const double seconds = reading.getSeconds();
-    if (writer) {
-        writer->finish();
-    }
-    channel.finish();
     if (!writer && !isInterrupted()) {
         throw Failure("", "the device delivered nothing");
     }
@@ -142,30 +151,36 @@ ExitCode writeSamples(const Settings& given)
     Progress progress(std::min(most, total > 0 ? total : INFINITY), settings.quiet);
     double rows = 0;
     Bytes elements;
-    while (rows < most && secondsSince(start) < mostSeconds && !isInterrupted()) {
-        elements.clear();
-        const double room = std::min(most - rows, static_cast<double>(settings.block));
-        const std::size_t count = reader->read(static_cast<std::size_t>(room), elements);
-        if (count == 0) {
-            break;
+    try {
+        while (rows < most && secondsSince(start) < mostSeconds && !isInterrupted()) {
+            elements.clear();
+            const double room = std::min(most - rows, static_cast<double>(settings.block));
+            const std::size_t count = reader->read(static_cast<std::size_t>(room), elements);
+            if (count == 0) {
+                break;
+            }
+            if (channel.isDone(output)) {
+                throw Failure("", "the device takes no more, after " +
+                                      std::to_string(static_cast<long>(rows)) + " counts");
+            }
+            double written = 0;
+            channel.check(coderOutputStreamWriteTypedDataOld(
+                output, &written, 1, type.name,
+                CODER_BUFFER(elements.size() / type.size, elements.data())));
+            if (hasInput) {
+                channel.check(coderStreamFlush(channel.inputStream()));
+            }
+            rows += static_cast<double>(count);
+            progress.update(rows);
+            if (channel.hasDeviceError()) { // finish() throws it
+                break;
+            }
         }
-        if (channel.isDone(output)) {
-            throw Failure("", "the device takes no more, after " +
-                                  std::to_string(static_cast<long>(rows)) + " counts");
-        }
-        double written = 0;
-        channel.check(coderOutputStreamWriteTypedDataOld(
-            output, &written, 1, type.name,
-            CODER_BUFFER(elements.size() / type.size, elements.data())));
-        if (hasInput) {
-            channel.check(coderStreamFlush(channel.inputStream()));
-        }
-        channel.checkDevice();
-        rows += static_cast<double>(count);
-        progress.update(rows);
+        progress.finish();
+        channel.finish();
+    } catch (const Failure& failure) {
+        channel.fail(failure);
     }
-    progress.finish();
-    channel.finish();
     if (!settings.emitC.empty()) {
         emitWrite(settings, *reader, hasInput, most, mostSeconds);
     }
