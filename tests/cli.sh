@@ -25,6 +25,10 @@ echo 'int f(void) { return 0; }' | "$cc" -shared -fPIC -x c - -o other.so
 printf 'left,right\n1,-2\n3,-4\n' >samples.csv
 printf '1,2\n3\n' >uneven.csv
 printf '1\nx\n' >letters.csv
+printf '1.5,2\n3,4\n' >fraction.csv
+printf 'a,b\n1\n' >header.csv
+seq 50000 >many.csv
+mkdir folder
 
 # exit code | text in the output | arguments
 while IFS='|' read -r code text arguments; do
@@ -60,10 +64,32 @@ done <<END
 0|wrote 2 counts|write loopback -i samples.csv -t int16
 1|uneven.csv: line 2: 1 values instead of 2|write loopback -i uneven.csv
 1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
+1|fraction.csv: line 1: not a number of type int16: 1.5|write loopback -i fraction.csv -t int16
+1|header.csv: line 2: 1 values instead of 2|write loopback -i header.csv
+1|folder: cannot be read|write loopback -i folder
+1|folder: cannot be read|write loopback -i folder --format raw
 1|notSupported|write signal -i samples.csv
+1|brenix:Device:failed: failed in run|write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
+1|Field none has no elements|read $plugins/probe.so -o Packets:int32=2,3,-4 -w kept.csv
+2|--counts: 1.5 is not a whole number of at least 1|read signal -n 1.5
+2|--limit: 0.5 is not a whole number of at least 1|read signal -n 1 --limit 0.5
+2|--limit: inf is not a whole number|read signal -n 2 --limit inf
+1|does not load|plugins nosuch
 1|the data has no field Foo|read signal -n 1 --field Foo
 0|RMS 0.7071|scope signal -o Pace=fast -n 4800 --png picture.png
 END
+[[ $(tr '\n' ' ' <kept.csv) == 'data 0 1 2 3 4 ' ]] || fail "what came before a device's error is lost"
+for command in "info signal" plugins "check signal" "scope signal -n 10"; do
+    read -ra words <<<"$command"
+    if brenix "${words[@]}" 2>errors >/dev/full || ! grep -q 'standard output: cannot' errors; then
+        fail "brenix $command to a full device"
+    fi
+done
+got=0
+PATH=$build/bin brenix scope signal -o Pace=fast -o Channels=4 -n 48000 --png none.png >out 2>&1 || got=$?
+if [[ $got -ne 1 ]] || ! grep -q 'is it installed' out; then
+    fail "scope without gnuplot: exit code $got"
+fi
 file picture.png | grep -q 'PNG image data' || fail "picture.png is no picture"
 
 # What an interrupted read has read is complete.
@@ -101,6 +127,8 @@ emitted() { # FILE-OF-RESULT ARGUMENTS...
 }
 signal=(signal -o Pace=fast -o Channels=2)
 emitted - info "${signal[@]}" --open -p Channels:uint32
+emitted - info signal -o Channels=1 -o Channels=2 -p Channels:uint32
+emitted './*.raw' read "${signal[@]}" -n 100 -w './*.raw' -f 'scale Gain=-0 Offset=12345678901234567890'
 emitted samples.raw read "${signal[@]}" -o Frames=10000 -w samples.raw
 emitted - read "${signal[@]}" -q -s 0.1 -c columns -f 'scale Gain:float=0.1 Offset=100' -n 1000
 emitted a.wav read "${signal[@]}" -c columns -n 5000 -w a.wav

@@ -58,12 +58,20 @@ std::string quote(std::string_view text)
 /// A double constant.
 std::string constant(double value)
 {
+    if (std::isnan(value)) {
+        return "NAN";
+    }
     if (std::isinf(value)) {
         return value > 0 ? "INFINITY" : "-INFINITY";
     }
     std::string text;
     elementType("double").print(reinterpret_cast<const unsigned char*>(&value), text);
-    return text.find_first_of(".en") == std::string::npos ? text + ".0" : text;
+    return text.find_first_of(".e") == std::string::npos ? text + ".0" : text;
+}
+
+bool isFloating(const ElementType& type)
+{
+    return type.cFormat[1] == '.';
 }
 
 /// The elements of an array.
@@ -73,12 +81,10 @@ std::string initialiser(const ElementType& type, const Bytes& elements)
     for (std::size_t i = 0; i < elements.size(); i += type.size) {
         std::string element;
         type.print(&elements[i], element);
-        if (element == std::to_string(std::numeric_limits<long>::min())) {
-            element = "INT64_MIN";
-        } else if (element.find("inf") != std::string::npos) {
+        if (isFloating(type)) {
             element = constant(type.toDouble(&elements[i]));
-        } else if (element.find("nan") != std::string::npos) {
-            element = "NAN";
+        } else if (element == std::to_string(std::numeric_limits<long>::min())) {
+            element = "INT64_MIN";
         }
         list += (i == 0 ? "" : ", ") + element + (type.name == std::string("uint64") ? "U" : "");
     }
@@ -90,13 +96,15 @@ std::string optionList(const std::vector<Option>& options, const std::string& pr
                        std::string& declarations)
 {
     std::string list = std::to_string(options.size());
+    int number = 0; // names may be the same, or once they are identifiers
     for (const Option& option : options) {
         std::string data;
+        ++number;
         if (option.type->isText) {
             data = quote(std::string_view(reinterpret_cast<const char*>(option.elements.data()),
                                           option.elements.size()));
         } else {
-            data = prefix + option.name;
+            data = prefix + std::to_string(number) + "_" + option.name;
             for (char& character : data) {
                 character =
                     std::isalnum(static_cast<unsigned char>(character)) != 0 ? character : '_';
@@ -134,7 +142,9 @@ static int setUp(void* channel)
 @SETUP_DATA@    return check(channel, "coderChannelInit",
             coderChannelInit(channel, @INIT@))@FILTERS@;
 }
+)";
 
+constexpr std::string_view openFunction = R"(
 static int openChannel(void* channel)
 {
 @OPEN_DATA@    return check(channel, "coderChannelOpen",
@@ -343,7 +353,7 @@ constexpr std::string_view propertyBlock = R"(    {
 std::string printElement(const ElementType& type, const std::string& file,
                          const std::string& element)
 {
-    if (type.cFormat[1] == '.') {
+    if (isFloating(type)) {
         return "printNumber(" + file + ", " + element + ", " +
                (type.name == std::string("float") ? "1" : "0") + ");\n";
     }
@@ -356,8 +366,10 @@ Values commonValues(const Settings& settings, bool output)
     const ChannelSettings& channel = settings.channel;
     Values values;
     std::string command = settings.commandLine;
-    for (std::size_t end = 0; (end = command.find("*/", end)) != std::string::npos;) {
-        command.insert(end + 1, 1, ' ');
+    for (const char* const mark : {"*/", "/*"}) {
+        for (std::size_t begin = 0; (begin = command.find(mark, begin)) != std::string::npos;) {
+            command.insert(begin + 1, 1, ' ');
+        }
     }
     values["COMMAND"] = command;
     values["LIBRARIES"] = "-lbrenixcoder";
@@ -366,11 +378,11 @@ Values commonValues(const Settings& settings, bool output)
     values["OPEN"] = optionList(parseOptions(channel.openOptions), "open", values["OPEN_DATA"]);
     for (std::size_t i = 0; i < channel.filters.size(); ++i) {
         const FilterSettings parsed = parseFilter(channel.filters[i]);
-        values["FILTERS"] +=
-            fill(filter, {{"STREAM", output ? "Output" : "Input"},
-                          {"NAME", quote(parsed.name)},
-                          {"LIST", optionList(parsed.options, "filter" + std::to_string(i + 1),
-                                              values["SETUP_DATA"])}});
+        values["FILTERS"] += fill(
+            filter, {{"STREAM", output ? "Output" : "Input"},
+                     {"NAME", quote(parsed.name)},
+                     {"LIST", optionList(parsed.options, "filter" + std::to_string(i + 1) + "_",
+                                         values["SETUP_DATA"])}});
     }
     values["DEVICE"] = quote(channel.device);
     values["CONVERTER"] = quote(channel.converter);
@@ -448,7 +460,7 @@ void emitInfo(const Settings& settings, const std::vector<PropertyValue>& proper
                             {"PRINT", print}});
     }
     values["PROPERTIES"]; // makes it
-    std::string program = fill(start, values);
+    std::string program = fill(start, values) + (settings.open ? fill(openFunction, values) : "");
     if (values["PROPERTIES"].find("printNumber") != std::string::npos) {
         program += printFunction;
     }
@@ -526,7 +538,8 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
     if (write.find("printNumber") != std::string::npos) {
         values["PRINT"] = printFunction;
     }
-    save(settings, fill(start, values) + fill(readProgram, values) + fill(fileMain, values));
+    save(settings, fill(start, values) + fill(openFunction, values) + fill(readProgram, values) +
+                       fill(fileMain, values));
 }
 
 void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInput,
@@ -565,7 +578,8 @@ void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInp
                          "    return count % COLUMNS == 0 && (count > 0 || feof(file)) ? count / "
                          "COLUMNS : -1;\n";
     }
-    save(settings, fill(start, values) + fill(writeProgram, values) + fill(fileMain, values));
+    save(settings, fill(start, values) + fill(openFunction, values) + fill(writeProgram, values) +
+                       fill(fileMain, values));
 }
 
 } // namespace brenix
