@@ -8,6 +8,7 @@ export PATH=$build/bin:$PATH
 scratch=$(mktemp -d)
 trap 'rm -rf "$scratch"' EXIT
 cd "$scratch"
+mkfifo pipe
 failures=0
 
 fail() {
@@ -41,6 +42,7 @@ while IFS='|' read -r code text arguments; do
     fi
 done <<END
 0|signal: a device that loads|check signal
+1|wrongFileType: it is not a regular file|check ./pipe
 1|notFound: $build/lib/brenix-plugins/none.so: No such file|check none
 1|wrongFileType: ./text.so|check ./text.so
 1|missingDependency: it needs a library that does not load: libgone.so: cannot open|check ./needs.so

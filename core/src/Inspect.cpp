@@ -80,6 +80,9 @@ PluginReport inspectPlugin(const std::string& name)
     try {
         report.problem = "notFound";
         report.path = pluginPath(name);
+        report.problem = "wrongFileType";
+        requireNoOtherFile(report.path);
+        report.problem = "notFound";
         requireReadable(report.path);
         report.problem = "wrongFileType";
         requireElf(report.path);

@@ -22,20 +22,12 @@ std::string loaderError()
     return text == nullptr ? "the reason is not known" : text;
 }
 
-/// Throws for a file that dlopen would wait for without end, being no regular one, or that it would
-/// map and then die reading, since it ends before the segments that its headers announce. What else
-/// is wrong with it dlopen says itself.
+/// Throws for a file that dlopen would map and then die reading, since it ends before the segments
+/// that its headers announce. What else is wrong with it, or that it is not there, dlopen says itself.
 void requireWholeFile(const std::string& path)
 {
     std::error_code error;
-    const std::filesystem::file_status status = std::filesystem::status(path, error);
-    if (!std::filesystem::is_regular_file(status)) {
-        if (std::filesystem::exists(status)) {
-            throw std::runtime_error("it is not a regular file");
-        }
-        return;
-    }
-    const std::uint64_t size = std::filesystem::file_size(path);
+    const std::uint64_t size = std::filesystem::file_size(path, error);
     std::ifstream file(path, std::ios::binary);
     Elf64_Ehdr header{};
     file.read(reinterpret_cast<char*>(&header), sizeof header);
@@ -74,8 +66,18 @@ void PluginLibrary::Unload::operator()(void* library) const noexcept
     dlclose(library);
 }
 
+void requireNoOtherFile(const std::string& path)
+{
+    std::error_code error;
+    const std::filesystem::file_status status = std::filesystem::status(path, error);
+    if (std::filesystem::exists(status) && !std::filesystem::is_regular_file(status)) {
+        throw std::runtime_error("it is not a regular file");
+    }
+}
+
 PluginLibrary::PluginLibrary(const std::string& path)
 {
+    requireNoOtherFile(path);
     requireWholeFile(path);
     // dlopen is declared not to throw, but a static object of the plug-in may. The library is then half
     // loaded and held once, and must not pass for loaded the next time.

@@ -23,6 +23,9 @@ namespace brenixcore
 /// the plug-in folder.
 std::string pluginPath(const std::string& name);
 
+/// Throws for what is there but is no regular file: opening a pipe, say, could wait without end.
+void requireNoOtherFile(const std::string& path);
+
 /// A loaded shared library; unloads it.
 class PluginLibrary
 {
