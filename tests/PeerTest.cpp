@@ -274,8 +274,7 @@ TEST(UdpTest, APeerAnswers)
 TEST(SerialTest, TwoPortsTalk)
 {
     const std::string other = file + "-other";
-    auto line = std::make_unique<Program>("socat PTY,raw,echo=0,link=" + file +
-                                          " PTY,raw,echo=0,link=" + other);
+    auto line = std::make_unique<Program>("socat PTY,link=" + file + " PTY,link=" + other);
     Channel near("serial");
     Channel far("serial");
     const int baudRate = 115200;
