@@ -169,20 +169,12 @@ bool Channel::Impl::enter(plugin::Packet& packet, bool waits)
         throw std::invalid_argument("The device pushed a packet without counts.");
     }
     requireWhole(packet);
-    Stream::Impl& stream = *input->impl;
-    if (!stream.waitToPush(waits)) {
-        return false;
-    }
     try {
-        stream.applyFilters(packet);
-    } catch (...) {
-        raise("error", "brenix:Stream:filterFailed", currentExceptionText().c_str());
+        return input->impl->push(packet, waits);
+    } catch (const CouldNotConvertInputData& failure) { // by a filter
+        raise("error", "brenix:Stream:filterFailed", failure.what());
         return true; // without this packet
     }
-    if (packet.counts > 0) {
-        stream.push(std::move(packet));
-    }
-    return true;
 }
 
 std::optional<plugin::Packet> Channel::Impl::pull()

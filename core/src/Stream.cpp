@@ -52,27 +52,34 @@ void Stream::Impl::setTimeout(double seconds)
     }
 }
 
-bool Stream::Impl::waitToPush(bool waits)
+bool Stream::Impl::push(plugin::Packet& packet, bool waits)
 {
     std::unique_lock lock(mutex);
     if (waits) {
-        changed.wait(lock, [&] { return pending.empty() || phase != Phase::Open; });
+        waitUntil(lock, [&] { return pending.empty() || phase != Phase::Open; });
     }
-    return pending.empty() && takesPart();
-}
-
-void Stream::Impl::push(plugin::Packet packet)
-{
-    Packets pushed;
-    pushed.push_back({std::move(packet)});
-    std::unique_lock lock(mutex);
-    pending.splice(pending.end(), pushed);
-    refill();
+    if (!pending.empty() || !takesPart()) {
+        return false;
+    }
+    if (!filters.empty()) {
+        lock.unlock();
+        try {
+            applyFilters(packet);
+        } catch (...) {
+            throw CouldNotConvertInputData(currentExceptionText());
+        }
+        lock.lock();
+    }
+    if (packet.counts > 0) {
+        pending.push_back({std::move(packet)});
+        refill();
+    }
     const bool ends = wanted > 0 && counts >= wanted; // the wait of a read
     lock.unlock();
     if (ends) {
         changed.notify_all();
     }
+    return true;
 }
 
 void Stream::Impl::refill()
@@ -105,7 +112,7 @@ std::optional<plugin::Packet> Stream::Impl::pull(bool waits)
 {
     std::unique_lock lock(mutex);
     if (waits) {
-        changed.wait(lock, [&] { return !packets.empty() || phase != Phase::Open; });
+        waitUntil(lock, [&] { return !packets.empty() || phase != Phase::Open; });
     }
     if (packets.empty() || !takesPart()) {
         return std::nullopt;
@@ -183,7 +190,8 @@ Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
         notifyDevice(lock);
         lock.lock();
     }
-    wait(lock, [&] { return counts >= count; });
+    waitUntil(
+        lock, [&] { return counts >= count || !isFlowing(); }, timeout);
     wanted = 0;
     if (counts < count) {
         refuse("there are " + std::to_string(counts) + " and " + reason());
@@ -243,6 +251,25 @@ void Stream::Impl::applyFilters(plugin::Packet& packet)
             requireWhole(packet);
         }
     }
+}
+
+std::uint64_t Stream::Impl::applyFilters(Packets& outgoing)
+{
+    std::uint64_t filtered = 0;
+    for (auto queued = outgoing.begin(); queued != outgoing.end();) {
+        const plugin::Packet& packet = queued->packet;
+        try {
+            applyFilters(queued->packet);
+            if (packet.counts > limit - filtered) {
+                throw std::length_error("The filters made more counts than the limit.");
+            }
+        } catch (...) {
+            throw CouldNotConvertOutputData(currentExceptionText());
+        }
+        filtered += packet.counts;
+        queued = packet.counts > 0 ? std::next(queued) : outgoing.erase(queued);
+    }
+    return filtered;
 }
 
 void Stream::Impl::convert(plugin::Packet& packet,
@@ -418,8 +445,10 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
         } catch (...) {
             throw CouldNotConvertOutputData(currentExceptionText());
         }
-        written += packet.counts;
-        outgoing.push_back({std::move(packet)});
+        if (packet.counts > 0) {
+            written += packet.counts;
+            outgoing.push_back({std::move(packet)});
+        }
     }
 
     const auto refuse = [&](const std::string& why) {
@@ -438,28 +467,19 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
     if (written > stream.limit) {
         refuse("the limit is " + std::to_string(stream.limit));
     }
-    stream.wait(lock, [&] { return stream.fits(written); });
+    stream.waitUntil(
+        lock, [&] { return stream.fits(written) || !stream.isFlowing(); }, stream.timeout);
     requirePossible(written);
 
-    // Only now, so that a filter does not see twice what is refused and written again. Meanwhile nobody
-    // but this thread takes the room.
-    lock.unlock();
-    std::uint64_t filtered = 0;
-    for (auto queued = outgoing.begin(); queued != outgoing.end();) {
-        const plugin::Packet& packet = queued->packet;
-        try {
-            stream.applyFilters(queued->packet);
-            if (packet.counts > stream.limit - filtered) {
-                throw std::length_error("The filters made more counts than the limit.");
-            }
-        } catch (...) {
-            throw CouldNotConvertOutputData(currentExceptionText());
-        }
-        filtered += packet.counts;
-        queued = packet.counts > 0 ? std::next(queued) : outgoing.erase(queued);
+    std::uint64_t filtered = written;
+    if (!stream.filters.empty()) {
+        // Only now, so that a filter does not see twice what is refused and written again. Meanwhile
+        // nobody but this thread takes the room.
+        lock.unlock();
+        filtered = stream.applyFilters(outgoing);
+        lock.lock();
+        requirePossible(filtered);
     }
-    lock.lock();
-    requirePossible(filtered);
     stream.packets.splice(stream.packets.end(), outgoing);
     stream.counts += filtered;
     stream.notifyDevice(lock);

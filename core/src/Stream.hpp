@@ -12,6 +12,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <thread>
 #include <vector>
 
 namespace brenixcore
@@ -68,13 +69,15 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     void setTimeout(double seconds);
 
     /// For the device's thread; see plugin::DeviceStreams.
-    bool waitToPush(bool waits);
-    void push(plugin::Packet packet);
+    bool push(plugin::Packet& packet, bool waits);
     std::optional<plugin::Packet> pull(bool waits);
 
     void addFilter(const std::string& name, const brenixplugin::PropertyMap& options);
     void tuneFilters(const brenixplugin::PropertyMap& options);
     void applyFilters(plugin::Packet& packet);
+
+    /// The same for all that a write brings. Returns the counts that are left.
+    std::uint64_t applyFilters(Packets& outgoing);
 
     /// Runs an operation of the converter. Throws when it does, or leaves the packet as it must not.
     void convert(plugin::Packet& packet, void (plugin::Converter::*operation)(plugin::Packet&));
@@ -88,18 +91,25 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     /// Whether `more` counts have room. Under the mutex.
     bool fits(std::uint64_t more) const { return counts <= limit && more <= limit - counts; }
 
-    /// Waits until the condition holds or, by phase, device or time, will not. Under the mutex.
+    /// Waits until the condition holds, or for so long. Under the mutex. It gives way a few times before
+    /// it sleeps: while data flows there is seldom long to wait, and sleeping and being woken takes
+    /// longer than most packets do.
     template <typename Condition>
-    void wait(std::unique_lock<std::mutex>& lock, const Condition& condition)
+    void waitUntil(std::unique_lock<std::mutex>& lock, const Condition& over,
+                   std::optional<std::chrono::steady_clock::duration> atMost = std::nullopt)
     {
-        const auto over = [&] { return condition() || !isFlowing(); };
-        if (over()) {
-            return; // without a look at the clock
+        if (atMost == std::chrono::steady_clock::duration::zero()) {
+            return;
         }
-        if (timeout) {
-            changed.wait_for(lock, *timeout, over);
-        } else {
+        for (int turn = 0; turn < 10 && !over(); ++turn) {
+            lock.unlock();
+            std::this_thread::yield();
+            lock.lock();
+        }
+        if (!atMost) {
             changed.wait(lock, over);
+        } else if (!over()) { // without a look at the clock
+            changed.wait_for(lock, *atMost, over);
         }
     }
 
@@ -128,7 +138,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     const std::uint64_t limit;
     const plugin::StreamInfo info;
 
-    std::mutex filterMutex; ///< guards the filters
+    std::mutex filterMutex; ///< guards the filters, which are added only while closed
     std::vector<std::unique_ptr<plugin::Filter>> filters;
 
     std::mutex mutex; ///< guards what follows
