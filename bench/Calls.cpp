@@ -1,17 +1,16 @@
 // What one call of the library costs, on a core that returns at once. Each measurement has its
 // reference beside it under the same name, so that the two run in turn.
 
+#include "Allocations.hpp"
 #include "NullCore.hpp"
 #include "brenixcoder/coder.h"
 
 #include <benchmark/benchmark.h>
 
 #include <array>
-#include <cstdlib>
 #include <cstring>
 #include <ctime>
 #include <memory>
-#include <new>
 #include <numeric>
 #include <stdexcept>
 #include <string>
@@ -28,7 +27,7 @@
 namespace
 {
 
-std::size_t allocations = 0;
+using benchmark::State;
 
 void require(bool fulfilled, const char* what)
 {
@@ -36,30 +35,6 @@ void require(bool fulfilled, const char* what)
         throw std::runtime_error(what);
     }
 }
-
-} // namespace
-
-[[gnu::noinline]] void* operator new(std::size_t size)
-{
-    ++allocations;
-    void* const memory = std::malloc(size);
-    return memory != nullptr ? memory : throw std::bad_alloc();
-}
-
-[[gnu::noinline]] void operator delete(void* memory) noexcept
-{
-    std::free(memory);
-}
-
-[[gnu::noinline]] void operator delete(void* memory, std::size_t /*size*/) noexcept
-{
-    std::free(memory);
-}
-
-namespace
-{
-
-using benchmark::State;
 
 /// A channel on the null core, initialised.
 struct Channel {

@@ -25,12 +25,18 @@ void echo(State& state, std::size_t elements, std::size_t inFlight, std::size_t 
     Peer peer(elements);
     const std::size_t most = std::clamp(peer.capacity, 1UL, inFlight);
     std::size_t flying = 0;
-    for (auto _ : state) {
+    const auto step = [&] {
         peer.send(out.data());
         if (++flying == most) {
             peer.receive(in.data());
             --flying;
         }
+    };
+    for (std::size_t i = 0; i < 4 * most; ++i) { // until the memory that moves has been used before
+        step();
+    }
+    for (auto _ : state) {
+        step();
     }
     for (; flying > 0; --flying) {
         peer.receive(in.data());

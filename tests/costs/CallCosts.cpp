@@ -1,36 +1,15 @@
 // Makes every exported call a hundred times on the null core. Prints the allocations of one call, and
 // under callgrind has it dump the instructions of the hundred under the name of the call.
 
+#include "Allocations.hpp"
 #include "NullCore.hpp"
 #include "brenixcoder/coder.h"
 
 #include <valgrind/callgrind.h>
 
 #include <cstdio>
-#include <cstdlib>
 #include <functional>
-#include <new>
 #include <string>
-
-static std::size_t allocations = 0;
-
-// Not inline: GCC would see memory of operator new go to free.
-[[gnu::noinline]] void* operator new(std::size_t size)
-{
-    ++allocations;
-    void* const memory = std::malloc(size);
-    return memory != nullptr ? memory : throw std::bad_alloc();
-}
-
-[[gnu::noinline]] void operator delete(void* memory) noexcept
-{
-    std::free(memory);
-}
-
-[[gnu::noinline]] void operator delete(void* memory, std::size_t) noexcept
-{
-    std::free(memory);
-}
 
 #define CALL(function, ...)                                                                        \
     {                                                                                              \
