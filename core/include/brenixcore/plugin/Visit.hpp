@@ -6,6 +6,7 @@
 #include "brenixplugin/Property.hpp"
 
 #include <string>
+#include <typeinfo>
 
 namespace brenixcore::plugin
 {
@@ -13,10 +14,18 @@ namespace brenixcore::plugin
 namespace detail
 {
 
+/// Of the very class, which is quick to tell, or of one derived from it.
+enum class Match { Exact, Derived };
+
 template <typename Property, typename Visitor>
-bool visitAs(brenixplugin::interfaces::IPropertyInfo* property, Visitor& visitor)
+bool visitAs(brenixplugin::interfaces::IPropertyInfo* property, Match match, Visitor& visitor)
 {
-    auto* const concrete = dynamic_cast<Property*>(property);
+    Property* concrete = nullptr;
+    if (match == Match::Derived) {
+        concrete = dynamic_cast<Property*>(property);
+    } else if (typeid(*property) == typeid(Property)) {
+        concrete = static_cast<Property*>(property);
+    }
     if (concrete == nullptr) {
         return false;
     }
@@ -25,26 +34,30 @@ bool visitAs(brenixplugin::interfaces::IPropertyInfo* property, Visitor& visitor
 }
 
 template <typename T, typename Visitor>
-bool visitElement(brenixplugin::interfaces::IPropertyInfo* property, Visitor& visitor)
+bool visitElement(brenixplugin::interfaces::IPropertyInfo* property, Match match, Visitor& visitor)
 {
     using namespace brenixplugin::kit;
-    return visitAs<coderconverter::TPointerProperty<T>>(property, visitor) ||
-           visitAs<device::TScalarProperty<T>>(property, visitor) ||
-           visitAs<device::TVectorProperty<T>>(property, visitor);
+    return visitAs<coderconverter::TPointerProperty<T>>(property, match, visitor) ||
+           visitAs<device::TScalarProperty<T>>(property, match, visitor) ||
+           visitAs<device::TVectorProperty<T>>(property, match, visitor);
 }
 
 template <typename... T>
 struct Elements {
+    template <typename... Other>
+    using And = Elements<T..., Other...>;
+
     template <typename Visitor>
     static bool visit(brenixplugin::interfaces::IPropertyInfo* property, Visitor& visitor)
     {
-        return (visitElement<T>(property, visitor) || ...);
+        return property != nullptr && ((visitElement<T>(property, Match::Exact, visitor) || ...) ||
+                                       (visitElement<T>(property, Match::Derived, visitor) || ...));
     }
 };
 
 using Numbers = Elements<double, float, unsigned long, long, unsigned int, int, unsigned short,
                          short, unsigned char, signed char>;
-using Others = Elements<bool, std::u16string, std::string>;
+using All = Numbers::And<bool, std::u16string, std::string>;
 
 } // namespace detail
 
@@ -60,7 +73,7 @@ bool visitNumbers(brenixplugin::interfaces::IPropertyInfo* property, Visitor&& v
 template <typename Visitor>
 bool visitProperty(brenixplugin::interfaces::IPropertyInfo* property, Visitor&& visitor)
 {
-    return detail::Numbers::visit(property, visitor) || detail::Others::visit(property, visitor);
+    return detail::All::visit(property, visitor);
 }
 
 } // namespace brenixcore::plugin
