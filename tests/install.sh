@@ -4,6 +4,7 @@
 # Usage: install.sh BUILD-FOLDER CC CXX
 set -euo pipefail
 build=$1
+source=$(cd "$(dirname "$0")/.." && pwd)
 export CC=$2 CXX=$3 CFLAGS='-Wall -Wextra -Wpedantic -Werror' CMAKE_GENERATOR=Ninja
 export CXXFLAGS=$CFLAGS
 
@@ -38,6 +39,13 @@ folder=$(dirname "$(find "$scratch/installed" -name brenixcoder.pc)")
 pkgconfig=(env "PKG_CONFIG_PATH=$folder" pkg-config) # before the system's folders
 read -ra flags < <("${pkgconfig[@]}" --cflags --libs brenixcoder)
 flags+=("-Wl,-rpath,$("${pkgconfig[@]}" --variable=libdir brenixcoder)" -lm)
+
+echo "== every relative link of the pages, here and in the repository, leads somewhere"
+for page in {"$docs","$source"}/{README.md,docs/*.md}; do
+    while read -r link; do
+        [[ -e ${page%/*}/$link ]] || { echo "$page: $link" && exit 1; }
+    done < <(grep -oP '\]\((?!https?:)\K[^)#]+' "$page")
+done
 
 echo "== the programs of the pages with pkg-config, as C and as C++"
 read -ra warnings <<<"$CFLAGS"
