@@ -12,6 +12,8 @@
 #include <algorithm>
 #include <array>
 #include <cctype>
+#include <cmath>
+#include <iterator>
 #include <memory>
 #include <stdexcept>
 #include <string>
@@ -175,8 +177,7 @@ private:
         if (!file) {
             throw std::runtime_error("Could not open " + fileName + ": " + sf_strerror(nullptr));
         }
-        sf_command(file.get(), SFC_SET_CLIPPING, nullptr,
-                   SF_TRUE); // beyond full scale is full scale
+        sf_command(file.get(), SFC_SET_CLIPPING, nullptr, SF_TRUE); // the scale of PCM is 2^n
     }
 
     void read(DeviceStreams& streams)
@@ -214,7 +215,8 @@ private:
                                   "Samples to write must be double.");
                 continue;
             }
-            samples.insert(samples.end(), array->data, array->data + array->count);
+            std::transform(array->data, array->data + array->count, std::back_inserter(samples),
+                           [this](double sample) { return encodable(sample); });
             const std::uint64_t frames = samples.size() / channels;
             const auto written =
                 sf_writef_double(file.get(), samples.data(), static_cast<sf_count_t>(frames));
@@ -230,6 +232,17 @@ private:
                                      std::to_string(samples.size()) + " of " +
                                      std::to_string(channels) + " samples and was not written.");
         }
+    }
+
+    /// Full scale for what is beyond it, and 0 for what is no number: libsndfile sees to that for PCM
+    /// only, and looks up other encodings in tables without a check.
+    double encodable(double sample) const
+    {
+        const int subtype = format.format & SF_FORMAT_SUBMASK;
+        if (subtype == SF_FORMAT_FLOAT || subtype == SF_FORMAT_DOUBLE) {
+            return sample;
+        }
+        return std::isnan(sample) ? 0 : std::clamp(sample, -1.0, 1.0);
     }
 
     struct CloseFile {
