@@ -14,9 +14,10 @@
  * lets a C++ exception out, also when memory runs out.
  *
  * A null channel or stream handle makes every function return its failure value (0, NULL or
- * nothing) and do nothing else, but for the out-values that are reset first. A null pointer for an out-value or a destination is an error
- * ("Argument <name> must not be null.") and nothing is done. A handle is not checked further: it
- * must be one that the library gave out and that is still valid.
+ * nothing) and do nothing else, but for the out-values that are reset first. A null pointer for an
+ * out-value or a destination is an error ("Argument <name> must not be null.") and nothing is done.
+ * A handle is not checked further: it must be one that the library gave out and that is still
+ * valid.
  *
  * ### Three error records
  *
@@ -429,7 +430,8 @@ CODER_API int coderOutputStreamWriteTypedDataOld(void* stream, double* written, 
  *
  * @param path         UTF-8, NUL-terminated; relative paths start at the current directory
  * @param absolutePath buffer of #CODER_PATH_SIZE bytes; receives the path, cut to 4095 bytes, or
- * the empty text when there is no such file, the text is not UTF-8, or anything fails
+ *                     the empty text when there is no such file, the text is not UTF-8, or anything
+ *                     fails
  */
 CODER_API void coderComputeAbsolutePath(const char* path, char* absolutePath) CODER_NOEXCEPT;
 
