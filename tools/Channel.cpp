@@ -6,6 +6,7 @@
 #include <array>
 #include <cstring>
 #include <sstream>
+#include <string_view>
 #include <tuple>
 #include <utility>
 
@@ -37,14 +38,15 @@ int callWithOptions(const std::vector<Option>& options, const Call& call)
 }
 
 /// Adds to an error without a message why a plug-in did not load.
-Failure explained(const std::string& id, std::string message, const std::vector<std::string>& names)
+Failure explained(const Failure& failure, const std::vector<std::string>& names)
 {
+    std::string message = failure.what();
     for (const std::string& name : names) {
         if (message.empty()) {
             message = brenixcore::plugin::inspectPlugin(name).message;
         }
     }
-    return {id, message};
+    return {failure.getId(), message};
 }
 
 } // namespace
@@ -84,7 +86,7 @@ Channel::Channel(const ChannelSettings& settings, bool filterOutput)
     handle = coderChannelCreate(settings.device.c_str(), settings.converter.c_str(), id.data(),
                                 message.data(), settings.inputLimit, settings.outputLimit);
     if (handle == nullptr) {
-        throw explained(id.data(), message.data(), {settings.converter, settings.device});
+        throw explained({id.data(), message.data()}, {settings.converter, settings.device});
     }
     try {
         check(callWithOptions(options,
@@ -99,8 +101,7 @@ Channel::Channel(const ChannelSettings& settings, bool filterOutput)
                                             list...);
             });
             if (added == 0) {
-                const auto [errorId, errorMessage] = lastError();
-                throw explained(errorId, errorMessage, {filter.name});
+                throw explained(lastError(), {filter.name});
             }
         }
     } catch (...) {
@@ -138,7 +139,7 @@ void Channel::finish()
     check(coderChannelTerm(handle));
 }
 
-std::pair<std::string, std::string> Channel::lastError() const
+Failure Channel::lastError() const
 {
     std::array<char, CODER_ERROR_SIZE> id{};
     std::array<char, CODER_ERROR_SIZE> message{};
@@ -152,8 +153,7 @@ std::pair<std::string, std::string> Channel::lastError() const
 void Channel::check(int result)
 {
     if (result == 0) {
-        const auto [id, message] = lastError();
-        throw Failure(id, message);
+        throw lastError();
     }
 }
 
@@ -189,10 +189,7 @@ void Channel::fail(const Failure& failure)
     if (!error) {
         throw Failure(failure);
     }
-    const std::string message = failure.what();
-    throw Failure(error->getId(), std::string(error->what()) + "; also: " + failure.getId() +
-                                      (failure.getId().empty() || message.empty() ? "" : ": ") +
-                                      message);
+    throw Failure(error->getId(), std::string(error->what()) + "; also: " + failure.text());
 }
 
 double Channel::inputAvailable()
@@ -232,7 +229,7 @@ double Channel::nextBuffer(double most)
 /// Whether the last call failed because the value is of the type, but larger than the capacity.
 bool Channel::isTooSmall() const
 {
-    return lastError().second.rfind("Property value: ", 0) == 0;
+    return std::string_view(lastError().what()).rfind("Property value: ", 0) == 0;
 }
 
 /// Copies a value of which nobody tells how many elements it has: they are as many as the smallest
@@ -328,8 +325,7 @@ void Channel::readField(Field& field, double counts)
 {
     const auto rows = static_cast<std::size_t>(counts);
     if (!readAll(*field.type, fieldCopier(field), rows * field.perCount, field.elements)) {
-        const auto [id, message] = lastError();
-        throw Failure(id, message);
+        throw lastError();
     }
     if (field.type->isText || field.elements.size() != rows * field.perCount * field.type->size) {
         throw Failure("",

@@ -28,6 +28,13 @@ public:
     }
     const std::string& getId() const { return id; }
 
+    /// Identifier and message, as far as there are both.
+    std::string text() const
+    {
+        const std::string message = what();
+        return id + (id.empty() || message.empty() ? "" : ": ") + message;
+    }
+
 private:
     std::string id;
 };
@@ -114,7 +121,7 @@ private:
     bool readAll(const ElementType& type, const Copy& copy, std::size_t guess, Bytes& elements);
     Copy fieldCopier(const Field& field) const;
     bool isTooSmall() const;
-    std::pair<std::string, std::string> lastError() const;
+    Failure lastError() const;
     std::optional<Field> findField(const std::string& name, double counts);
 
     void* handle = nullptr;

@@ -6,10 +6,13 @@
 #include "Samples.hpp"
 #include "Terminal.hpp"
 
+#include <nlohmann/json.hpp>
+
 #include <algorithm>
 #include <chrono>
 #include <cstddef>
 #include <limits>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -43,12 +46,35 @@ struct Settings {
     std::string emitC;
 };
 
+using Json = nlohmann::ordered_json;
+
+/// Text that is not UTF-8 is printed with replacements. Without an indent it is one line.
+void printJson(std::ostream& stream, const Json& value, int indent = -1);
+
+/// Prints an error on the standard error.
+void report(const Settings& settings, const Failure& failure);
+
 ExitCode listPlugins(const Settings& settings);
 ExitCode checkPlugins(const Settings& settings);
 ExitCode showInfo(const Settings& settings);
 ExitCode readSamples(const Settings& given);
 ExitCode writeSamples(const Settings& given);
 ExitCode showScope(const Settings& settings);
+
+struct PropertyValue {
+    std::string name;
+    std::string unit;
+    const ElementType* type;
+    Bytes elements;
+};
+
+// Each writes settings.emitC, the C program that does what the command did. Throws a Failure when it
+// cannot.
+void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties);
+void emitRead(const Settings& settings, const std::vector<Field>& fields, double mostCounts,
+              double mostSeconds);
+void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInput,
+               double mostCounts, double mostSeconds);
 
 /// Waits for counts and hands them over, one buffer after another, until the settings, the device or
 /// an interruption end it.

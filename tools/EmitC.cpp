@@ -1,4 +1,4 @@
-#include "EmitC.hpp"
+// Writes C programs that do what a command just did.
 
 #include "CheckText.hpp"
 #include "Commands.hpp"
@@ -20,7 +20,7 @@ namespace
 
 using Values = std::map<std::string, std::string>;
 
-/// Puts values in the place of @NAMES@.
+/// Puts values in the place of @NAMES@, nothing where there is none.
 std::string fill(std::string_view text, const Values& values)
 {
     std::string filled;
@@ -31,7 +31,8 @@ std::string fill(std::string_view text, const Values& values)
             return filled;
         }
         const std::size_t end = text.find('@', begin + 1);
-        filled += values.at(std::string(text.substr(begin + 1, end - begin - 1)));
+        const auto value = values.find(std::string(text.substr(begin + 1, end - begin - 1)));
+        filled += value == values.end() ? "" : value->second;
         text.remove_prefix(end + 1);
     }
 }
@@ -124,7 +125,7 @@ constexpr std::string_view start = R"(/*
  *     cc -std=c99 program.c @LIBRARIES@ -o program
  *
 @USAGE@ */
-#define _POSIX_C_SOURCE 199309L
+#define _POSIX_C_SOURCE 200809L
 
 #include <brenixcoder/coder.h>
 
@@ -135,22 +136,16 @@ constexpr std::string_view start = R"(/*
 #include <time.h>
 @INCLUDE@
 @CHECK@
-
-/* Initialises the channel and adds its filters. */
 static int setUp(void* channel)
 {
 @SETUP_DATA@    return check(channel, "coderChannelInit",
-            coderChannelInit(channel, @INIT@))@FILTERS@;
+            coderChannelInit(channel, @INIT@))@FILTERS@@OPEN@;
 }
 )";
 
-constexpr std::string_view openFunction = R"(
-static int openChannel(void* channel)
-{
-@OPEN_DATA@    return check(channel, "coderChannelOpen",
-            coderChannelOpen(channel, @OPEN@));
-}
-)";
+constexpr std::string_view open = R"( &&
+           check(channel, "coderChannelOpen",
+            coderChannelOpen(channel, @LIST@)))";
 
 constexpr std::string_view filter = R"( &&
            check(channel, "coderStreamAddFilter",
@@ -177,6 +172,7 @@ static int transfer(void* channel, @FILE@* file)
     const struct timespec pause = {0, 1000000};
     void* const input = coderChannelGetInputStream(channel);
     double left = @COUNTS@;
+    int ok = 1;
 @START@    while (left > 0.0@TIME@) {
         uint8_t done = 0;
         double total = 0.0;
@@ -191,11 +187,8 @@ static int transfer(void* channel, @FILE@* file)
         }
         if (buffers > 0.0) {
             if (!check(channel, "coderInputStreamReadBuffers",
-                       coderInputStreamReadBuffers(input, counts, 1.0))@READ@) {
-                return 0;
-            }
-            if (!writeCounts(file, (int)counts)) {
-                fputs("The samples could not be written.\n", stderr);
+                       coderInputStreamReadBuffers(input, counts, 1.0))@READ@ ||
+                !writeCounts(file, (int)counts)) {
                 return 0;
             }
             left -= counts;
@@ -204,18 +197,23 @@ static int transfer(void* channel, @FILE@* file)
         } else {
             (void)nanosleep(&pause, NULL);
         }
-        if (!checkDevice(channel)) {
-            return 0;
+        if (ok && !checkDevice(channel)) { /* then take what came before the error */
+            ok = 0;
+            if (!check(channel, "coderStreamGetDataAvailable",
+                       coderStreamGetDataAvailable(input, &total))) {
+                return 0;
+            }
+            left = total < left ? total : left;
         }
     }
-    return 1;
+    return ok;
 }
 )";
 
 constexpr std::string_view readField = R"( ||
                 !check(channel, "coderInputStreamReadBufferData",
                        coderInputStreamReadBufferData(input, 1, 0, @NAME@, @TYPE@,
-                                                      (int)counts * @PERCOUNT@, @ARRAY@)))";
+                                                      (int)counts@TIMES@, @ARRAY@)))";
 
 constexpr std::string_view printFunction = R"(
 /* With as few digits as tell the value. */
@@ -236,7 +234,7 @@ enum { ROWS = @ROWS@, COLUMNS = @COLUMNS@ }; /* of one buffer */
 
 static @CTYPE@ elements[ROWS * COLUMNS];
 
-/* Reads up to `most` rows. Returns how many, 0 at the end, -1 on an error. */
+@TAKE@/* Reads up to `most` rows. Returns how many, 0 at the end, -1 after printing what is wrong. */
 static int readRows(@FILE@* file, int most)
 {
 @READ@}
@@ -249,12 +247,8 @@ static int transfer(void* channel, @FILE@* file)
         uint8_t done = 0;
         double written = 0.0;
         const int rows = readRows(file, left < ROWS ? (int)left : ROWS);
-        if (rows == 0) {
-            break;
-        }
-        if (rows < 0) {
-            fputs("The samples could not be read.\n", stderr);
-            return 0;
+        if (rows <= 0) {
+            return rows == 0;
         }
         if (!check(channel, "coderStreamIsDeviceDone", coderStreamIsDeviceDone(output, &done))) {
             return 0;
@@ -275,6 +269,82 @@ static int transfer(void* channel, @FILE@* file)
 }
 )";
 
+constexpr std::string_view checkWav = R"(    if (info.channels != COLUMNS) {
+        fprintf(stderr, "%s: %d channels instead of %d\n", name, info.channels, COLUMNS);
+        return EXIT_FAILURE;
+    }
+)";
+
+constexpr std::string_view readRaw =
+    R"(    const size_t size = fread(elements, 1, (size_t)most * sizeof(elements[0]), file);
+    if (size % sizeof(elements[0]) != 0) {
+        fputs("The last element is not complete.\n", stderr);
+        return -1;
+    }
+    return (int)(size / sizeof(elements[0]));
+)";
+
+constexpr std::string_view readCsv = R"(    static char* text = NULL;
+    static size_t size = 0;
+    static long line = 0;
+    ssize_t length;
+    int rows = 0;
+    while (rows < most && (length = getline(&text, &size, file)) > 0) {
+        char* next = skipSpace(text);
+        ++line;
+        if (next == text + length@HEADER@) {
+            continue; /* an empty line@NAMES@ */
+        }
+        for (int column = 0; column < COLUMNS; ++column) {
+            if ((column > 0 && *next++ != ',') ||
+                !takeElement(&next, &elements[rows * COLUMNS + column])) {
+                next = NULL;
+                break;
+            }
+        }
+        if (next != text + length) {
+            fprintf(stderr, "line %ld: not %d values of type @TYPENAME@: %s\n", line, COLUMNS, text);
+            return -1;
+        }
+        ++rows;
+    }
+    return rows;
+)";
+
+constexpr std::string_view logicalWords =
+    R"(    for (int word = 0; word < 2; ++word) {
+        const char* const name = word ? "true" : "false";
+        if (strncmp(*text, name, strlen(name)) == 0) {
+            *text = skipSpace(*text + strlen(name));
+            *element = (uint8_t)word;
+            return 1;
+        }
+    }
+)";
+
+constexpr std::string_view takeElement = R"(static char* skipSpace(char* text)
+{
+    return text + strspn(text, " \t\r\n");
+}
+
+/* Takes an element from the front of a text. Returns 0 when it has none of the type. */
+static int takeElement(char** text, @CTYPE@* element)
+{
+    char* end;
+    @WIDE@ value;
+    errno = 0;
+    *text = skipSpace(*text);
+@WORDS@    value = @CONVERT@;
+    *element = (@CTYPE@)value;
+    if (end == *text || @WRONG@) {
+        return 0;
+    }
+    *text = skipSpace(end);
+    return 1;
+}
+
+)";
+
 constexpr std::string_view flushInput = R"( ||
             !check(channel, "coderStreamFlush",
                    coderStreamFlush(coderChannelGetInputStream(channel))))";
@@ -287,21 +357,25 @@ int main(int argc, char** argv)
     int ok;
 @INFO@    @FILE@* const file = @OPENFILE@;
     if (file == NULL) {
-        fprintf(stderr, "%s cannot be opened.\n", name);
+        fprintf(stderr, "%s: %s\n", name, @WHY@);
         return EXIT_FAILURE;
     }
-    channel = createChannel(@DEVICE@, @CONVERTER@, @INLIMIT@, @OUTLIMIT@);
-    ok = channel != NULL && setUp(channel) && openChannel(channel) && transfer(channel, file);
+@OPENED@    channel = createChannel(@DEVICE@, @CONVERTER@, @INLIMIT@, @OUTLIMIT@);
+    ok = channel != NULL && setUp(channel) && transfer(channel, file);
     ok = finishChannel(channel) && ok;
+    if (@ERROR@(file) != 0) {
+        fprintf(stderr, "%s: cannot be @VERB@\n", name);
+        ok = 0;
+    }
     if (@CLOSE@(file) != 0) {
-        fprintf(stderr, "%s cannot be closed.\n", name);
+        fprintf(stderr, "%s: cannot be closed\n", name);
         ok = 0;
     }
     return ok ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 )";
 
-constexpr std::string_view infoProgram = R"(
+constexpr std::string_view infoProgram = R"(@PRINT@
 static int printStream(void* channel, const char* name, void* stream)
 {
     uint8_t supported = 0;
@@ -329,12 +403,12 @@ static int printProperties(void* channel)
 int main(void)
 {
     void* const channel = createChannel(@DEVICE@, @CONVERTER@, @INLIMIT@, @OUTLIMIT@);
-    int ok = channel != NULL && setUp(channel) &&@OPENCALL@
+    int ok = channel != NULL && setUp(channel) &&
              printStream(channel, "input", coderChannelGetInputStream(channel)) &&
              printStream(channel, "output", coderChannelGetOutputStream(channel)) &&
              printProperties(channel);
     ok = finishChannel(channel) && ok;
-    return ok ? EXIT_SUCCESS : EXIT_FAILURE;
+    return ok && fflush(stdout) == 0 ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 )";
 
@@ -361,7 +435,7 @@ std::string printElement(const ElementType& type, const std::string& file,
 }
 
 /// What all programs have.
-Values commonValues(const Settings& settings, bool output)
+Values commonValues(const Settings& settings, bool opens, bool output)
 {
     const ChannelSettings& channel = settings.channel;
     Values values;
@@ -375,7 +449,10 @@ Values commonValues(const Settings& settings, bool output)
     values["LIBRARIES"] = "-lbrenixcoder";
     values["CHECK"] = checkText;
     values["INIT"] = optionList(parseOptions(channel.options), "init", values["SETUP_DATA"]);
-    values["OPEN"] = optionList(parseOptions(channel.openOptions), "open", values["OPEN_DATA"]);
+    if (opens) {
+        values["OPEN"] = fill(open, {{"LIST", optionList(parseOptions(channel.openOptions), "open",
+                                                         values["SETUP_DATA"])}});
+    }
     for (std::size_t i = 0; i < channel.filters.size(); ++i) {
         const FilterSettings parsed = parseFilter(channel.filters[i]);
         values["FILTERS"] += fill(
@@ -389,10 +466,6 @@ Values commonValues(const Settings& settings, bool output)
     values["INLIMIT"] = constant(channel.inputLimit);
     values["OUTLIMIT"] = constant(channel.outputLimit);
     values["NAME"] = quote(settings.file.name);
-    for (const char* const empty : {"USAGE", "INCLUDE", "SETUP_DATA", "OPEN_DATA", "FILTERS",
-                                    "CLOCK", "START", "TIME", "INFO", "PRINT", "FLUSH"}) {
-        values[empty]; // makes it
-    }
     return values;
 }
 
@@ -404,14 +477,19 @@ void addFile(const Settings& settings, bool writes, const std::string& wavFormat
     values["USAGE"] = std::string(" * usage: program [FILE], ") +
                       (writes ? "to which it writes samples\n" : "from which it takes samples\n");
     values["FILE"] = wav ? "SNDFILE" : "FILE";
+    values["ERROR"] = wav ? "sf_error" : "ferror";
     values["CLOSE"] = wav ? "sf_close" : "fclose";
+    values["VERB"] = writes ? "written" : "read";
     if (wav) {
         values["LIBRARIES"] += " -lsndfile";
         values["INCLUDE"] = "\n#include <sndfile.h>\n";
+        values["WHY"] = "sf_strerror(NULL)";
         values["INFO"] = "    SF_INFO info = {" + wavFormat + "};\n";
         values["OPENFILE"] =
             std::string("sf_open(name, ") + (writes ? "SFM_WRITE" : "SFM_READ") + ", &info)";
     } else {
+        values["INCLUDE"] = "#include <errno.h>\n";
+        values["WHY"] = "strerror(errno)";
         values["OPENFILE"] = std::string("strcmp(name, \"-\") == 0 ? ") +
                              (writes ? "stdout" : "stdin") + " : fopen(name, " +
                              (writes ? "\"wb\")" : "\"rb\")");
@@ -424,10 +502,13 @@ void addFile(const Settings& settings, bool writes, const std::string& wavFormat
     }
 }
 
-void save(const Settings& settings, const std::string& program)
+void save(const Settings& settings, std::string_view program, Values values)
 {
+    if ((values["WRITE"] + values["PROPERTIES"]).find("printNumber") != std::string::npos) {
+        values["PRINT"] = printFunction;
+    }
     std::ofstream file(settings.emitC);
-    if (!(file << program).flush()) {
+    if (!(file << fill(start, values) << fill(program, values)).flush()) {
         throw Failure("", settings.emitC + ": cannot be written");
     }
 }
@@ -436,8 +517,7 @@ void save(const Settings& settings, const std::string& program)
 
 void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties)
 {
-    Values values = commonValues(settings, false);
-    values["OPENCALL"] = settings.open ? " openChannel(channel) &&" : "";
+    Values values = commonValues(settings, settings.open, false);
     for (const PropertyValue& property : properties) {
         const ElementType& type = *property.type;
         const std::size_t count = property.elements.size() / type.size;
@@ -459,73 +539,74 @@ void emitInfo(const Settings& settings, const std::vector<PropertyValue>& proper
                             {"UNIT", quote((property.unit.empty() ? "" : " ") + property.unit)},
                             {"PRINT", print}});
     }
-    values["PROPERTIES"]; // makes it
-    std::string program = fill(start, values) + (settings.open ? fill(openFunction, values) : "");
-    if (values["PROPERTIES"].find("printNumber") != std::string::npos) {
-        program += printFunction;
+    if (properties.empty()) {
+        values["PROPERTIES"] = "    (void)channel; /* it describes none */\n";
     }
-    save(settings, program + fill(infoProgram, values));
+    save(settings, infoProgram, values);
 }
 
 void emitRead(const Settings& settings, const std::vector<Field>& fields, double mostCounts,
               double mostSeconds)
 {
-    Values values = commonValues(settings, false);
+    Values values = commonValues(settings, true, false);
     std::string wavFormat;
     if (settings.file.format == "wav") {
         wavFormat = ".samplerate = " + std::to_string(static_cast<int>(settings.file.rate)) +
                     ", .channels = " + std::to_string(columnNames(fields).size()) +
-                    ", .format = SF_FORMAT_WAV | " + wavEncoding(*fields[0].type);
+                    ", .format = SF_FORMAT_WAV | " + wavEncoding(*fields[0].type).formatName;
     }
     addFile(settings, true, wavFormat, mostCounts, mostSeconds, values);
     const bool csv = settings.file.format == "csv";
+    const bool wav = settings.file.format == "wav";
     std::string header;
     for (const std::string& column : columnNames(fields)) {
         header += (header.empty() ? "" : ",") + column;
     }
-    std::string write = "    for (int row = 0; row < counts; ++row) {\n";
-    std::size_t inFrame = 0; // elements of a frame of WAV, which is written at once
-    if (settings.file.format == "wav") {
-        write += std::string("        ") + fields[0].type->cName + " frame[" +
-                 std::to_string(columnNames(fields).size()) + "];\n";
-    }
+    std::string printRow;
+    std::string frame; // the elements of a row
     for (std::size_t f = 0; f < fields.size(); ++f) {
         const ElementType& type = *fields[f].type;
         const std::string array = "field" + std::to_string(f + 1);
         const std::string perCount = std::to_string(fields[f].perCount);
+        const std::string times = fields[f].perCount == 1 ? "" : " * " + perCount;
         values["FIELDS"] +=
-            "\nstatic " + std::string(type.cName) + " " + array + "[MOST * " + perCount + "];";
+            "\nstatic " + std::string(type.cName) + " " + array + "[MOST" + times + "];";
         values["READ"] += fill(readField, {{"NAME", quote(fields[f].name)},
                                            {"TYPE", quote(type.name)},
-                                           {"PERCOUNT", perCount},
+                                           {"TIMES", times},
                                            {"ARRAY", array}});
-        const std::string row = array + " + row * " + perCount;
-        const std::string size = "sizeof(" + array + "[0])";
-        if (csv) {
-            write += "        for (int i = 0; i < " + perCount + "; ++i) {\n";
-            write +=
-                f == 0
-                    ? "            if (i > 0) {\n                putc(',', file);\n            }\n"
-                    : "            putc(',', file);\n";
-            write += "            " +
-                     printElement(type, "file", array + "[row * " + perCount + " + i]") +
-                     "        }\n";
-        } else if (settings.file.format == "wav") {
-            write += "        memcpy(frame + " + std::to_string(inFrame) + ", " + row + ", " +
-                     perCount + " * " + size + ");\n";
-            inFrame += fields[f].perCount;
+        const std::string row = array + "[row" + times;
+        if (times.empty()) {
+            printRow += f == 0 ? "" : "        putc(',', file);\n";
+            printRow += "        " + printElement(type, "file", row + "]");
         } else {
-            write += "        if (fwrite(" + row + ", " + size + ", " + perCount +
-                     ", file) != " + perCount + ") {\n            return 0;\n        }\n";
+            printRow += "        for (int i = 0; i < " + perCount + "; ++i) {\n            fputs(" +
+                        (f == 0 ? "i == 0 ? \"\" : " : "") + "\",\", file);\n            " +
+                        printElement(type, "file", row + " + i]") + "        }\n";
+        }
+        for (std::size_t i = 0; i < fields[f].perCount; ++i) {
+            frame +=
+                (frame.empty() ? "" : ", ") + row + (i == 0 ? "" : " + " + std::to_string(i)) + "]";
         }
     }
-    if (inFrame > 0) {
-        write += "        if (sf_write_raw(file, frame, sizeof(frame)) != sizeof(frame)) {\n"
-                 "            return 0;\n        }\n";
+    if (csv) {
+        values["WRITE"] = "    for (int row = 0; row < counts; ++row) {\n" + printRow +
+                          "        putc('\\n', file);\n    }\n    return !ferror(file);\n";
+    } else if (fields.size() == 1) {
+        const std::string size = "sizeof(field1[0]) * " + std::to_string(fields[0].perCount);
+        values["WRITE"] = wav ? "    const sf_count_t size = counts * (sf_count_t)(" + size +
+                                    ");\n    return sf_write_raw(file, field1, size) == size;\n"
+                              : "    return fwrite(field1, " + size +
+                                    ", (size_t)counts, file) == (size_t)counts;\n";
+    } else {
+        values["WRITE"] = "    for (int row = 0; row < counts; ++row) {\n        const " +
+                          std::string(fields[0].type->cName) + " frame[] = {" + frame +
+                          "};\n        if (" +
+                          (wav ? "sf_write_raw(file, frame, sizeof(frame)) != sizeof(frame)"
+                               : "fwrite(frame, sizeof(frame), 1, file) != 1") +
+                          ") {\n            return 0;\n        }\n    }\n    return 1;\n";
     }
-    write += csv ? "        putc('\\n', file);\n    }\n    return !ferror(file);\n"
-                 : "    }\n    return 1;\n";
-    if (inFrame > 0) {
+    if (wav) {
         values["START"] +=
             "    (void)sf_command(file, SFC_SET_ADD_PEAK_CHUNK, NULL, SF_FALSE); /* raw writes "
             "have none */\n";
@@ -534,19 +615,14 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
         values["START"] += "    fputs(" + quote(header) + " \"\\n\", file);\n";
     }
     values["FIELDS"] += "\n";
-    values["WRITE"] = write;
-    if (write.find("printNumber") != std::string::npos) {
-        values["PRINT"] = printFunction;
-    }
-    save(settings, fill(start, values) + fill(openFunction, values) + fill(readProgram, values) +
-                       fill(fileMain, values));
+    save(settings, std::string(readProgram).append(fileMain), values);
 }
 
 void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInput,
                double mostCounts, double mostSeconds)
 {
     const ElementType& type = elementType(settings.type);
-    Values values = commonValues(settings, true);
+    Values values = commonValues(settings, true, true);
     addFile(settings, false, "0", mostCounts, mostSeconds, values);
     values["ROWS"] = std::to_string(settings.block);
     values["COLUMNS"] = std::to_string(reader.getColumns());
@@ -556,30 +632,35 @@ void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInp
         values["FLUSH"] = flushInput;
     }
     if (settings.file.format == "wav") {
-        values["READ"] = std::string("    return (int)sf_readf_") + soundFunctions(type) +
+        values["READ"] = std::string("    return (int)sf_readf_") + wavEncoding(type).function +
                          "(file, elements, most);\n";
+        values["OPENED"] = checkWav;
     } else if (settings.file.format == "raw") {
-        values["READ"] =
-            "    const size_t count = fread(elements, sizeof(elements[0]), (size_t)most, file);\n"
-            "    return ferror(file) ? -1 : (int)count;\n";
+        values["READ"] = readRaw;
     } else {
-        const std::string conversion = type.name == std::string("double")  ? "%lf"
-                                       : type.name == std::string("float") ? "%f"
-                                                                           : type.cFormat;
-        if (reader.hasHeader()) {
-            values["START"] += "    (void)fscanf(file, \"%*[^\\n]\");\n";
+        values["WIDE"] = isFloating(type) ? type.cName : "long long";
+        values["CONVERT"] = isFloating(type) ? "strtod(*text, &end)" : "strtoll(*text, &end, 10)";
+        values["WRONG"] =
+            isFloating(type) ? "(errno != 0 && isinf(value))" : "errno != 0 || *element != value";
+        if (type.name == std::string_view("float")) {
+            values["CONVERT"] = "strtof(*text, &end)";
+        } else if (type.name == std::string_view("uint64")) {
+            values["WIDE"] = "unsigned long long";
+            values["CONVERT"] = "strtoull(*text, &end, 10)";
+            values["WRONG"] = "errno != 0 || **text == '-'";
+        } else if (type.name == std::string_view("logical")) {
+            values["WORDS"] = logicalWords;
+            values["WRONG"] = "value < 0 || value > 1";
         }
-        values["READ"] = "    int count = 0;\n"
-                         "    while (count < most * COLUMNS && fscanf(file, \"" +
-                         conversion +
-                         "%*[, \\r\\n\\t]\", &elements[count]) == 1) {\n"
-                         "        ++count;\n"
-                         "    }\n"
-                         "    return count % COLUMNS == 0 && (count > 0 || feof(file)) ? count / "
-                         "COLUMNS : -1;\n";
+        values["TAKE"] = fill(takeElement, values);
+        if (const std::size_t line = reader.getHeaderLine(); line > 0) {
+            values["HEADER"] = " || line == " + std::to_string(line);
+            values["NAMES"] = ", or the names of the columns";
+        }
+        values["TYPENAME"] = type.name;
+        values["READ"] = fill(readCsv, values);
     }
-    save(settings, fill(start, values) + fill(openFunction, values) + fill(writeProgram, values) +
-                       fill(fileMain, values));
+    save(settings, std::string(writeProgram).append(fileMain), values);
 }
 
 } // namespace brenix

@@ -1,11 +1,8 @@
 // The command info.
 
 #include "Commands.hpp"
-#include "EmitC.hpp"
 #include "brenixcoder/coder.h"
 #include "brenixcore/plugin/Inspect.hpp"
-
-#include <nlohmann/json.hpp>
 
 #include <iostream>
 #include <optional>
@@ -15,8 +12,6 @@ namespace brenix
 
 namespace
 {
-
-using Json = nlohmann::ordered_json;
 
 /// The properties that the device describes, and those that are asked for.
 std::vector<PropertyValue> findProperties(Channel& channel, const Settings& settings)
@@ -110,7 +105,7 @@ ExitCode showInfo(const Settings& settings)
         }
     }
     if (settings.json) {
-        std::cout << Json({{"streams", streams}, {"properties", list}}).dump(2) << '\n';
+        printJson(std::cout, {{"streams", streams}, {"properties", list}}, 2);
     }
     if (!settings.emitC.empty()) {
         emitInfo(settings, properties);

@@ -3,8 +3,6 @@
 #include "Commands.hpp"
 #include "brenixcore/plugin/Inspect.hpp"
 
-#include <nlohmann/json.hpp>
-
 #include <algorithm>
 #include <cctype>
 #include <filesystem>
@@ -18,7 +16,6 @@ namespace
 
 using brenixcore::plugin::DescribedValue;
 using brenixcore::plugin::PluginReport;
-using Json = nlohmann::ordered_json;
 
 std::vector<std::string> installedPlugins()
 {
@@ -94,13 +91,18 @@ ExitCode listPlugins(const Settings& settings)
     ExitCode result = Success;
     for (const std::string& name :
          settings.plugins.empty() ? installedPlugins() : settings.plugins) {
-        if (settings.namesOnly) {
-            std::cout << name << '\n';
-            continue;
-        }
         const PluginReport report = brenixcore::plugin::inspectPlugin(name);
         if (!report.problem.empty()) {
             result = Failed;
+        }
+        if (settings.namesOnly) {
+            if (report.problem.empty()) {
+                std::cout << name << '\n';
+            } else {
+                brenix::report(settings,
+                               {"", name + ": " + report.problem + ": " + report.message});
+            }
+            continue;
         }
         if (settings.json) {
             Json entry = toJson(name, report);
@@ -123,9 +125,8 @@ ExitCode listPlugins(const Settings& settings)
         }
     }
     if (settings.json) {
-        std::cout
-            << Json({{"folder", brenixcore::plugin::pluginFolder()}, {"plugins", list}}).dump(2)
-            << '\n';
+        printJson(std::cout, {{"folder", brenixcore::plugin::pluginFolder()}, {"plugins", list}},
+                  2);
     }
     return result;
 }
@@ -148,7 +149,7 @@ ExitCode checkPlugins(const Settings& settings)
         }
     }
     if (settings.json) {
-        std::cout << list.dump(2) << '\n';
+        printJson(std::cout, list, 2);
     }
     return result;
 }

@@ -6,12 +6,13 @@
 
 #include <array>
 #include <cerrno>
+#include <cmath>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
-#include <string_view>
+#include <limits>
 #include <system_error>
 
 namespace brenix
@@ -20,35 +21,22 @@ namespace brenix
 namespace
 {
 
-struct Encoding {
-    std::string_view type;
-    int format;
-    const char* formatName;
-    const char* functions;
-};
-
-// WAV keeps the elements of these types as they are in memory.
 constexpr std::array encodings = {
-    Encoding{"double", SF_FORMAT_DOUBLE, "SF_FORMAT_DOUBLE", "double"},
-    Encoding{"float", SF_FORMAT_FLOAT, "SF_FORMAT_FLOAT", "float"},
-    Encoding{"int32", SF_FORMAT_PCM_32, "SF_FORMAT_PCM_32", "int"},
-    Encoding{"int16", SF_FORMAT_PCM_16, "SF_FORMAT_PCM_16", "short"},
-    Encoding{"uint8", SF_FORMAT_PCM_U8, "SF_FORMAT_PCM_U8", nullptr},
+    WavEncoding{"double", SF_FORMAT_DOUBLE, "SF_FORMAT_DOUBLE", "double"},
+    WavEncoding{"float", SF_FORMAT_FLOAT, "SF_FORMAT_FLOAT", "float"},
+    WavEncoding{"int32", SF_FORMAT_PCM_32, "SF_FORMAT_PCM_32", "int"},
+    WavEncoding{"int16", SF_FORMAT_PCM_16, "SF_FORMAT_PCM_16", "short"},
+    WavEncoding{"uint8", SF_FORMAT_PCM_U8, "SF_FORMAT_PCM_U8", ""},
 };
-
-const Encoding& encodingOf(const ElementType& type)
-{
-    for (const Encoding& encoding : encodings) {
-        if (encoding.type == type.name) {
-            return encoding;
-        }
-    }
-    throw Failure("", std::string("a WAV file cannot hold samples of type ") + type.name);
-}
 
 [[noreturn]] void fail(const std::string& file, const std::string& problem)
 {
-    throw Failure("", (file == "-" ? "" : file + ": ") + problem);
+    throw Failure("", file + ": " + problem);
+}
+
+[[noreturn]] void failAsErrno(const std::string& file)
+{
+    fail(file, std::generic_category().message(errno));
 }
 
 struct CloseFile {
@@ -89,8 +77,8 @@ void requireOneType(const std::vector<Field>& fields, const char* format)
 {
     for (const Field& field : fields) {
         if (field.type != fields[0].type) {
-            fail("-", "the fields are of different types, which " + std::string(format) +
-                          " cannot hold: choose one with --field");
+            throw Failure("", "the fields are of different types, which " + std::string(format) +
+                                  " cannot hold: choose one with --field");
         }
     }
 }
@@ -100,7 +88,7 @@ class PlainWriter : public SampleWriter
 {
 public:
     PlainWriter(const SampleFile& sampleFile, const std::vector<Field>& fields)
-        : name(sampleFile.name), csv(sampleFile.format == "csv")
+        : name(sampleFile.outputName()), csv(sampleFile.format == "csv")
     {
         if (!csv) {
             requireOneType(fields, "raw");
@@ -108,7 +96,7 @@ public:
         file.reset(sampleFile.isPipe() ? ::fdopen(::dup(STDOUT_FILENO), "wb")
                                        : std::fopen(name.c_str(), "wb"));
         if (!file) {
-            fail(name, std::generic_category().message(errno));
+            failAsErrno(name);
         }
         if (csv) {
             std::string header;
@@ -143,14 +131,14 @@ public:
         }
         put(text.data(), text.size());
         if (std::fflush(file.get()) != 0) { // a reader of a pipe wants them now
-            fail(name, std::generic_category().message(errno));
+            failAsErrno(name);
         }
     }
 
     void finish() override
     {
         if (std::fclose(file.release()) != 0) {
-            fail(name, std::generic_category().message(errno));
+            failAsErrno(name);
         }
     }
 
@@ -158,7 +146,7 @@ private:
     void put(const void* data, std::size_t size)
     {
         if (std::fwrite(data, 1, size, file.get()) != size) {
-            fail(name, std::generic_category().message(errno));
+            failAsErrno(name);
         }
     }
 
@@ -172,22 +160,25 @@ class WavWriter : public SampleWriter
 {
 public:
     WavWriter(const SampleFile& sampleFile, const std::vector<Field>& fields)
-        : name(sampleFile.name)
+        : name(sampleFile.outputName())
     {
         requireOneType(fields, "WAV");
-        SF_INFO info{};
-        info.format = SF_FORMAT_WAV | encodingOf(*fields[0].type).format;
-        info.channels = static_cast<int>(rowSize(fields) / fields[0].type->size);
-        info.samplerate = static_cast<int>(sampleFile.rate);
-        if (info.samplerate <= 0) {
-            fail("-",
-                 "a WAV file needs a sample rate, which the device does not tell: give --rate");
+        const double rate = sampleFile.rate;
+        if (rate < 1 || rate > std::numeric_limits<int>::max() || rate != std::floor(rate)) {
+            throw Failure(
+                "", "a WAV file needs a whole number as sample rate, below 2^31, but " +
+                        (rate == 0 ? "the device tells none" : "it is " + std::to_string(rate)) +
+                        ": give --rate");
         }
+        SF_INFO info{};
+        info.format = SF_FORMAT_WAV | wavEncoding(*fields[0].type).format;
+        info.channels = static_cast<int>(rowSize(fields) / fields[0].type->size);
+        info.samplerate = static_cast<int>(rate);
         // The length stands at the front: a pipe gets the file when it is complete.
         if (sampleFile.isPipe()) {
             whole.reset(std::tmpfile());
             if (!whole) {
-                fail("a temporary file", std::generic_category().message(errno));
+                failAsErrno("a temporary file");
             }
         }
         sound.reset(whole ? sf_open_fd(::fileno(whole.get()), SFM_WRITE, &info, SF_FALSE)
@@ -217,12 +208,10 @@ public:
             std::array<char, 65536> block{};
             while (const std::size_t size =
                        std::fread(block.data(), 1, block.size(), whole.get())) {
-                if (std::fwrite(block.data(), 1, size, stdout) != size) {
-                    fail(name, std::generic_category().message(errno));
-                }
+                std::cout.write(block.data(), static_cast<std::streamsize>(size));
             }
-            if (std::fflush(stdout) != 0) {
-                fail(name, std::generic_category().message(errno));
+            if (std::ferror(whole.get()) != 0 || !std::cout.flush()) {
+                fail(name, "cannot be written");
             }
         }
     }
@@ -233,20 +222,24 @@ private:
     OwnedSound sound;
 };
 
-std::ifstream openInput(const SampleFile& file)
+/// The standard input as it is, or else the file, opened in `owned`.
+std::istream& openInput(const SampleFile& file, std::ifstream& owned)
 {
-    std::ifstream stream(file.isPipe() ? "/dev/stdin" : file.name, std::ios::binary);
-    if (!stream) {
-        fail(file.name, std::generic_category().message(errno));
+    if (file.isPipe()) {
+        return std::cin;
     }
-    return stream;
+    owned.open(file.name, std::ios::binary);
+    if (!owned) {
+        failAsErrno(file.name);
+    }
+    return owned;
 }
 
 /// At the end of the input: whether it was its end.
-void requireRead(const std::string& file, const std::ifstream& stream)
+void requireRead(const std::string& name, const std::istream& stream)
 {
     if (stream.bad()) {
-        fail(file == "-" ? "standard input" : file, "cannot be read");
+        fail(name, "cannot be read");
     }
 }
 
@@ -254,14 +247,14 @@ class CsvReader : public SampleReader
 {
 public:
     CsvReader(const SampleFile& file, const ElementType& elementType)
-        : name(file.name), type(elementType), stream(openInput(file))
+        : name(file.inputName()), type(elementType), stream(openInput(file, owned))
     {
         if (readLine()) {
             std::string wrong;
             const bool isRow = parseRow(type, line, first, wrong);
             columns = first.size() / type.size;
-            header = !isRow && !hasNumber(line);
-            if (header) {
+            if (!isRow && !hasNumber(line)) {
+                headerLine = lineNumber;
                 first.clear();
                 if (readLine()) {
                     parseLine(first);
@@ -322,7 +315,8 @@ private:
 
     std::string name;
     const ElementType& type;
-    std::ifstream stream;
+    std::ifstream owned;
+    std::istream& stream;
     std::string line;
     std::size_t lineNumber = 0;
     Bytes first; ///< the row that told the number of columns
@@ -332,7 +326,7 @@ class RawReader : public SampleReader
 {
 public:
     RawReader(const SampleFile& file, const ElementType& elementType)
-        : name(file.name), type(elementType), stream(openInput(file))
+        : name(file.inputName()), type(elementType), stream(openInput(file, owned))
     {
         std::error_code notAFile;
         const auto size = std::filesystem::file_size(file.name, notAFile);
@@ -359,18 +353,20 @@ public:
 private:
     std::string name;
     const ElementType& type;
-    std::ifstream stream;
+    std::ifstream owned;
+    std::istream& stream;
 };
 
 class WavReader : public SampleReader
 {
 public:
     WavReader(const SampleFile& file, const ElementType& elementType)
-        : name(file.name), type(elementType)
+        : name(file.inputName()), type(elementType), function(wavEncoding(type).function)
     {
-        if (soundFunctions(type) == nullptr) {
-            fail("-",
-                 std::string("WAV samples can be double, float, int32 or int16, not ") + type.name);
+        if (function.empty()) {
+            throw Failure("",
+                          std::string("WAV samples can be double, float, int32 or int16, not ") +
+                              type.name);
         }
         SF_INFO info{};
         sound.reset(file.isPipe() ? sf_open_fd(STDIN_FILENO, SFM_READ, &info, SF_FALSE)
@@ -399,14 +395,13 @@ public:
 private:
     sf_count_t readFrames(void* to, sf_count_t frames)
     {
-        const std::string_view functions = soundFunctions(type);
-        if (functions == "double") {
+        if (function == "double") {
             return sf_readf_double(sound.get(), static_cast<double*>(to), frames);
         }
-        if (functions == "float") {
+        if (function == "float") {
             return sf_readf_float(sound.get(), static_cast<float*>(to), frames);
         }
-        if (functions == "int") {
+        if (function == "int") {
             return sf_readf_int(sound.get(), static_cast<int*>(to), frames);
         }
         return sf_readf_short(sound.get(), static_cast<short*>(to), frames);
@@ -414,24 +409,20 @@ private:
 
     std::string name;
     const ElementType& type;
+    std::string_view function;
     OwnedSound sound;
 };
 
 } // namespace
 
-const char* wavEncoding(const ElementType& type)
+const WavEncoding& wavEncoding(const ElementType& type)
 {
-    return encodingOf(type).formatName;
-}
-
-const char* soundFunctions(const ElementType& type)
-{
-    for (const Encoding& encoding : encodings) {
+    for (const WavEncoding& encoding : encodings) {
         if (encoding.type == type.name) {
-            return encoding.functions;
+            return encoding;
         }
     }
-    return nullptr;
+    throw Failure("", std::string("a WAV file cannot hold samples of type ") + type.name);
 }
 
 void settleFormat(SampleFile& file)
@@ -467,7 +458,7 @@ std::unique_ptr<SampleWriter> openWriter(const SampleFile& file, const std::vect
 std::unique_ptr<SampleReader> openReader(const SampleFile& file, const ElementType& type)
 {
     if (type.isText) {
-        fail("-", "samples are numbers, not char");
+        throw Failure("", "samples are numbers, not char");
     }
     if (file.format == "wav") {
         return std::make_unique<WavReader>(file, type);

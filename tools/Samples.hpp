@@ -8,6 +8,7 @@
 #include <cstddef>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace brenix
@@ -20,6 +21,10 @@ struct SampleFile {
     double rate = 0;        ///< counts a second; 0 when it is not known
 
     bool isPipe() const { return name == "-"; }
+
+    // What errors call it.
+    std::string inputName() const { return isPipe() ? "standard input" : name; }
+    std::string outputName() const { return isPipe() ? "standard output" : name; }
 };
 
 /// Sets the format from the name's ending.
@@ -46,15 +51,15 @@ public:
     /// Appends up to that many rows, none at the end. Returns how many.
     virtual std::size_t read(std::size_t rows, Bytes& elements) = 0;
     std::size_t getColumns() const { return columns; }
-    double getRate() const { return rate; }       ///< 0 when the file does not tell
-    bool hasHeader() const { return header; }     ///< a first line that names columns
-    double getTotalRows() const { return total; } ///< 0 when it is not known
+    double getRate() const { return rate; }                  ///< 0 when the file does not tell
+    std::size_t getHeaderLine() const { return headerLine; } ///< that names columns; 0 for none
+    double getTotalRows() const { return total; }            ///< 0 when it is not known
 
 protected:
     std::size_t columns = 1;
     double rate = 0;
     double total = 0;
-    bool header = false;
+    std::size_t headerLine = 0;
 };
 
 std::unique_ptr<SampleReader> openReader(const SampleFile& file, const ElementType& type);
@@ -62,11 +67,17 @@ std::unique_ptr<SampleReader> openReader(const SampleFile& file, const ElementTy
 /// The names of the columns of CSV.
 std::vector<std::string> columnNames(const std::vector<Field>& fields);
 
-/// libsndfile's name of the encoding of a WAV file, such as "SF_FORMAT_DOUBLE".
-const char* wavEncoding(const ElementType& type);
+/// How a WAV file holds elements as they are in memory.
+struct WavEncoding {
+    std::string_view type;
+    int format;             ///< of libsndfile
+    const char* formatName; ///< in C
+    const char*
+        function; ///< the end of the names of libsndfile's functions; empty if there are none
+};
 
-/// The end of libsndfile's functions for the type, such as "double"; null if there are none.
-const char* soundFunctions(const ElementType& type);
+/// Throws a Failure for a type that WAV does not have.
+const WavEncoding& wavEncoding(const ElementType& type);
 
 } // namespace brenix
 

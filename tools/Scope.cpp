@@ -3,8 +3,6 @@
 #include "Commands.hpp"
 #include "brenixcoder/coder.h"
 
-#include <nlohmann/json.hpp>
-
 #include <unistd.h>
 
 #include <algorithm>
@@ -15,6 +13,7 @@
 #include <deque>
 #include <iostream>
 #include <limits>
+#include <optional>
 
 namespace brenix
 {
@@ -151,10 +150,9 @@ void show(const std::string& picture, bool first)
 {
     static int lines = 0; // of the last one
     if (!first) {
-        std::printf("\033[%dA\033[J", lines);
+        std::cout << "\033[" << lines << "A\033[J";
     }
-    std::fputs(picture.c_str(), stdout);
-    std::fflush(stdout);
+    std::cout << picture << std::flush;
     lines = static_cast<int>(std::count(picture.begin(), picture.end(), '\n'));
 }
 
@@ -246,41 +244,50 @@ ExitCode showScope(const Settings& settings)
     const bool live = !settings.json && isatty(STDOUT_FILENO) != 0;
     std::vector<Trace> traces;
     std::string error;
+    std::optional<Failure> failure;
     double drawn = -1;
     double fill = 0;
-    while (!reading.isOver()) {
-        fill = bufferFill(channel);
-        if (const std::size_t counts = reading.next(); counts > 0) {
-            add(traces, reading, counts, settings.window);
-        }
-        if (const auto raised = channel.deviceError()) {
-            error = raised->getId() + ": " + raised->what();
-            if (!live) {
-                std::cerr << error << '\n';
+    try {
+        while (!reading.isOver()) {
+            fill = bufferFill(channel);
+            if (const std::size_t counts = reading.next(); counts > 0) {
+                add(traces, reading, counts, settings.window);
+            }
+            if (const auto raised = channel.deviceError()) {
+                error = raised->text();
+                if (!live) {
+                    report(settings, *raised);
+                }
+            }
+            if (live && reading.getSeconds() - drawn > 0.04) {
+                show(draw(settings, traces, reading.getSeconds(), fill, error), drawn < 0);
+                drawn = reading.getSeconds();
             }
         }
-        if (live && reading.getSeconds() - drawn > 0.04) {
-            show(draw(settings, traces, reading.getSeconds(), fill, error), drawn < 0);
-            drawn = reading.getSeconds();
-        }
+    } catch (const Failure& thrown) {
+        failure = thrown;
     }
     const double seconds = reading.getSeconds();
     if (settings.json) {
-        auto list = nlohmann::ordered_json::array();
+        Json list = Json::array();
         for (const Trace& trace : traces) {
             list.push_back({{"name", trace.name}, {"peak", trace.peak}, {"rms", trace.rms()}});
         }
-        std::cout << nlohmann::ordered_json({{"counts", reading.getCounts()},
-                                             {"seconds", seconds},
-                                             {"channels", list}})
-                         .dump(2)
-                  << '\n';
+        printJson(std::cout,
+                  {{"counts", reading.getCounts()}, {"seconds", seconds}, {"channels", list}}, 2);
     } else {
         show(draw(settings, traces, seconds, fill, error), drawn < 0);
     }
-    channel.finish();
-    if (!settings.png.empty() && !traces.empty()) {
-        savePicture(settings, traces, rate);
+    try {
+        if (!settings.png.empty() && !traces.empty()) {
+            savePicture(settings, traces, rate);
+        }
+        if (failure) {
+            throw Failure(*failure);
+        }
+        channel.finish();
+    } catch (const Failure& thrown) {
+        channel.fail(thrown);
     }
     return error.empty() ? Success : Failed;
 }

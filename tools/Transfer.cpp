@@ -1,15 +1,13 @@
 // The commands read and write.
 
 #include "Commands.hpp"
-#include "EmitC.hpp"
 #include "brenixcoder/coder.h"
-
-#include <nlohmann/json.hpp>
 
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
 #include <iostream>
+#include <optional>
 #include <tuple>
 
 namespace brenix
@@ -22,7 +20,8 @@ namespace
 std::pair<double, double> extent(const Settings& settings, double rate)
 {
     if (rate > 0 && std::isfinite(settings.seconds)) {
-        return {std::min(settings.counts, std::round(settings.seconds * rate)), INFINITY};
+        return {std::min(settings.counts, std::max(std::round(settings.seconds * rate), 1.0)),
+                INFINITY};
     }
     return {settings.counts, settings.seconds};
 }
@@ -30,10 +29,8 @@ std::pair<double, double> extent(const Settings& settings, double rate)
 void summarise(const Settings& settings, const char* verb, double counts, double seconds)
 {
     if (settings.json) {
-        std::cerr << nlohmann::ordered_json({{"counts", counts},
-                                             {"seconds", seconds},
-                                             {"interrupted", isInterrupted()}})
-                  << '\n';
+        printJson(std::cerr,
+                  {{"counts", counts}, {"seconds", seconds}, {"interrupted", isInterrupted()}});
     } else if (!settings.quiet) {
         std::fprintf(stderr, "%s %.0f counts in %.3g s%s\n", verb, counts, seconds,
                      isInterrupted() ? ", interrupted" : "");
@@ -92,7 +89,7 @@ ExitCode readSamples(const Settings& given)
     Progress progress(std::min(most, channel.number("Frames", "int64").value_or(INFINITY)),
                       settings.quiet);
     std::unique_ptr<SampleWriter> writer;
-    double seconds = 0;
+    std::optional<Failure> failure;
     try {
         bool broken = false;
         while (!reading.isOver()) {
@@ -108,14 +105,21 @@ ExitCode readSamples(const Settings& given)
                 reading.endWithAvailable();
             }
         }
-        progress.finish();
-        seconds = reading.getSeconds();
+    } catch (const Failure& thrown) {
+        failure = thrown;
+    }
+    progress.finish();
+    const double seconds = reading.getSeconds();
+    try {
         if (writer) {
-            writer->finish();
+            writer->finish(); // what came before a failure is kept
+        }
+        if (failure) {
+            throw Failure(*failure);
         }
         channel.finish();
-    } catch (const Failure& failure) {
-        channel.fail(failure);
+    } catch (const Failure& thrown) {
+        channel.fail(thrown);
     }
     if (!writer && !isInterrupted()) {
         throw Failure("", "the device delivered nothing");

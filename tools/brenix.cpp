@@ -5,11 +5,10 @@
 #include <CLI/CLI.hpp>
 #include <nlohmann/json.hpp>
 
+#include <algorithm>
 #include <cmath>
-#include <cstdio>
-#include <functional>
 #include <iostream>
-#include <map>
+#include <string_view>
 
 namespace
 {
@@ -46,24 +45,24 @@ void addList(CLI::App& command, const char* name, std::vector<std::string>& list
     command.add_option(name, list, help)->type_name(value)->allow_extra_args(false);
 }
 
-/// Counts cannot be divided.
-const CLI::Validator& wholeCounts()
+/// A number above 0; of counts, which cannot be divided, a whole one.
+void addNumber(CLI::App& command, const char* name, double& number, const char* help,
+               const char* unit)
 {
-    static const CLI::Validator check(
-        [](std::string& text) {
-            double value = 0;
-            return CLI::detail::lexical_cast(text, value) && value >= 1 && std::isfinite(value) &&
-                           value == std::floor(value)
-                       ? std::string()
-                       : text + " is not a whole number of at least 1";
-        },
-        "");
-    return check;
+    const bool whole = unit == std::string_view("COUNTS");
+    const auto check = [whole](const std::string& text) {
+        double value = 0;
+        const bool ok = CLI::detail::lexical_cast(text, value) && std::isfinite(value) &&
+                        value > 0 && (!whole || value == std::floor(value));
+        return ok      ? std::string()
+               : whole ? text + " is not a whole number of at least 1"
+                       : text + " is not a number above 0";
+    };
+    command.add_option(name, number, help)->type_name(unit)->check(check);
 }
 
-void addChannel(CLI::App& command, Settings& settings)
+void addChannel(CLI::App& command, ChannelSettings& channel, double& limit)
 {
-    ChannelSettings& channel = settings.channel;
     command.add_option("device", channel.device, "Device plug-in: a name or a path")
         ->type_name("PLUGIN")
         ->required();
@@ -76,31 +75,18 @@ void addChannel(CLI::App& command, Settings& settings)
             "OPTION");
     addList(command, "-f,--filter", channel.filters,
             "Filter plug-in and its options, such as \"scale Gain=0.5\"", "FILTER");
-    command
-        .add_option_function<double>(
-            "--limit",
-            [&channel](double limit) { channel.inputLimit = channel.outputLimit = limit; },
-            "Counts that a stream buffers at most (default 65536)")
-        ->type_name("COUNTS")
-        ->check(wholeCounts());
+    addNumber(command, "--limit", limit, "Counts that a stream buffers at most (default 65536)",
+              "COUNTS");
 }
 
 void addExtent(CLI::App& command, Settings& settings)
 {
-    command.add_option("-n,--counts", settings.counts, "End after so many counts")
-        ->type_name("COUNTS")
-        ->check(wholeCounts());
-    command
-        .add_option(
-            "-s,--seconds", settings.seconds,
-            "End after so many seconds: of the signal if its rate is known, or else of time")
-        ->type_name("SECONDS")
-        ->check(CLI::PositiveNumber);
-    command
-        .add_option("-r,--rate", settings.file.rate,
-                    "Counts a second, if the device has no property SampleRate")
-        ->type_name("HZ")
-        ->check(CLI::PositiveNumber);
+    addNumber(command, "-n,--counts", settings.counts, "End after so many counts", "COUNTS");
+    addNumber(command, "-s,--seconds", settings.seconds,
+              "End after so many seconds: of the signal if its rate is known, or else of time",
+              "SECONDS");
+    addNumber(command, "-r,--rate", settings.file.rate,
+              "Counts a second, if the device has no property SampleRate", "HZ");
 }
 
 void addFields(CLI::App& command, Settings& settings)
@@ -126,23 +112,9 @@ void addEmit(CLI::App& command, Settings& settings)
         ->type_name("FILE");
 }
 
-void report(const Settings& settings, const std::string& id, const std::string& message)
+ExitCode run(Settings& settings, int count, char** arguments)
 {
-    if (settings.json) {
-        std::cerr << nlohmann::ordered_json({{"error", {{"id", id}, {"message", message}}}})
-                  << '\n';
-    } else {
-        std::cerr << "brenix: " << id << (id.empty() || message.empty() ? "" : ": ") << message
-                  << '\n';
-    }
-}
-
-int run(int count, char** arguments)
-{
-    Settings settings;
-    settings.commandLine = commandLine(count, arguments);
-    std::function<ExitCode()> action;
-
+    ExitCode result = Success;
     CLI::App app("Lists and checks plug-ins, and reads and writes samples through a channel.",
                  "brenix");
     app.set_version_flag("--version", "brenix " BRENIX_VERSION);
@@ -152,33 +124,34 @@ int run(int count, char** arguments)
     const auto add = [&](const char* name, const char* help, ExitCode (*command)(const Settings&)) {
         CLI::App* const subcommand = app.add_subcommand(name, help);
         subcommand->add_flag("--json", settings.json, "Results and errors as JSON");
-        subcommand->callback([&, command] { action = [&, command] { return command(settings); }; });
+        subcommand->callback([&, command] { result = command(settings); });
         return subcommand;
     };
+    double& inputLimit = settings.channel.inputLimit;
 
     CLI::App* command = add("plugins", "List plug-ins and their options", listPlugins);
     command->add_option("plugin", settings.plugins, "Plug-ins (default: all that are installed)");
-    command->add_flag("--names", settings.namesOnly, "Names alone");
+    command->add_flag("--names", settings.namesOnly, "Names alone")->excludes("--json");
 
     command = add("check", "Tell why plug-ins do not load", checkPlugins);
     command->add_option("plugin", settings.plugins, "Plug-ins: names or paths")->required();
 
     command = add("info", "Show the properties and streams of a device", showInfo);
-    addChannel(*command, settings);
+    addChannel(*command, settings.channel, inputLimit);
     addList(*command, "-p,--property", settings.properties,
             "Property that the plug-in does not describe: Name:type", "PROPERTY");
     command->add_flag("--open", settings.open, "Open the channel, too");
     addEmit(*command, settings);
 
     command = add("read", "Read samples from a device", readSamples);
-    addChannel(*command, settings);
+    addChannel(*command, settings.channel, inputLimit);
     addExtent(*command, settings);
     addFields(*command, settings);
     addFile(*command, settings, "-w,--to", "File for the samples (default: standard output)");
     addEmit(*command, settings);
 
     command = add("write", "Write samples to a device", writeSamples);
-    addChannel(*command, settings);
+    addChannel(*command, settings.channel, settings.channel.outputLimit);
     addExtent(*command, settings);
     addFile(*command, settings, "-i,--from", "File of the samples (default: standard input)");
     command->add_option("-t,--type", settings.type, "Element type to write")->capture_default_str();
@@ -188,7 +161,7 @@ int run(int count, char** arguments)
     addEmit(*command, settings);
 
     command = add("scope", "Show a live signal", showScope);
-    addChannel(*command, settings);
+    addChannel(*command, settings.channel, inputLimit);
     addExtent(*command, settings);
     addFields(*command, settings);
     command->add_option("--window", settings.window, "Counts across the screen")
@@ -200,33 +173,52 @@ int run(int count, char** arguments)
 
     try {
         app.parse(count, arguments);
-    } catch (const CLI::ParseError& error) {
-        return app.exit(error) == 0 ? Success : WrongUsage;
+    } catch (const CLI::Success& help) {
+        app.exit(help);
     }
-    try {
-        catchInterrupts();
-        const ExitCode result = action();
-        if (!std::cout.flush() || std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {
-            throw Failure("", "standard output: cannot be written");
-        }
-        return result;
-    } catch (const Failure& failure) {
-        report(settings, failure.getId(), failure.what());
-        return Failed;
-    } catch (const std::invalid_argument& error) {
-        report(settings, "", error.what());
-        return WrongUsage;
+    if (!std::cout.flush()) {
+        throw Failure("", "standard output: cannot be written");
     }
+    return result;
 }
 
 } // namespace
 
+void brenix::printJson(std::ostream& stream, const nlohmann::ordered_json& value, int indent)
+{
+    stream << value.dump(indent, ' ', false, nlohmann::ordered_json::error_handler_t::replace)
+           << '\n';
+}
+
+void brenix::report(const Settings& settings, const Failure& failure)
+{
+    if (settings.json) {
+        printJson(std::cerr, {{"error", {{"id", failure.getId()}, {"message", failure.what()}}}});
+    } else {
+        std::cerr << "brenix: " << failure.text() << '\n';
+    }
+}
+
 int main(int count, char** arguments)
 {
+    Settings settings;
+    settings.commandLine = commandLine(count, arguments);
+    settings.json =
+        std::find(arguments, arguments + count, std::string_view("--json")) != arguments + count;
     try {
-        return run(count, arguments);
+        catchInterrupts();
+        std::ios::sync_with_stdio(false);
+        return run(settings, count, arguments);
+    } catch (const CLI::ParseError& error) {
+        report(settings, {"", error.what() + std::string("; see brenix --help")});
+        return WrongUsage;
+    } catch (const std::invalid_argument& error) {
+        report(settings, {"", error.what()});
+        return WrongUsage;
+    } catch (const Failure& failure) {
+        report(settings, failure);
     } catch (const std::exception& error) {
-        std::cerr << "brenix: " << error.what() << '\n';
-        return Failed;
+        report(settings, {"", error.what()});
     }
+    return Failed;
 }
