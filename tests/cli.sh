@@ -62,7 +62,8 @@ done <<END
 2|at most 16 options|info signal $(printf -- '-o Foo=1 %.0s' {1..17})
 0|Frequency: 1000 Hz|info signal -o Frequency:int32=1000 -o Waveform:char=sine -o Pace=fast -o Channels=1
 1|Custom property: Foo not found|info signal -p Foo:double
-2|--nonsense|info signal --nonsense
+2|{"error":{"id":"","message":"The following argument was not expected: --nonsense|info signal --json --nonsense
+1|{"error":{"id":"brenix:Device:failed","message":"Field none|scope $plugins/probe.so -o Packets:int32=2,-4 --json
 0|wrote 2 counts|write loopback -i samples.csv -t int16
 1|uneven.csv: line 2: 1 values instead of 2|write loopback -i uneven.csv
 1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
@@ -76,7 +77,11 @@ done <<END
 2|--counts: 1.5 is not a whole number of at least 1|read signal -n 1.5
 2|--limit: 0.5 is not a whole number of at least 1|read signal -n 1 --limit 0.5
 2|--limit: inf is not a whole number|read signal -n 2 --limit inf
+2|--seconds: nan is not a number above 0|read signal -s nan
+2|--rate: 0 is not a number above 0|read signal -n 1 -r 0
+1|a WAV file needs a whole number as sample rate|read signal -n 1 -r 44100.5 -w rate.wav
 1|does not load|plugins nosuch
+1|brenix: nosuch: notFound|plugins --names signal nosuch
 1|the data has no field Foo|read signal -n 1 --field Foo
 0|RMS 0.7071|scope signal -o Pace=fast -n 4800 --png picture.png
 END
@@ -99,6 +104,26 @@ got=0
 timeout -s INT 1 brenix read signal -w part.raw 2>summary || got=$?
 [[ -s part.raw && $(stat -c %s part.raw) -eq $(($(awk '{ print $2 * 8 }' summary))) ]] ||
     fail "an interrupted read: $(cat summary)"
+got=0
+exec 3<>pipe
+timeout --preserve-status -s INT -k 5 0.5 brenix write loopback -q <&3 || got=$?
+[[ $got -eq 130 ]] || fail "an interrupted write that waits for its input: exit code $got"
+
+# Completion offers what fits.
+# shellcheck source=/dev/null
+source "$source/tools/brenix.bash"
+while IFS='|' read -r words offered; do
+    eval "COMP_WORDS=(brenix $words)"
+    COMP_CWORD=$((${#COMP_WORDS[@]} - 1))
+    _brenix
+    [[ ${COMPREPLY[*]} == "$offered" ]] || fail "completion of $words: ${COMPREPLY[*]}"
+done <<'END'
+read s|serial signal
+read signal -c ''|columns identity
+read signal -f ''|decimate scale
+write loopback -t u|uint8 uint16 uint32 uint64
+check co|columns
+END
 
 # Documented options and properties are those that the plug-ins describe.
 brenix plugins --json | jq -r '.plugins[] | .name as $p | (.options + .properties)[] |
@@ -112,6 +137,11 @@ awk -F'|' '/^## / { gsub("`", "", $0); n = split($0, words, " "); plugin = words
 [[ $(wc -l <documented) -gt 30 ]] || fail "no tables found in plugins.md"
 diff described documented >&2 || fail "plug-ins and plugins.md differ"
 
+compile() {
+    "$cc" -std=c99 -Wall -Wextra -Wpedantic -Werror "-I$source/include" program.c -o program \
+        "-L$build/lib" -lbrenixcoder -lsndfile -lm "-Wl,-rpath,$build/lib"
+}
+
 # Emitted programs: each does the same again. The result is a file, or what is printed.
 emitted() { # FILE-OF-RESULT ARGUMENTS...
     local result=$1
@@ -119,8 +149,7 @@ emitted() { # FILE-OF-RESULT ARGUMENTS...
     rm -f "$result" program
     timeout 20 brenix "$@" --emit-c program.c >stdout
     if [[ -e $result ]]; then mv "$result" first; else mv stdout first; fi
-    "$cc" -std=c99 -Wall -Wextra -Wpedantic -Werror "-I$source/include" program.c -o program \
-        "-L$build/lib" -lbrenixcoder -lsndfile -lm "-Wl,-rpath,$build/lib"
+    compile
     timeout 20 ./program >stdout || fail "the program fails"
     if [[ -e $result ]]; then cp "$result" second; else mv stdout second; fi
     if [[ ! -s first ]] || ! cmp first second; then
@@ -137,6 +166,26 @@ emitted a.wav read "${signal[@]}" -c columns -n 5000 -w a.wav
 emitted b.au write audiofile -o FileName=b.au -o Mode=write -o Channels=2 -o SampleFormat=DOUBLE -i a.wav
 emitted c.wav write audiofile -o FileName=c.wav -o Mode=write -o Channels=2 -i samples.csv -f 'scale Gain=0.1'
 emitted d.wav write audiofile -o FileName=d.wav -o Mode=write -o Channels=2 --format raw -i samples.raw -n 3000
+printf '12345678123' >torn.raw
+if ./program torn.raw 2>errors || ! grep -q 'last element' errors; then
+    fail "the program of a torn file: $(cat errors)"
+fi
+
+# They tell what is wrong in their input, and keep what came before an error of the device.
+brenix write loopback -q -t int8 -i samples.csv --emit-c program.c
+compile
+for row in 300,1 1 1,2,3 1,x; do
+    printf 'a,b\n1,2\n%s\n' "$row" >bad.csv
+    if ./program bad.csv 2>errors || ! grep -q "line 3: not 2 values of type int8: $row" errors; then
+        fail "the program of $row: $(cat errors)"
+    fi
+done
+brenix read "$plugins/probe.so" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
+sed -i 's/{2, 3, 4}/{2, 3, -4}/' program.c
+compile
+if ./program broken.csv 2>errors || ! cmp broken.csv kept.csv; then
+    fail "the program of a device that fails: $(cat errors)"
+fi
 
 # Samples arrive as they were: a file of each format, through pipes.
 brenix read "${signal[@]}" -n 3000 --format raw -q >samples.raw

@@ -18,9 +18,8 @@ namespace
 
 /// Calls a function that ends with an option list. The list always has maxOptions options: what is
 /// behind the number that is told is not looked at.
-template <typename Call, std::size_t... I>
-int callWithOptions(const std::vector<Option>& options, const Call& call,
-                    std::index_sequence<I...> /*indexes*/)
+template <typename Call>
+int callWithOptions(const std::vector<Option>& options, const Call& call)
 {
     std::array<std::tuple<const char*, const char*, int, const void*>, maxOptions> list;
     for (std::size_t i = 0; i < options.size(); ++i) {
@@ -28,13 +27,7 @@ int callWithOptions(const std::vector<Option>& options, const Call& call,
                       options[i].elements.data()};
     }
     return std::apply([&](auto... arguments) { return call(options.size(), arguments...); },
-                      std::tuple_cat(list[I]...));
-}
-
-template <typename Call>
-int callWithOptions(const std::vector<Option>& options, const Call& call)
-{
-    return callWithOptions(options, call, std::make_index_sequence<maxOptions>());
+                      std::apply([](auto... option) { return std::tuple_cat(option...); }, list));
 }
 
 /// Adds to an error without a message why a plug-in did not load.
@@ -50,6 +43,16 @@ Failure explained(const Failure& failure, const std::vector<std::string>& names)
 }
 
 } // namespace
+
+std::optional<Failure> caught(const std::function<void()>& work)
+{
+    try {
+        work();
+    } catch (const Failure& failure) {
+        return failure;
+    }
+    return std::nullopt;
+}
 
 std::vector<Option> parseOptions(const std::vector<std::string>& texts)
 {
@@ -128,14 +131,23 @@ void Channel::open(const ChannelSettings& settings)
                           [&](auto... list) { return coderChannelOpen(handle, list...); }));
 }
 
-void Channel::finish()
+void Channel::finish(const std::optional<Failure>& failure)
 {
-    std::uint8_t isOpen = 0;
-    check(coderChannelIsOpen(handle, &isOpen));
-    if (isOpen != 0) {
-        check(coderChannelClose(handle));
+    const auto ended = failure ? failure : caught([&] {
+        std::uint8_t isOpen = 0;
+        check(coderChannelIsOpen(handle, &isOpen));
+        if (isOpen != 0) {
+            check(coderChannelClose(handle));
+        }
+    });
+    coderChannelClose(handle); // the device may tell its error only now
+    if (const auto error = deviceError()) {
+        throw Failure(error->getId(),
+                      error->what() + (ended ? "; also: " + ended->text() : std::string()));
     }
-    checkDevice();
+    if (ended) {
+        throw Failure(*ended);
+    }
     check(coderChannelTerm(handle));
 }
 
@@ -175,23 +187,6 @@ std::optional<Failure> Channel::deviceError()
     return Failure(id.data(), message.data());
 }
 
-void Channel::checkDevice()
-{
-    if (const auto error = deviceError()) {
-        throw Failure(*error);
-    }
-}
-
-void Channel::fail(const Failure& failure)
-{
-    coderChannelClose(handle); // the device may tell its error only now
-    const auto error = deviceError();
-    if (!error) {
-        throw Failure(failure);
-    }
-    throw Failure(error->getId(), std::string(error->what()) + "; also: " + failure.text());
-}
-
 double Channel::inputAvailable()
 {
     double available = 0;
@@ -226,12 +221,6 @@ double Channel::nextBuffer(double most)
     return counts;
 }
 
-/// Whether the last call failed because the value is of the type, but larger than the capacity.
-bool Channel::isTooSmall() const
-{
-    return std::string_view(lastError().what()).rfind("Property value: ", 0) == 0;
-}
-
 /// Copies a value of which nobody tells how many elements it has: they are as many as the smallest
 /// capacity that is enough. Returns false when there is no value of the type.
 bool Channel::readAll(const ElementType& type, const Copy& copy, std::size_t guess, Bytes& elements)
@@ -239,8 +228,8 @@ bool Channel::readAll(const ElementType& type, const Copy& copy, std::size_t gue
     std::size_t enough = guess;
     elements.resize(enough * type.size);
     while (copy(enough, elements.data()) == 0) {
-        if (!isTooSmall()) {
-            return false;
+        if (std::string_view(lastError().what()).rfind("Property value: ", 0) != 0) {
+            return false; // it is not that the capacity is too small
         }
         enough *= 2;
         elements.resize(enough * type.size);

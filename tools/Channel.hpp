@@ -39,6 +39,9 @@ private:
     std::string id;
 };
 
+/// Does the work. Returns the failure that ends it.
+std::optional<Failure> caught(const std::function<void()>& work);
+
 /// What the command line says of a channel.
 struct ChannelSettings {
     std::string device;
@@ -76,8 +79,9 @@ public:
 
     void open(const ChannelSettings& settings);
 
-    /// Closes, when it is open, and terminates. Errors of closing are thrown.
-    void finish();
+    /// Closes, when it is open, and terminates. Throws what fails, or the failure that ended a
+    /// transfer, behind the device's error if there is one: mostly that is the reason.
+    void finish(const std::optional<Failure>& failure = {});
 
     /// Throws the error of a call that returned 0.
     void check(int result);
@@ -86,11 +90,6 @@ public:
 
     /// Takes the device's asynchronous error, if there is one.
     std::optional<Failure> deviceError();
-    void checkDevice();
-
-    /// Closes and throws the failure that ended a transfer, behind the device's error if there is one:
-    /// mostly that is the reason.
-    [[noreturn]] void fail(const Failure& failure);
 
     /// The value of a property; nothing when there is none of that name and type.
     std::optional<Bytes> property(const std::string& name, const ElementType& type);
@@ -120,7 +119,6 @@ private:
 
     bool readAll(const ElementType& type, const Copy& copy, std::size_t guess, Bytes& elements);
     Copy fieldCopier(const Field& field) const;
-    bool isTooSmall() const;
     Failure lastError() const;
     std::optional<Field> findField(const std::string& name, double counts);
 

@@ -4,7 +4,6 @@
 
 #include "Channel.hpp"
 #include "Samples.hpp"
-#include "Terminal.hpp"
 
 #include <nlohmann/json.hpp>
 
@@ -75,6 +74,30 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
               double mostSeconds);
 void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInput,
                double mostCounts, double mostSeconds);
+
+/// From here on SIGINT or SIGTERM ends what is under way in good order, the third one at once.
+void catchInterrupts();
+bool isInterrupted();
+
+double secondsSince(std::chrono::steady_clock::time_point start);
+
+/// A line on a terminal's standard error: how far it is, the rate and the time that remains.
+class Progress
+{
+public:
+    /// A total that is not known is 0 or infinity.
+    Progress(double totalCounts, bool quiet);
+    void update(double counts);
+
+    /// Clears the line.
+    void finish() const;
+
+private:
+    double total;
+    bool shown;
+    std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();
+    std::chrono::steady_clock::time_point drawn = start;
+};
 
 /// Waits for counts and hands them over, one buffer after another, until the settings, the device or
 /// an interruption end it.

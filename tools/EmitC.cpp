@@ -43,9 +43,7 @@ std::string quote(std::string_view text)
     std::string literal = "\"";
     for (const char character : text) {
         const auto byte = static_cast<unsigned char>(character);
-        if (std::isalnum(byte) != 0 ||
-            std::string_view(" !#$&()*+,-./:;<=>[]^_{|}~").find(character) !=
-                std::string_view::npos) {
+        if (std::isprint(byte) != 0 && character != '"' && character != '\\' && character != '?') {
             literal += character;
         } else {
             std::array<char, 8> octal{};
@@ -139,17 +137,13 @@ constexpr std::string_view start = R"(/*
 static int setUp(void* channel)
 {
 @SETUP_DATA@    return check(channel, "coderChannelInit",
-            coderChannelInit(channel, @INIT@))@FILTERS@@OPEN@;
+            coderChannelInit(channel, @INIT@))@CALLS@;
 }
 )";
 
-constexpr std::string_view open = R"( &&
-           check(channel, "coderChannelOpen",
-            coderChannelOpen(channel, @LIST@)))";
-
-constexpr std::string_view filter = R"( &&
-           check(channel, "coderStreamAddFilter",
-            coderStreamAddFilter(coderChannelGet@STREAM@Stream(channel), @NAME@, @LIST@)))";
+constexpr std::string_view furtherCall = R"( &&
+           check(channel, "@CALL@",
+            @CALL@(@ARGUMENTS@)))";
 
 constexpr std::string_view clockFunction = R"(
 static double now(void)
@@ -449,17 +443,21 @@ Values commonValues(const Settings& settings, bool opens, bool output)
     values["LIBRARIES"] = "-lbrenixcoder";
     values["CHECK"] = checkText;
     values["INIT"] = optionList(parseOptions(channel.options), "init", values["SETUP_DATA"]);
-    if (opens) {
-        values["OPEN"] = fill(open, {{"LIST", optionList(parseOptions(channel.openOptions), "open",
-                                                         values["SETUP_DATA"])}});
-    }
+    const auto add = [&](const char* call, const std::string& arguments) {
+        values["CALLS"] += fill(furtherCall, {{"CALL", call}, {"ARGUMENTS", arguments}});
+    };
     for (std::size_t i = 0; i < channel.filters.size(); ++i) {
-        const FilterSettings parsed = parseFilter(channel.filters[i]);
-        values["FILTERS"] += fill(
-            filter, {{"STREAM", output ? "Output" : "Input"},
-                     {"NAME", quote(parsed.name)},
-                     {"LIST", optionList(parsed.options, "filter" + std::to_string(i + 1) + "_",
-                                         values["SETUP_DATA"])}});
+        const FilterSettings filter = parseFilter(channel.filters[i]);
+        add("coderStreamAddFilter",
+            (output ? "coderChannelGetOutputStream(channel), "
+                    : "coderChannelGetInputStream(channel), ") +
+                quote(filter.name) + ", " +
+                optionList(filter.options, "filter" + std::to_string(i + 1) + "_",
+                           values["SETUP_DATA"]));
+    }
+    if (opens) {
+        add("coderChannelOpen", "channel, " + optionList(parseOptions(channel.openOptions), "open",
+                                                         values["SETUP_DATA"]));
     }
     values["DEVICE"] = quote(channel.device);
     values["CONVERTER"] = quote(channel.converter);
@@ -558,10 +556,6 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
     addFile(settings, true, wavFormat, mostCounts, mostSeconds, values);
     const bool csv = settings.file.format == "csv";
     const bool wav = settings.file.format == "wav";
-    std::string header;
-    for (const std::string& column : columnNames(fields)) {
-        header += (header.empty() ? "" : ",") + column;
-    }
     std::string printRow;
     std::string frame; // the elements of a row
     for (std::size_t f = 0; f < fields.size(); ++f) {
@@ -612,7 +606,7 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
             "have none */\n";
     }
     if (csv) {
-        values["START"] += "    fputs(" + quote(header) + " \"\\n\", file);\n";
+        values["START"] += "    fputs(" + quote(csvHeader(fields)) + " \"\\n\", file);\n";
     }
     values["FIELDS"] += "\n";
     save(settings, std::string(readProgram).append(fileMain), values);
@@ -632,7 +626,7 @@ void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInp
         values["FLUSH"] = flushInput;
     }
     if (settings.file.format == "wav") {
-        values["READ"] = std::string("    return (int)sf_readf_") + wavEncoding(type).function +
+        values["READ"] = std::string("    return (int)") + wavEncoding(type).readName +
                          "(file, elements, most);\n";
         values["OPENED"] = checkWav;
     } else if (settings.file.format == "raw") {

@@ -6,6 +6,7 @@
 
 #include <iostream>
 #include <optional>
+#include <sstream>
 
 namespace brenix
 {
@@ -39,17 +40,16 @@ std::vector<PropertyValue> findProperties(Channel& channel, const Settings& sett
     return values;
 }
 
-Json toJson(const PropertyValue& value)
+Json toJson(const ElementType& type, const Bytes& elements)
 {
-    const std::string text = printElements(*value.type, value.elements);
-    if (value.type->isText) {
-        return text;
+    if (type.isText) {
+        return printElements(type, elements);
     }
     // What JSON has no number for, such as infinity, is null.
     Json list = Json::array();
-    for (std::size_t i = 0; i < value.elements.size(); i += value.type->size) {
+    for (std::size_t i = 0; i < elements.size(); i += type.size) {
         std::string element;
-        value.type->print(&value.elements[i], element);
+        type.print(&elements[i], element);
         const Json number = Json::parse(element, nullptr, false);
         list.push_back(number.is_discarded() ? Json(nullptr) : number);
     }
@@ -77,35 +77,32 @@ ExitCode showInfo(const Settings& settings)
     }
     const auto properties = findProperties(channel, settings);
     Json streams;
+    Json list = Json::array();
+    std::ostringstream text;
     for (const auto& [name, stream] :
          {std::pair("input", channel.inputStream()), std::pair("output", channel.outputStream())}) {
-        const auto dimension = countDimension(channel, stream);
-        streams[name] = dimension ? Json({{"countDimension", *dimension}}) : Json(nullptr);
-        if (settings.json) {
-            continue;
-        }
-        std::cout << name << ": ";
-        if (dimension) {
-            std::cout << "counts along dimension " << *dimension << '\n';
+        text << name << ": ";
+        if (const auto dimension = countDimension(channel, stream)) {
+            streams[name] = {{"countDimension", *dimension}};
+            text << "counts along dimension " << *dimension << '\n';
         } else {
-            std::cout << "none\n";
+            streams[name] = nullptr;
+            text << "none\n";
         }
     }
     channel.finish();
-    Json list = Json::array();
-    for (const PropertyValue& property : properties) {
-        if (settings.json) {
-            list.push_back({{"name", property.name},
-                            {"type", property.type->name},
-                            {"unit", property.unit},
-                            {"value", toJson(property)}});
-        } else {
-            std::cout << property.name << ": " << printElements(*property.type, property.elements)
-                      << (property.unit.empty() ? "" : " ") << property.unit << '\n';
-        }
+    for (const auto& [name, unit, type, elements] : properties) {
+        list.push_back({{"name", name},
+                        {"type", type->name},
+                        {"unit", unit},
+                        {"value", toJson(*type, elements)}});
+        text << name << ": " << printElements(*type, elements) << (unit.empty() ? "" : " ") << unit
+             << '\n';
     }
     if (settings.json) {
         printJson(std::cout, {{"streams", streams}, {"properties", list}}, 2);
+    } else {
+        std::cout << text.str();
     }
     if (!settings.emitC.empty()) {
         emitInfo(settings, properties);

@@ -1,12 +1,11 @@
 #include "Samples.hpp"
 
-#include <sndfile.h>
-
 #include <unistd.h>
 
 #include <array>
 #include <cerrno>
 #include <cmath>
+#include <cstdint>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
@@ -21,12 +20,22 @@ namespace brenix
 namespace
 {
 
+template <typename T, sf_count_t (*function)(SNDFILE*, T*, sf_count_t)>
+sf_count_t readAs(SNDFILE* sound, void* elements, sf_count_t frames)
+{
+    return function(sound, static_cast<T*>(elements), frames);
+}
+
 constexpr std::array encodings = {
-    WavEncoding{"double", SF_FORMAT_DOUBLE, "SF_FORMAT_DOUBLE", "double"},
-    WavEncoding{"float", SF_FORMAT_FLOAT, "SF_FORMAT_FLOAT", "float"},
-    WavEncoding{"int32", SF_FORMAT_PCM_32, "SF_FORMAT_PCM_32", "int"},
-    WavEncoding{"int16", SF_FORMAT_PCM_16, "SF_FORMAT_PCM_16", "short"},
-    WavEncoding{"uint8", SF_FORMAT_PCM_U8, "SF_FORMAT_PCM_U8", ""},
+    WavEncoding{"double", SF_FORMAT_DOUBLE, "SF_FORMAT_DOUBLE", "sf_readf_double",
+                readAs<double, sf_readf_double>},
+    WavEncoding{"float", SF_FORMAT_FLOAT, "SF_FORMAT_FLOAT", "sf_readf_float",
+                readAs<float, sf_readf_float>},
+    WavEncoding{"int32", SF_FORMAT_PCM_32, "SF_FORMAT_PCM_32", "sf_readf_int",
+                readAs<int, sf_readf_int>},
+    WavEncoding{"int16", SF_FORMAT_PCM_16, "SF_FORMAT_PCM_16", "sf_readf_short",
+                readAs<short, sf_readf_short>},
+    WavEncoding{"uint8", SF_FORMAT_PCM_U8, "SF_FORMAT_PCM_U8", nullptr, nullptr},
 };
 
 [[noreturn]] void fail(const std::string& file, const std::string& problem)
@@ -39,15 +48,12 @@ constexpr std::array encodings = {
     fail(file, std::generic_category().message(errno));
 }
 
-struct CloseFile {
-    void operator()(std::FILE* file) const noexcept { std::fclose(file); }
+template <auto function>
+struct Close {
+    void operator()(auto* file) const noexcept { function(file); }
 };
-using OwnedFile = std::unique_ptr<std::FILE, CloseFile>;
-
-struct CloseSound {
-    void operator()(SNDFILE* sound) const noexcept { sf_close(sound); }
-};
-using OwnedSound = std::unique_ptr<SNDFILE, CloseSound>;
+using OwnedFile = std::unique_ptr<std::FILE, Close<std::fclose>>;
+using OwnedSound = std::unique_ptr<SNDFILE, Close<sf_close>>;
 
 std::size_t rowSize(const std::vector<Field>& fields)
 {
@@ -99,21 +105,16 @@ public:
             failAsErrno(name);
         }
         if (csv) {
-            std::string header;
-            for (const std::string& column : columnNames(fields)) {
-                header += (header.empty() ? "" : ",") + column;
-            }
+            const std::string header = csvHeader(fields) + '\n';
             put(header.data(), header.size());
-            put("\n", 1);
         }
     }
 
     void write(const std::vector<Field>& fields, std::size_t counts) override
     {
         if (!csv) {
-            const Bytes rows = fields.size() == 1 ? Bytes() : interleave(fields, counts);
-            const Bytes& elements = fields.size() == 1 ? fields[0].elements : rows;
-            put(elements.data(), elements.size());
+            const Bytes rows = interleave(fields, counts);
+            put(rows.data(), rows.size());
             return;
         }
         text.clear();
@@ -187,11 +188,17 @@ public:
             fail(name, sf_strerror(nullptr));
         }
         sf_command(sound.get(), SFC_SET_ADD_PEAK_CHUNK, nullptr, SF_FALSE); // raw writes have none
+        // Whenever the command is killed, the file is one.
+        sf_command(sound.get(), SFC_SET_UPDATE_HEADER_AUTO, nullptr, SF_TRUE);
     }
 
     void write(const std::vector<Field>& fields, std::size_t counts) override
     {
         const Bytes rows = interleave(fields, counts);
+        size += static_cast<double>(rows.size());
+        if (size > std::numeric_limits<std::uint32_t>::max() - 4096.0) {
+            fail(name, "a WAV file ends at 4 GiB");
+        }
         if (sf_write_raw(sound.get(), rows.data(), static_cast<sf_count_t>(rows.size())) !=
             static_cast<sf_count_t>(rows.size())) {
             fail(name, sf_strerror(sound.get()));
@@ -206,9 +213,9 @@ public:
         if (whole) {
             std::rewind(whole.get());
             std::array<char, 65536> block{};
-            while (const std::size_t size =
+            while (const std::size_t part =
                        std::fread(block.data(), 1, block.size(), whole.get())) {
-                std::cout.write(block.data(), static_cast<std::streamsize>(size));
+                std::cout.write(block.data(), static_cast<std::streamsize>(part));
             }
             if (std::ferror(whole.get()) != 0 || !std::cout.flush()) {
                 fail(name, "cannot be written");
@@ -220,6 +227,7 @@ private:
     std::string name;
     OwnedFile whole;
     OwnedSound sound;
+    double size = 0; ///< bytes of the samples
 };
 
 /// The standard input as it is, or else the file, opened in `owned`.
@@ -247,9 +255,12 @@ class CsvReader : public SampleReader
 {
 public:
     CsvReader(const SampleFile& file, const ElementType& elementType)
-        : name(file.inputName()), type(elementType), stream(openInput(file, owned))
+        : SampleReader(file, elementType), stream(openInput(file, owned))
     {
         if (readLine()) {
+            if (line.rfind("\xEF\xBB\xBF", 0) == 0) { // the mark of UTF-8, of some editors
+                line.erase(0, 3);
+            }
             std::string wrong;
             const bool isRow = parseRow(type, line, first, wrong);
             columns = first.size() / type.size;
@@ -313,8 +324,6 @@ private:
 
     std::string place() const { return "line " + std::to_string(lineNumber) + ": "; }
 
-    std::string name;
-    const ElementType& type;
     std::ifstream owned;
     std::istream& stream;
     std::string line;
@@ -326,7 +335,7 @@ class RawReader : public SampleReader
 {
 public:
     RawReader(const SampleFile& file, const ElementType& elementType)
-        : name(file.inputName()), type(elementType), stream(openInput(file, owned))
+        : SampleReader(file, elementType), stream(openInput(file, owned))
     {
         std::error_code notAFile;
         const auto size = std::filesystem::file_size(file.name, notAFile);
@@ -351,8 +360,6 @@ public:
     }
 
 private:
-    std::string name;
-    const ElementType& type;
     std::ifstream owned;
     std::istream& stream;
 };
@@ -361,9 +368,9 @@ class WavReader : public SampleReader
 {
 public:
     WavReader(const SampleFile& file, const ElementType& elementType)
-        : name(file.inputName()), type(elementType), function(wavEncoding(type).function)
+        : SampleReader(file, elementType)
     {
-        if (function.empty()) {
+        if (wavEncoding(type).read == nullptr) {
             throw Failure("",
                           std::string("WAV samples can be double, float, int32 or int16, not ") +
                               type.name);
@@ -383,8 +390,8 @@ public:
     {
         const std::size_t size = elements.size();
         elements.resize(size + rows * columns * type.size);
-        const sf_count_t frames =
-            readFrames(&elements[size], static_cast<sf_count_t>(rows)); // 0 at the end
+        const sf_count_t frames = wavEncoding(type).read(
+            sound.get(), &elements[size], static_cast<sf_count_t>(rows)); // 0 at the end
         if (const int error = sf_error(sound.get()); error != SF_ERR_NO_ERROR) {
             fail(name, sf_error_number(error));
         }
@@ -393,23 +400,6 @@ public:
     }
 
 private:
-    sf_count_t readFrames(void* to, sf_count_t frames)
-    {
-        if (function == "double") {
-            return sf_readf_double(sound.get(), static_cast<double*>(to), frames);
-        }
-        if (function == "float") {
-            return sf_readf_float(sound.get(), static_cast<float*>(to), frames);
-        }
-        if (function == "int") {
-            return sf_readf_int(sound.get(), static_cast<int*>(to), frames);
-        }
-        return sf_readf_short(sound.get(), static_cast<short*>(to), frames);
-    }
-
-    std::string name;
-    const ElementType& type;
-    std::string_view function;
     OwnedSound sound;
 };
 
@@ -445,6 +435,15 @@ std::vector<std::string> columnNames(const std::vector<Field>& fields)
         }
     }
     return names;
+}
+
+std::string csvHeader(const std::vector<Field>& fields)
+{
+    std::string header;
+    for (const std::string& name : columnNames(fields)) {
+        header += (header.empty() ? "" : ",") + name;
+    }
+    return header;
 }
 
 std::unique_ptr<SampleWriter> openWriter(const SampleFile& file, const std::vector<Field>& fields)

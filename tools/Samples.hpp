@@ -5,6 +5,8 @@
 #include "Channel.hpp"
 #include "Values.hpp"
 
+#include <sndfile.h>
+
 #include <cstddef>
 #include <memory>
 #include <string>
@@ -46,6 +48,10 @@ std::unique_ptr<SampleWriter> openWriter(const SampleFile& file, const std::vect
 class SampleReader
 {
 public:
+    SampleReader(const SampleFile& file, const ElementType& elementType)
+        : name(file.inputName()), type(elementType)
+    {
+    }
     virtual ~SampleReader() = default;
 
     /// Appends up to that many rows, none at the end. Returns how many.
@@ -56,6 +62,8 @@ public:
     double getTotalRows() const { return total; }            ///< 0 when it is not known
 
 protected:
+    std::string name;
+    const ElementType& type;
     std::size_t columns = 1;
     double rate = 0;
     double total = 0;
@@ -64,16 +72,17 @@ protected:
 
 std::unique_ptr<SampleReader> openReader(const SampleFile& file, const ElementType& type);
 
-/// The names of the columns of CSV.
+/// The names of the columns of CSV, and the line of them.
 std::vector<std::string> columnNames(const std::vector<Field>& fields);
+std::string csvHeader(const std::vector<Field>& fields);
 
-/// How a WAV file holds elements as they are in memory.
+/// How a WAV file holds elements as they are in memory, in libsndfile's terms.
 struct WavEncoding {
     std::string_view type;
-    int format;             ///< of libsndfile
+    int format;
     const char* formatName; ///< in C
-    const char*
-        function; ///< the end of the names of libsndfile's functions; empty if there are none
+    const char* readName;   ///< of the function that reads; null if there is none
+    sf_count_t (*read)(SNDFILE* sound, void* elements, sf_count_t frames);
 };
 
 /// Throws a Failure for a type that WAV does not have.

@@ -3,6 +3,7 @@
 #include "Commands.hpp"
 #include "brenixcoder/coder.h"
 
+#include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -13,7 +14,6 @@
 #include <deque>
 #include <iostream>
 #include <limits>
-#include <optional>
 
 namespace brenix
 {
@@ -88,6 +88,21 @@ struct Trace {
     double rms() const { return std::sqrt(sumOfSquares / count); }
 };
 
+/// Of the terminal.
+struct Size {
+    int columns = 80;
+    int rows = 24;
+};
+
+Size terminalSize()
+{
+    winsize size{};
+    if (ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_col == 0 || size.ws_row == 0) {
+        return {};
+    }
+    return {size.ws_col, size.ws_row};
+}
+
 /// A trace as lines of half blocks, its largest value at the upper and the lower edge.
 std::string drawTrace(const Trace& trace, int columns, int rows)
 {
@@ -130,7 +145,7 @@ std::string printed(const char* format, double value)
 std::string draw(const Settings& settings, const std::vector<Trace>& traces, double seconds,
                  double fill, const std::string& error)
 {
-    const TerminalSize size = terminalSize();
+    const Size size = terminalSize();
     const int height =
         std::max(1, (size.rows - 3) / std::max<int>(1, static_cast<int>(traces.size())) - 1);
     const double counts = traces.empty() ? 0 : traces[0].count;
@@ -146,24 +161,14 @@ std::string draw(const Settings& settings, const std::vector<Trace>& traces, dou
 }
 
 /// Draws the picture anew in the place of the last one.
-void show(const std::string& picture, bool first)
+void show(const std::string& picture)
 {
     static int lines = 0; // of the last one
-    if (!first) {
+    if (lines > 0) {
         std::cout << "\033[" << lines << "A\033[J";
     }
     std::cout << picture << std::flush;
     lines = static_cast<int>(std::count(picture.begin(), picture.end(), '\n'));
-}
-
-/// A text of gnuplot's.
-std::string quoted(const std::string& text)
-{
-    std::string result = "'";
-    for (const char character : text) {
-        result += character == '\'' ? "''" : std::string(1, character);
-    }
-    return result + "'";
 }
 
 /// Has gnuplot draw everything that was read, one plot for each channel.
@@ -171,7 +176,7 @@ void savePicture(const Settings& settings, const std::vector<Trace>& traces, dou
 {
     auto* const onPipe = std::signal(SIGPIPE, SIG_IGN); // a gnuplot that ends early is told below
     // NOLINTNEXTLINE(cert-env33-c): nothing of the command comes from outside
-    std::FILE* const plot = ::popen("gnuplot", "w");
+    std::FILE* const plot = ::popen(settings.json ? "gnuplot 2>/dev/null" : "gnuplot", "w");
     if (plot == nullptr) {
         throw Failure("", "gnuplot cannot be started");
     }
@@ -179,13 +184,13 @@ void savePicture(const Settings& settings, const std::vector<Trace>& traces, dou
     std::fprintf(plot,
                  "set terminal png size 1000,%zu\nset output %s\nset multiplot layout %zu,1\n"
                  "set xlabel '%s'\nset grid\nunset key\n",
-                 100 + 200 * traces.size(), quoted(settings.png).c_str(), traces.size(),
+                 100 + 200 * traces.size(), quoted(settings.png, "''").c_str(), traces.size(),
                  rate > 0 ? "seconds" : "counts");
     for (const Trace& trace : traces) {
         const double step = trace.envelope.getSamplesOfEach() * unit;
         std::fprintf(plot,
                      "set title %s noenhanced\nplot '-' with filledcurves, '-' with lines lc 1\n",
-                     quoted(trace.name).c_str());
+                     quoted(trace.name, "''").c_str());
         for (int twice = 0; twice < 2; ++twice) { // the area between, and its upper edge
             double x = 0;
             for (const Range& range : trace.envelope.getRanges()) {
@@ -244,10 +249,9 @@ ExitCode showScope(const Settings& settings)
     const bool live = !settings.json && isatty(STDOUT_FILENO) != 0;
     std::vector<Trace> traces;
     std::string error;
-    std::optional<Failure> failure;
     double drawn = -1;
     double fill = 0;
-    try {
+    const auto failure = caught([&] {
         while (!reading.isOver()) {
             fill = bufferFill(channel);
             if (const std::size_t counts = reading.next(); counts > 0) {
@@ -260,13 +264,11 @@ ExitCode showScope(const Settings& settings)
                 }
             }
             if (live && reading.getSeconds() - drawn > 0.04) {
-                show(draw(settings, traces, reading.getSeconds(), fill, error), drawn < 0);
+                show(draw(settings, traces, reading.getSeconds(), fill, error));
                 drawn = reading.getSeconds();
             }
         }
-    } catch (const Failure& thrown) {
-        failure = thrown;
-    }
+    });
     const double seconds = reading.getSeconds();
     if (settings.json) {
         Json list = Json::array();
@@ -276,19 +278,14 @@ ExitCode showScope(const Settings& settings)
         printJson(std::cout,
                   {{"counts", reading.getCounts()}, {"seconds", seconds}, {"channels", list}}, 2);
     } else {
-        show(draw(settings, traces, seconds, fill, error), drawn < 0);
+        show(draw(settings, traces, seconds, fill, error));
     }
-    try {
+    const auto noPicture = caught([&] {
         if (!settings.png.empty() && !traces.empty()) {
             savePicture(settings, traces, rate);
         }
-        if (failure) {
-            throw Failure(*failure);
-        }
-        channel.finish();
-    } catch (const Failure& thrown) {
-        channel.fail(thrown);
-    }
+    });
+    channel.finish(failure ? failure : noPicture);
     return error.empty() ? Success : Failed;
 }
 

@@ -1,8 +1,8 @@
-#include "Terminal.hpp"
+// What the commands have to do with the terminal.
 
 #include "Commands.hpp"
 
-#include <sys/ioctl.h>
+#include <fcntl.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -10,7 +10,6 @@
 #include <csignal>
 #include <cstdio>
 #include <string>
-#include <thread>
 
 namespace brenix
 {
@@ -31,6 +30,9 @@ void catchInterrupts()
         if (interrupted == 3) { // the order is taking too long
             _exit(Interrupted);
         }
+        const int nothing = ::open("/dev/null", O_RDONLY); // a read that waits comes to its end
+        ::dup2(nothing, STDIN_FILENO);
+        ::close(nothing);
     };
     sigaction(SIGINT, &action, nullptr);
     sigaction(SIGTERM, &action, nullptr);
@@ -41,23 +43,9 @@ bool isInterrupted()
     return interrupted != 0;
 }
 
-void pauseShortly()
-{
-    std::this_thread::sleep_for(std::chrono::milliseconds(1));
-}
-
 double secondsSince(std::chrono::steady_clock::time_point start)
 {
     return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-}
-
-TerminalSize terminalSize()
-{
-    winsize size{};
-    if (ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_col == 0 || size.ws_row == 0) {
-        return {};
-    }
-    return {size.ws_col, size.ws_row};
 }
 
 Progress::Progress(double totalCounts, bool quiet)

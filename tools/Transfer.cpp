@@ -7,7 +7,7 @@
 #include <cmath>
 #include <cstdio>
 #include <iostream>
-#include <optional>
+#include <thread>
 #include <tuple>
 
 namespace brenix
@@ -63,7 +63,7 @@ std::size_t Reading::next()
     if (ready == 0) {
         done = deviceDone;
         if (!done) {
-            pauseShortly();
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
         }
         return 0;
     }
@@ -89,9 +89,7 @@ ExitCode readSamples(const Settings& given)
     Progress progress(std::min(most, channel.number("Frames", "int64").value_or(INFINITY)),
                       settings.quiet);
     std::unique_ptr<SampleWriter> writer;
-    std::optional<Failure> failure;
-    try {
-        bool broken = false;
+    const auto failure = caught([&] {
         while (!reading.isOver()) {
             if (const std::size_t counts = reading.next(); counts > 0) {
                 if (!writer) {
@@ -100,27 +98,19 @@ ExitCode readSamples(const Settings& given)
                 writer->write(reading.getFields(), counts);
                 progress.update(reading.getCounts());
             }
-            if (!broken && channel.hasDeviceError()) { // finish() throws it
-                broken = true;
+            if (channel.hasDeviceError()) { // finish() throws it
                 reading.endWithAvailable();
             }
         }
-    } catch (const Failure& thrown) {
-        failure = thrown;
-    }
+    });
     progress.finish();
     const double seconds = reading.getSeconds();
-    try {
+    const auto unwritten = caught([&] {
         if (writer) {
             writer->finish(); // what came before a failure is kept
         }
-        if (failure) {
-            throw Failure(*failure);
-        }
-        channel.finish();
-    } catch (const Failure& thrown) {
-        channel.fail(thrown);
-    }
+    });
+    channel.finish(failure ? failure : unwritten);
     if (!writer && !isInterrupted()) {
         throw Failure("", "the device delivered nothing");
     }
@@ -147,7 +137,9 @@ ExitCode writeSamples(const Settings& given)
     const bool hasInput = channel.isSupported(channel.inputStream());
     double rate = settings.file.rate > 0 ? settings.file.rate : reader->getRate();
     rate = rate > 0 ? rate : countRate(channel, settings.file);
-    const auto [most, mostSeconds] = extent(settings, rate);
+    double most = 0;
+    double mostSeconds = 0;
+    std::tie(most, mostSeconds) = extent(settings, rate);
     channel.open(settings.channel);
 
     const auto start = std::chrono::steady_clock::now();
@@ -155,7 +147,7 @@ ExitCode writeSamples(const Settings& given)
     Progress progress(std::min(most, total > 0 ? total : INFINITY), settings.quiet);
     double rows = 0;
     Bytes elements;
-    try {
+    const auto failure = caught([&] {
         while (rows < most && secondsSince(start) < mostSeconds && !isInterrupted()) {
             elements.clear();
             const double room = std::min(most - rows, static_cast<double>(settings.block));
@@ -180,11 +172,9 @@ ExitCode writeSamples(const Settings& given)
                 break;
             }
         }
-        progress.finish();
-        channel.finish();
-    } catch (const Failure& failure) {
-        channel.fail(failure);
-    }
+    });
+    progress.finish();
+    channel.finish(failure);
     if (!settings.emitC.empty()) {
         emitWrite(settings, *reader, hasInput, most, mostSeconds);
     }

@@ -1,12 +1,11 @@
 #include "Values.hpp"
 
+#include <algorithm>
 #include <array>
 #include <charconv>
 #include <cstdint>
 #include <cstring>
-#include <limits>
 #include <stdexcept>
-#include <type_traits>
 
 namespace brenix
 {
@@ -145,12 +144,7 @@ std::string printElements(const ElementType& type, const Bytes& elements)
 {
     std::string text;
     if (type.isText) {
-        for (const unsigned char character : elements) {
-            if (character == 0) {
-                break;
-            }
-            text += static_cast<char>(character);
-        }
+        text.assign(elements.begin(), std::find(elements.begin(), elements.end(), 0));
         return text;
     }
     for (std::size_t i = 0; i < elements.size(); i += type.size) {
@@ -158,6 +152,15 @@ std::string printElements(const ElementType& type, const Bytes& elements)
         type.print(&elements[i], text);
     }
     return text;
+}
+
+std::string quoted(const std::string& text, const char* escaped)
+{
+    std::string result = "'";
+    for (const char character : text) {
+        result += character == '\'' ? escaped : std::string(1, character);
+    }
+    return result + "'";
 }
 
 Option parseOption(const std::string& text)

@@ -38,6 +38,9 @@ bool hasNumber(std::string_view list);
 /// Elements as text: a char array as it stands up to its NUL, all others with commas.
 std::string printElements(const ElementType& type, const Bytes& elements);
 
+/// A text between apostrophes; those in it become `escaped`.
+std::string quoted(const std::string& text, const char* escaped);
+
 /// An option of a channel, as coder.h takes it.
 struct Option {
     std::string name;

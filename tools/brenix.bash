@@ -1,38 +1,42 @@
 # Completion of brenix for bash, and for zsh after: autoload -U bashcompinit && bashcompinit
+_brenix_plugins() { # KIND
+    brenix plugins 2>/dev/null | sed -nE "s/^([^ ]+): $1\$/\1/p"
+}
+
 _brenix() {
     local word=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]}
-    local command=${COMP_WORDS[1]}
-    COMPREPLY=()
-    if ((COMP_CWORD == 1)); then
-        mapfile -t COMPREPLY < <(compgen -W \
-            'plugins check info read write scope --help --version' -- "$word")
-        return
-    fi
+    local command=${COMP_WORDS[1]} words='' files=''
     case $previous in
+        brenix | */brenix) words='plugins check info read write scope --help --version' ;;
         -o | --option)
             # The options of the device, which stands right behind the command.
-            mapfile -t COMPREPLY < <(compgen -W "$(brenix plugins "${COMP_WORDS[2]}" 2>/dev/null |
-                awk '/^  properties:/ { exit } /^  / { print $1 "=" }')" -- "$word")
+            words=$(brenix plugins "${COMP_WORDS[2]}" 2>/dev/null |
+                awk '/^  properties:/ { exit } /^  / { print $1 "=" }')
             compopt -o nospace
-            return
             ;;
-        -w | --to | -i | --from | --png | --emit-c)
-            mapfile -t COMPREPLY < <(compgen -f -- "$word")
-            return
+        -c | --converter) words=$(_brenix_plugins converter) files=1 ;;
+        -f | --filter) words=$(_brenix_plugins filter) files=1 ;;
+        -t | --type)
+            words='double float int8 int16 int32 int64 uint8 uint16 uint32 uint64 logical'
             ;;
-        --format)
-            mapfile -t COMPREPLY < <(compgen -W 'csv raw wav' -- "$word")
-            return
+        --format) words='csv raw wav' ;;
+        -w | --to | -i | --from | --png | --emit-c | =) files=1 ;; # = as in FileName=
+        -[nsrbp] | --counts | --seconds | --rate | --block | --property | --limit | --window | \
+            --field | --open-option) ;;
+        *)
+            if [[ $word == -* ]]; then
+                words=$(brenix "$command" --help 2>/dev/null | grep -oE '^  -[^ ]+' | tr ',' ' ')
+            elif [[ $command == plugins || $command == check ]]; then
+                words=$(_brenix_plugins '[a-z]+') files=1
+            else
+                words=$(_brenix_plugins device) files=1
+            fi
             ;;
     esac
-    if [[ $word == -* ]]; then
-        mapfile -t COMPREPLY < <(compgen -W "$(brenix "$command" --help 2>/dev/null |
-            grep -oE '^  -[^ ]+' | tr ',' ' ')" -- "$word")
-    else
-        mapfile -t COMPREPLY < <(compgen -W "$(brenix plugins --names 2>/dev/null)" -- "$word")
-        if ((${#COMPREPLY[@]} == 0)); then
-            mapfile -t COMPREPLY < <(compgen -f -- "$word")
-        fi
+    mapfile -t COMPREPLY < <(compgen -W "$words" -- "$word")
+    if [[ -n $files && ${#COMPREPLY[@]} -eq 0 ]]; then
+        mapfile -t COMPREPLY < <(compgen -f -- "$word")
+        compopt -o filenames
     fi
 }
 complete -F _brenix brenix

@@ -25,16 +25,7 @@ std::string commandLine(int count, char** arguments)
             !argument.empty() &&
             argument.find_first_not_of("abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQ"
                                        "RSTUVWXYZ0123456789-_./:=,+") == std::string::npos;
-        line += ' ';
-        if (plain) {
-            line += argument;
-            continue;
-        }
-        line += '\'';
-        for (const char character : argument) {
-            line += character == '\'' ? "'\\''" : std::string(1, character);
-        }
-        line += '\'';
+        line += ' ' + (plain ? argument : quoted(argument, "'\\''"));
     }
     return line;
 }
