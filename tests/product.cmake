@@ -1,6 +1,5 @@
 # The product's sources on a scripted core.
 add_executable(product-tests
-    Allocations.cpp
     ChannelTest.cpp
     ErrorsTest.cpp
     ExportedCallsTest.cpp

@@ -3,7 +3,6 @@
 #ifndef BRENIXCODER_TESTS_SCRIPTED_CHANNELFIXTURE_HPP
 #define BRENIXCODER_TESTS_SCRIPTED_CHANNELFIXTURE_HPP
 
-#include "Allocations.hpp"
 #include "brenixcoder/coder.h"
 #include "brenixcore/Channel.hpp"
 
@@ -49,7 +48,6 @@ inline Core core;
 /// Logs "what(argument)".
 inline void log(const std::string_view what, const std::string& argument = "")
 {
-    const allocations::Allowed allowed;
     core.log.push_back(std::string(what) + '(' + argument + ')');
 }
 
@@ -99,6 +97,11 @@ struct Counted : Base {
     const int number = ++liveProperties;
 };
 
+inline IPropertyInfo* scalar(const std::string& name, auto value)
+{
+    return new Counted<TScalarProperty<decltype(value)>>(name, value);
+}
+
 template <typename T>
 IPropertyInfo* vectorOf(std::initializer_list<T> values)
 {
@@ -143,11 +146,22 @@ inline void raiseEvent(const std::string& name, const std::string& id, const std
         void onAccepted() override { log("accept"); }
         Log texts;
     } event;
-    {
-        const allocations::Allowed allowed;
-        event.texts = {name, id, message};
-    }
+    event.texts = {name, id, message};
     core.handler->onCustomEvent(event);
+}
+
+/// "identifier|message" of one of the three error records.
+inline std::string record(void* channel, int (*query)(void*, char*, char*) noexcept)
+{
+    Buffer id(CODER_ERROR_SIZE);
+    Buffer message(CODER_ERROR_SIZE);
+    EXPECT_EQ(query(channel, id, message), 1);
+    return id.text() + "|" + message.text();
+}
+
+inline std::string notSupported(bool isInput)
+{
+    return isInput ? "brenix:InputStream:notSupported|" : "brenix:OutputStream:notSupported|";
 }
 
 inline const auto unexpected = "brenix:Channel:unexpectedException|"s; // NOLINT(cert-err58-cpp)
@@ -168,11 +182,6 @@ protected:
     {
         coderChannelDestroy(channel);
         EXPECT_EQ(liveProperties, 0);
-    }
-
-    static IPropertyInfo* scalar(const std::string& name, auto value)
-    {
-        return new Counted<TScalarProperty<decltype(value)>>(name, value);
     }
 
     void* create(double in = 1, double out = 2, const char* device = "d",
@@ -197,20 +206,14 @@ protected:
         takeLog();
     }
 
-    /// "identifier|message" of the two buffers, or of one of the three error records.
+    /// "identifier|message" of the two buffers of create().
     std::string error() const { return id.text() + "|" + message.text(); }
-    std::string errorOf(int (*query)(void*, char*, char*) noexcept)
-    {
-        id = message = Buffer(CODER_ERROR_SIZE);
-        EXPECT_EQ(query(channel, id, message), 1);
-        return error();
-    }
-    std::string lastError() { return errorOf(coderChannelGetLastError); }
-    std::string syncError() { return errorOf(coderChannelGetLastSyncError); }
-    std::string asyncError() { return errorOf(coderChannelGetLastAsyncError); }
+    std::string lastError() const { return record(channel, coderChannelGetLastError); }
+    std::string syncError() const { return record(channel, coderChannelGetLastSyncError); }
+    std::string asyncError() const { return record(channel, coderChannelGetLastAsyncError); }
 
     /// The message of the last error, which is an unexpected exception.
-    std::string unexpectedError() { return lastError().substr(unexpected.size()); }
+    std::string unexpectedError() const { return lastError().substr(unexpected.size()); }
 
     void *channel = nullptr, *input = nullptr, *output = nullptr;
     Buffer id{CODER_ERROR_SIZE}, message{CODER_ERROR_SIZE};
