@@ -1,4 +1,4 @@
-// Life of a channel: creation, initialisation, stream handles, properties and destruction.
+// Creation of a channel, and the events of its plug-ins; RandomTest has the rest of its life.
 
 #include "scripted/ChannelFixture.hpp"
 
@@ -35,26 +35,6 @@ TEST_F(ChannelTest, FailedCreationReleasesWhatThereWas)
     EXPECT_EQ(coderChannelCreate("d", "c", nullptr, message, 1, 2), nullptr);
     EXPECT_STREQ(message, "Argument errorId must not be null.");
     EXPECT_EQ(takeLog(), Log{});
-}
-
-TEST_F(ChannelTest, InitReplacesHandlesAndDestructionGoesInOrder)
-{
-    EXPECT_EQ(coderChannelGetInputStream(channel), nullptr);
-    init(scalar("p", 1));
-    core.delivery = {dataBuffer({scalar("x", 1)})};
-    EXPECT_EQ(coderInputStreamReadBuffers(input, 1, 1), 1);
-    takeLog();
-    core.on["init"] = [] { core.properties->emplace("o", scalar("o", 1)); };
-    EXPECT_EQ(coderChannelInit(channel, 0), 1);
-    EXPECT_EQ(takeLog(), (Log{"init()", "getInputStream()", "destroy(x)", "getOutputStream()"}));
-    EXPECT_NE(std::exchange(input, coderChannelGetInputStream(channel)), input);
-    EXPECT_NE(output, coderChannelGetOutputStream(channel));
-    core.delivery = {dataBuffer({scalar("b", 1), scalar("a", 1)}), dataBuffer({scalar("c", 1)})};
-    EXPECT_EQ(coderInputStreamReadBuffers(input, 2, 2), 1);
-    takeLog();
-    coderChannelDestroy(std::exchange(channel, nullptr));
-    EXPECT_EQ(takeLog(), (Log{"destroy(o)", "destroy(p)", "destroy(a)", "destroy(b)", "destroy(c)",
-                              "~Channel()", "~Converter()"}));
 }
 
 TEST_F(ChannelTest, UpdatesReplaceKnownPropertiesAndDelegatedEventsAreInvoked)

@@ -9,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include <dlfcn.h>
+#include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
@@ -49,52 +50,62 @@ bool isLoaded(const std::string& path)
 
 TEST(LoadTest, ErrorsSayWhatWasTriedAndWhy)
 {
-    const std::string text = testing::TempDir() + "longText.so";
+    const std::string files = testing::TempDir() + "core-" + std::to_string(getpid()) + "/";
+    std::filesystem::create_directory(files);
+    const std::string text = files + "longText.so";
     std::ofstream(text) << "This is a text and not a shared library, though it is as long as one.";
     std::ifstream probeFile(testPlugins + "probe.so", std::ios::binary);
     std::string bytes(std::istreambuf_iterator<char>(probeFile), {});
-    const std::string cut = testing::TempDir() + "cut.so";
+    const std::string cut = files + "cut.so";
     std::ofstream(cut, std::ios::binary) << bytes.substr(0, 9000); // in the middle of its code
     const std::string dependency = "libstdc++.so.6";
-    const std::string lacking = testing::TempDir() + "lacking.so";
+    const std::string lacking = files + "lacking.so";
     std::ofstream(lacking, std::ios::binary)
         << bytes.replace(bytes.find(dependency), dependency.size(), "libabsent.so.6");
-    const std::string load = "Could not load ";
-    const std::string create = "Could not create ";
-    const std::string rows[][2] = {
-        {"none", load + folder + "none.so: " + folder +
-                     "none.so: cannot open shared object file: No such file or directory"},
-        {"./none.so", load + "./none.so: ./none.so: cannot open shared object file: No such file "
-                             "or directory"},
-        {text, load + text + ": " + text + ": invalid ELF header"},
-        {folder, load + folder + ": it is not a regular file"},
-        {"/dev/zero", load + "/dev/zero: it is not a regular file"},
-        {cut, load + cut + ": the file is cut short"},
-        {lacking, load + lacking +
-                      ": libabsent.so.6: cannot open shared object file: No such file or "
-                      "directory"},
-        {testPlugins + "throwsWhileLoading.so",
-         load + testPlugins + "throwsWhileLoading.so: thrown while loading"},
-        {testPlugins + "otherAbiVersion.so",
-         load + testPlugins + "otherAbiVersion.so: it has plug-in ABI version 999, needed is 1"},
-        {"identity", create + folder + "identity.so: " + folder +
-                         "identity.so: undefined symbol: brenixcoreCreateDevice"},
-        {testPlugins + "throwingInt.so",
-         create + testPlugins + "throwingInt.so: Unrecognized error."},
-        {testPlugins + "nullFactory.so",
-         create + testPlugins + "nullFactory.so: the factory returned nothing"},
+    const std::string empty = files + "empty.so";
+    std::ofstream(empty) << "";
+    const auto test = [](const std::string& name) { return testPlugins + name + ".so"; };
+    const std::string missing = ": cannot open shared object file: No such file or directory";
+    const struct {
+        std::string name, path, why;
+        bool isCreated = false;
+    } rows[] = {
+        {"none", folder + "none.so", folder + "none.so" + missing},
+        {"./none.so", "./none.so", "./none.so" + missing},
+        {text, text, text + ": invalid ELF header"},
+        {empty, empty, empty + ": file too short"},
+        {folder, folder, "it is not a regular file"},
+        {"/dev/zero", "/dev/zero", "it is not a regular file"},
+        {cut, cut, "the file is cut short"},
+        {lacking, lacking, "libabsent.so.6" + missing},
+        {test("throwsWhileLoading"), test("throwsWhileLoading"), "thrown while loading"},
+        {test("otherAbiVersion"), test("otherAbiVersion"),
+         "it has plug-in ABI version 999, needed is 1"},
+        {test("throwingStatic"), test("throwingStatic"), "thrown by a static object"},
+        {test("throwingStatic"), test("throwingStatic"),
+         "thrown by a static object"}, // half loaded is not loaded
+        {"identity", folder + "identity.so",
+         folder + "identity.so: undefined symbol: brenixcoreCreateDevice", true},
+        {test("noFactory"), test("noFactory"),
+         test("noFactory") + ": undefined symbol: brenixcoreCreateDevice", true},
+        {test("throwingFactory"), test("throwingFactory"), "thrown by the factory", true},
+        {test("throwingInt"), test("throwingInt"), "Unrecognized error.", true},
+        {test("nullFactory"), test("nullFactory"), "the factory returned nothing", true},
     };
     Converter converter("identity");
     Handler handler;
-    for (const auto& [device, error] : rows) {
+    for (const auto& [device, path, why, isCreated] : rows) {
         try {
             const Channel channel(device, converter, handler, 1, 1);
             ADD_FAILURE() << device;
         } catch (const std::runtime_error& exception) {
-            EXPECT_EQ(exception.what(), error);
+            EXPECT_EQ(dynamic_cast<const CouldNotCreateDevice*>(&exception) != nullptr, isCreated);
+            EXPECT_EQ(exception.what(),
+                      (isCreated ? "Could not create " : "Could not load ") + path + ": " + why);
         }
         EXPECT_FALSE(isLoaded(device)) << device;
     }
+    std::filesystem::remove_all(files);
 }
 
 TEST(LoadTest, PluginsAreUnloaded)

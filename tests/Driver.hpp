@@ -8,6 +8,8 @@
 
 #include <chrono>
 #include <cstdint>
+#include <cstring>
+#include <initializer_list>
 #include <limits>
 #include <numeric>
 #include <string>
@@ -33,6 +35,49 @@ inline std::string create(void*& channel, const std::string& device, const std::
     return id + "|"s + message;
 }
 
+/// An option whose value is a text, a number, or several. Needs no memory.
+class Option
+{
+public:
+    Option(const char* option, const char* text)
+        : name(option), type("char"), count(std::strlen(text)), elements(text)
+    {
+    }
+    Option(const char* option, const std::string& text) : Option(option, text.c_str()) {}
+    Option(const char* option, double value) : name(option), type("double"), number(value) {}
+    Option(const char* option, int value) : name(option), type("int32"), whole(value) {}
+    Option(const char* option, std::initializer_list<int> values)
+        : name(option), type("int32"), count(values.size()), elements(values.begin())
+    {
+    }
+    const void* data() const
+    {
+        return elements != nullptr ? elements
+               : *type == 'd'      ? static_cast<const void*>(&number)
+                                   : &whole;
+    }
+
+    const char *name, *type;
+    std::size_t count = 1;
+
+private:
+    const void* elements = nullptr;
+    double number = 0;
+    int whole = 0;
+};
+using Options = std::initializer_list<Option>;
+
+/// Calls a function that ends with an option list, of up to seven. It does not look at further ones.
+template <typename Function, typename... Arguments>
+int withOptions(Options options, Function function, Arguments... arguments)
+{
+    const Option none("", 0);
+    const auto at = [&](std::size_t i) { return i < options.size() ? options.begin() + i : &none; };
+#define OPTION(i) CODER_OPTION(at(i)->name, at(i)->type, at(i)->count, at(i)->data())
+    return function(arguments..., options.size(), OPTION(0), OPTION(1), OPTION(2), OPTION(3),
+                    OPTION(4), OPTION(5), OPTION(6));
+}
+
 /// A channel, driven as generated code would.
 class Channel
 {
@@ -46,11 +91,9 @@ public:
     Channel& operator=(const Channel&) = delete;
     ~Channel() { coderChannelDestroy(handle); }
 
-    /// Initialises with these options; as CODER_OPTION gives them, after their number.
-    template <typename... Options>
-    int init(uint64_t count, Options... options)
+    int init(Options options = {})
     {
-        const int result = coderChannelInit(handle, count, options...);
+        const int result = withOptions(options, coderChannelInit, handle);
         if (result == 1) {
             input = coderChannelGetInputStream(handle);
             output = coderChannelGetOutputStream(handle);
@@ -58,9 +101,32 @@ public:
         return result;
     }
 
-    int open(double timeout = 10)
+    int open(double timeout = 10) const
     {
-        return coderChannelOpen(handle, 1, CODER_OPTION("Timeout", "double", 1, &timeout));
+        return withOptions({{"Timeout", timeout}}, coderChannelOpen, handle);
+    }
+    int execute(const char* command, Options options = {}) const
+    {
+        return withOptions(options, coderChannelExecute, handle, command);
+    }
+    int close() const { return coderChannelClose(handle); }
+    int term() const { return coderChannelTerm(handle); }
+
+    static int addFilter(void* stream, const std::string& filter, Options options = {})
+    {
+        return withOptions(options, coderStreamAddFilter, stream, filter.c_str());
+    }
+    static int tune(void* stream, Options options)
+    {
+        return withOptions(options, coderStreamTuneFilters, stream);
+    }
+
+    template <typename T>
+    T property(const char* name, const char* type) const
+    {
+        T value{};
+        EXPECT_EQ(coderChannelGetPropertyValue(handle, name, type, 1, &value), 1) << error();
+        return value;
     }
 
     std::string error(int (*query)(void*, char*, char*) noexcept = coderChannelGetLastError) const

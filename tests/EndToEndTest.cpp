@@ -2,159 +2,110 @@
 
 #include "Driver.hpp"
 
-#include <filesystem>
-#include <fstream>
-#include <functional>
+#include <unistd.h>
+
+#include <map>
 
 using namespace driver;
-using namespace std::string_literals;
 
 namespace
 {
 
 const std::string plugins = TEST_PLUGINS "/";
 const std::string probe = plugins + "probe.so";
+const std::string pickyFilter = plugins + "pickyFilter.so";
 const std::string noInput = "brenix:InputStream:synchronousInputNotPossible|";
 const std::string noOutput = "brenix:OutputStream:synchronousOutputNotPossible|";
+const std::string noInputConversion = "brenix:InputStream:couldNotConvertInputData|";
+const std::string noOutputConversion = "brenix:OutputStream:couldNotConvertOutputData|";
 
-int initProbe(Channel& channel, const std::string& streams, const std::vector<int>& packets = {},
-              const std::string& failIn = "", const std::string& raiseIn = "",
-              const std::string& failAs = "")
-{
-    return channel.init(packets.empty() ? 4 : 5,
-                        CODER_OPTION("Streams", "char", 9, streams.c_str()),
-                        CODER_OPTION("FailIn", "char", 9, failIn.c_str()),
-                        CODER_OPTION("RaiseIn", "char", 9, raiseIn.c_str()),
-                        CODER_OPTION("FailAs", "char", 9, failAs.c_str()),
-                        CODER_OPTION("Packets", "int32", packets.size(), packets.data()));
-}
+const struct Operation {
+    std::string name;
+    int (*run)(Channel& channel);
+} operations[] = {
+    {"init", [](Channel& channel) { return channel.init(); }},
+    {"open", [](Channel& channel) { return channel.open(); }},
+    {"execute", [](Channel& channel) { return channel.execute("updateFromThread"); }},
+    {"close", [](Channel& channel) { return channel.close(); }},
+    {"term", [](Channel& channel) { return channel.term(); }},
+};
 
 } // namespace
 
-TEST(LoadTest, FailuresHaveTheirIdentifiers)
+TEST(LoadTest, AConverterIsLoadedFirst)
 {
-    const std::filesystem::path folder = testing::TempDir();
-    std::ofstream(folder / "text.so") << "not a library";
-    std::ofstream(folder / "empty.so") << "";
-    const std::string load = "brenix:Channel:couldNotLoadDevice|";
-    const std::string make = "brenix:Channel:couldNotCreateDevice|";
-    const std::pair<std::string, std::string> devices[] = {
-        {"no such device", load},
-        {"./no-such-device.so", load},
-        {folder, load},
-        {folder / "text.so", load},
-        {folder / "empty.so", load},
-        {"", load},
-        {plugins + "throwsWhileLoading.so", load},
-        {plugins + "otherAbiVersion.so", load},
-        {plugins + "throwingStatic.so", load},
-        {plugins + "throwingStatic.so", load}, // half loaded is not loaded
-        {plugins + "noFactory.so", make},
-        {plugins + "throwingFactory.so", make},
-        {plugins + "throwingInt.so", make},
-        {plugins + "nullFactory.so", make},
-        {"identity", make}, // a converter is no device
-    };
-    for (const auto& [device, error] : devices) {
-        SCOPED_TRACE(device);
-        void* channel = nullptr;
-        EXPECT_EQ(create(channel, device, "identity"), error);
-        EXPECT_EQ(channel, nullptr);
-    }
     void* channel = nullptr;
     EXPECT_EQ(create(channel, "no such device", "no such converter"),
               "brenix:Channel:couldNotLoadConverter|");
     EXPECT_EQ(create(channel, "no such device", "loopback"),
               "brenix:Channel:couldNotCreateConverter|");
-    Channel works(probe); // after all that
+    EXPECT_EQ(create(channel, "no such device", "identity"), "brenix:Channel:couldNotLoadDevice|");
+    EXPECT_EQ(create(channel, "identity", "identity"), "brenix:Channel:couldNotCreateDevice|");
+    EXPECT_EQ(channel, nullptr);
 }
 
 TEST(StateTest, OperationsOutOfOrderNameOperationAndState)
 {
-    const auto run = [](void* channel, char operation) {
-        switch (operation) {
-        case 'i':
-            return coderChannelInit(channel, 0);
-        case 'o':
-            return coderChannelOpen(channel, 0);
-        case 'c':
-            return coderChannelClose(channel);
-        case 't':
-            return coderChannelTerm(channel);
-        default:
-            return coderChannelExecute(channel, "updateFromThread", 0);
-        }
-    };
-    const std::pair<std::string, const char*> names[] = {
-        {"i", "init"}, {"o", "open"}, {"x", "execute"}, {"c", "close"}, {"t", "term"}};
     const struct {
-        std::string way, state, allowed;
+        std::string way; ///< first letters of operations
+        std::string state, allowed;
     } rows[] = {{"", "created", "i"},
-                {"i", "initialised", "ioxt"},
-                {"io", "open", "xc"},
-                {"ioc", "closed", "ioxt"},
-                {"iocoi", "open", "xc"},
+                {"i", "initialised", "ioet"},
+                {"io", "open", "ec"},
+                {"ioc", "closed", "ioet"},
+                {"iocoi", "open", "ec"},
                 {"it", "terminated", "i"},
-                {"ioctii", "initialised", "ioxt"}};
+                {"ioctii", "initialised", "ioet"}};
     for (const auto& row : rows) {
-        for (const auto& [operation, name] : names) {
-            SCOPED_TRACE(row.way + " " + name);
+        for (const Operation& last : operations) {
+            SCOPED_TRACE(row.way + " " + last.name);
             Channel channel(probe);
-            for (const char step : row.way) {
-                run(channel.handle, step);
+            for (const char letter : row.way) {
+                for (const Operation& step : operations) {
+                    letter == step.name[0] ? step.run(channel) : 0;
+                }
             }
-            const bool allowed = row.allowed.find(operation) != std::string::npos;
-            EXPECT_EQ(run(channel.handle, operation[0]), allowed);
+            const bool allowed = row.allowed.find(last.name[0]) != std::string::npos;
+            EXPECT_EQ(last.run(channel), allowed);
             EXPECT_EQ(channel.error(), allowed ? "|"
-                                               : unexpected + "Operation " + name +
+                                               : unexpected + "Operation " + last.name +
                                                      " is not possible: the channel is " +
                                                      row.state + ".");
         }
     }
     Channel channel(probe);
-    initProbe(channel, "i");
-    EXPECT_EQ(coderChannelExecute(channel.handle, nullptr, 0), 0);
+    channel.init();
+    EXPECT_EQ(channel.execute(nullptr), 0);
     EXPECT_EQ(channel.error(), unexpected + "The command to execute must not be null.");
-    EXPECT_EQ(coderChannelExecute(channel.handle, "dance", 0), 0);
+    EXPECT_EQ(channel.execute("dance"), 0);
     EXPECT_EQ(channel.error(), unexpected + "Unknown command: dance");
 }
 
 TEST(StateTest, FailuresAndErrorsOfEachOperationReachTheCaller)
 {
-    const std::string unrecognized = unexpected + "Unrecognized error.";
-    for (const std::string last : {"init", "open", "execute", "close", "term"}) {
-        const std::string failed = unexpected + "failed in " + last;
+    for (const Operation& last : operations) {
+        const std::string failed = unexpected + "failed in " + last.name;
         const std::pair<std::string, std::string> rows[] = {
             {"", failed},
-            {"int", unrecognized},
-            {"own", unrecognized},
+            {"int", unexpected + "Unrecognized error."},
+            {"own", unexpected + "Unrecognized error."},
             {"silent", unexpected},
             {"long", (failed + std::string(5000, '!')).substr(0, unexpected.size() + 1023)},
             {"raised", "|"}};
-        for (const auto& row : rows) {
-            const auto& [as, error] = row;
-            SCOPED_TRACE(last + " " + as);
+        for (const auto& [as, error] : rows) {
+            SCOPED_TRACE(last.name + " " + as);
             const bool raises = as == "raised";
             Channel channel(probe);
-            const std::function<int()> steps[] = {
-                [&] {
-                    return initProbe(channel, "i", {}, raises ? "" : last, raises ? last : "",
-                                     row.first);
-                },
-                [&] { return channel.open(); },
-                [&] { return coderChannelExecute(channel.handle, "updateFromThread", 0); },
-                [&] { return coderChannelClose(channel.handle); },
-                [&] { return coderChannelTerm(channel.handle); },
-            };
-            const auto* step = std::begin(steps);
-            while (step != std::end(steps) && (*step)() == 1) {
-                ++step;
+            int result = channel.init({{raises ? "RaiseIn" : "FailIn", last.name}, {"FailAs", as}});
+            for (const auto* step = operations + 1; result == 1 && step != std::end(operations);
+                 ++step) {
+                result = step->run(channel);
             }
             EXPECT_EQ(channel.error(), error);
             EXPECT_EQ(channel.error(coderChannelGetLastSyncError),
-                      raises ? "probe:raised|" + last : "|");
-            coderChannelClose(channel.handle);     // if it is open
-            EXPECT_EQ(initProbe(channel, "i"), 1); // and all is well again
+                      raises ? "probe:raised|" + last.name : "|");
+            channel.close();              // if it is open
+            EXPECT_EQ(channel.init(), 1); // and all is well again
         }
     }
 }
@@ -162,7 +113,7 @@ TEST(StateTest, FailuresAndErrorsOfEachOperationReachTheCaller)
 TEST(StreamTest, PeekListsWhatReadDelivers)
 {
     Channel channel(probe);
-    ASSERT_EQ(initProbe(channel, "i", {10, 10, 10, 5}), 1);
+    ASSERT_EQ(channel.init({{"Streams", "i"}, {"Packets", {10, 10, 10, 5}}}), 1);
     EXPECT_EQ(channel.ask(coderStreamGetSpaceAvailable, channel.input), infinity);
     ASSERT_EQ(channel.open(), 1);
     channel.waitForEnd();
@@ -175,7 +126,7 @@ TEST(StreamTest, PeekListsWhatReadDelivers)
     EXPECT_EQ(channel.read(1, 1, "Odd").size(), 7);      // does not divide either
     EXPECT_EQ(channel.read(8, 2), Numbers{});            // 6 are left
     EXPECT_EQ(channel.error(), noInput);
-    EXPECT_EQ(coderChannelClose(channel.handle), 1);
+    EXPECT_EQ(channel.close(), 1);
     EXPECT_EQ(channel.read(6, 2), range(29, 35)); // also after close
     EXPECT_EQ(channel.peek(), Numbers{});
     EXPECT_EQ(coderInputStreamReadBuffers(channel.input, 0, 0), 1);
@@ -184,7 +135,7 @@ TEST(StreamTest, PeekListsWhatReadDelivers)
 TEST(StreamTest, AnInputLimitNeitherLosesNorBlocks)
 {
     Channel channel(probe, 4);
-    ASSERT_EQ(initProbe(channel, "i", {3, 3, 10}), 1);
+    ASSERT_EQ(channel.init({{"Streams", "i"}, {"Packets", {3, 3, 10}}}), 1);
     ASSERT_EQ(channel.open(), 1);
     EXPECT_EQ(channel.read(5, 1), Numbers{});
     EXPECT_EQ(channel.error(), noInput); // beyond the limit: at once
@@ -203,29 +154,29 @@ TEST(StreamTest, AnInputLimitNeitherLosesNorBlocks)
 TEST(StreamTest, EveryWaitEnds)
 {
     Channel slow(probe);
-    ASSERT_EQ(initProbe(slow, "io", {1, 1}), 1);
+    ASSERT_EQ(slow.init({{"Streams", "io"}, {"Packets", {1, 1}}}), 1);
     ASSERT_EQ(slow.open(0.05), 1);
     EXPECT_EQ(slow.read(3, 1), Numbers{});
     EXPECT_EQ(slow.error(), noInput);
     EXPECT_EQ(slow.read(2, 2), range(0, 2));
 
     Channel full(probe, 1); // the device waits for room, and close ends it
-    ASSERT_EQ(initProbe(full, "i", {1, 1, 1}), 1);
+    ASSERT_EQ(full.init({{"Streams", "i"}, {"Packets", {1, 1, 1}}}), 1);
     ASSERT_EQ(full.open(), 1);
     Channel::waitUntil([&] { return full.peek().size() == 1; });
-    EXPECT_EQ(coderChannelClose(full.handle), 1);
+    EXPECT_EQ(full.close(), 1);
     EXPECT_EQ(full.asyncError(), "probe:push|refused");
     EXPECT_EQ(full.read(1, 1), Numbers{0});
 
     Channel destroyed(probe, 1); // or the end of the channel does
-    ASSERT_EQ(initProbe(destroyed, "io", {1, 1, 1}), 1);
+    ASSERT_EQ(destroyed.init({{"Streams", "io"}, {"Packets", {1, 1, 1}}}), 1);
     ASSERT_EQ(destroyed.open(infinity), 1);
 }
 
 TEST(StreamTest, WritesAreTakenWholeOrNotAtAll)
 {
     Channel channel("loopback", infinity, 5);
-    ASSERT_EQ(channel.init(0), 1);
+    ASSERT_EQ(channel.init(), 1);
     EXPECT_EQ(channel.write(range(0, 6)), 0);
     EXPECT_EQ(channel.error(), noOutput);
     EXPECT_EQ(channel.write(range(0, 3)), 3); // before open, up to the limit
@@ -237,7 +188,7 @@ TEST(StreamTest, WritesAreTakenWholeOrNotAtAll)
     EXPECT_EQ(channel.write(range(0, 5)), 5);
     ASSERT_EQ(channel.open(), 1);
     EXPECT_EQ(channel.write(range(5, 10)), 5); // waits for room
-    EXPECT_EQ(coderChannelClose(channel.handle), 1);
+    EXPECT_EQ(channel.close(), 1);
     EXPECT_EQ(channel.read(10, 2), range(0, 10)); // close let the device take all of it
     EXPECT_EQ(channel.write({10}), 1);            // for the next time
     ASSERT_EQ(channel.open(), 1);
@@ -247,11 +198,11 @@ TEST(StreamTest, WritesAreTakenWholeOrNotAtAll)
 TEST(StreamTest, DevicesMayLackStreams)
 {
     Channel channel(probe);
-    ASSERT_EQ(initProbe(channel, "o"), 1);
+    ASSERT_EQ(channel.init({{"Streams", "o"}}), 1);
     EXPECT_EQ(channel.read(1, 1), Numbers{});
     EXPECT_EQ(channel.error(), "brenix:InputStream:notSupported|");
     EXPECT_EQ(channel.ask(coderStreamGetCountDimension, channel.output), 2);
-    ASSERT_EQ(initProbe(channel, "i"), 1);
+    ASSERT_EQ(channel.init({{"Streams", "i"}}), 1);
     EXPECT_EQ(channel.write({1}), 0);
     EXPECT_EQ(channel.error(), "brenix:OutputStream:notSupported|");
 }
@@ -276,14 +227,15 @@ TEST(EventTest, AFailureOfTheDevicesThreadIsAnError)
     for (const auto& [failAs, mistake, message] : rows) {
         SCOPED_TRACE(message);
         const bool pushes = mistake < 0;
-        ASSERT_EQ(
-            initProbe(channel, "i", {pushes ? 4 : 1, mistake, 1}, pushes ? "" : "run", "", failAs),
-            1);
+        ASSERT_EQ(channel.init({{"Packets", {pushes ? 4 : 1, mistake, 1}},
+                                {"FailIn", pushes ? "" : "run"},
+                                {"FailAs", failAs}}),
+                  1);
         ASSERT_EQ(channel.open(infinity), 1);
         EXPECT_EQ(channel.read(5, 2), Numbers{}); // the device's end ends the wait
         EXPECT_EQ(channel.error(), noInput);
         EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|" + message);
-        EXPECT_EQ(coderChannelClose(channel.handle), 1);
+        EXPECT_EQ(channel.close(), 1);
         EXPECT_EQ(channel.read(4, 1), pushes ? range(0, 4) : Numbers{}); // what came before
     }
 }
@@ -294,7 +246,7 @@ TEST(EventTest, SlowAndEarlyEnds)
     for (const std::string failAs : {"slow", "early"}) {
         SCOPED_TRACE(failAs);
         const bool slow = failAs == "slow";
-        ASSERT_EQ(initProbe(channel, "i", {}, slow ? "run" : "", "", failAs), 1);
+        ASSERT_EQ(channel.init({{"FailIn", slow ? "run" : ""}, {"FailAs", failAs}}), 1);
         const auto begin = std::chrono::steady_clock::now();
         ASSERT_EQ(channel.open(), 1);
         if (!slow) {
@@ -302,7 +254,7 @@ TEST(EventTest, SlowAndEarlyEnds)
             EXPECT_EQ(channel.read(1, 1), Numbers{});
             EXPECT_EQ(channel.error(), noInput);
         }
-        EXPECT_EQ(coderChannelClose(channel.handle), 1) << channel.error();
+        EXPECT_EQ(channel.close(), 1) << channel.error();
         const auto time = std::chrono::steady_clock::now() - begin;
         EXPECT_GE(time, std::chrono::milliseconds(slow ? 290 : 0)); // close waits for the device
         uint8_t failed = 1;
@@ -314,17 +266,15 @@ TEST(EventTest, SlowAndEarlyEnds)
 TEST(EventTest, StormsAndStreamsAfterTheEnd)
 {
     Channel channel(probe, 4);
-    ASSERT_EQ(initProbe(channel, "io", {1}), 1);
+    ASSERT_EQ(channel.init({{"Streams", "io"}, {"Packets", {1}}}), 1);
     ASSERT_EQ(channel.open(), 1);
-    EXPECT_EQ(coderChannelExecute(channel.handle, "storm", 0), 1);
+    EXPECT_EQ(channel.execute("storm"), 1);
     EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|" + std::string(1023, 'x'));
-    double level = 0;
-    EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Level", "double", 1, &level), 1);
-    EXPECT_EQ(level, 3);
+    EXPECT_EQ(channel.property<double>("Level", "double"), 3);
     EXPECT_EQ(channel.read(1, 1), Numbers{0});
-    EXPECT_EQ(coderChannelClose(channel.handle), 1);
+    EXPECT_EQ(channel.close(), 1);
     EXPECT_EQ(channel.write({1, 2}), 2); // for the next time
-    EXPECT_EQ(coderChannelExecute(channel.handle, "streamAfterClose", 0), 1) << channel.error();
+    EXPECT_EQ(channel.execute("streamAfterClose"), 1) << channel.error();
     EXPECT_EQ(channel.peek(), Numbers{});
     EXPECT_EQ(channel.ask(coderStreamGetDataAvailable, channel.output), 2);
 }
@@ -333,14 +283,12 @@ TEST(EventTest, PropertiesFollowTheDevice)
 {
     Channel channel(probe);
     for (int round = 0; round < 2; ++round) { // the second init replaces the property
-        double level = 0;
-        ASSERT_EQ(initProbe(channel, "i"), 1);
-        EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Level", "double", 1, &level), 1);
-        EXPECT_EQ(level, 1);
-        EXPECT_EQ(coderChannelExecute(channel.handle, "updateFromThread", 0), 1);
-        EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Level", "double", 1, &level), 1);
-        EXPECT_EQ(level, 2);
-        EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Other", "int32", 1, &level), 0);
+        ASSERT_EQ(channel.init(), 1);
+        EXPECT_EQ(channel.property<double>("Level", "double"), 1);
+        EXPECT_EQ(channel.execute("updateFromThread"), 1);
+        EXPECT_EQ(channel.property<double>("Level", "double"), 2);
+        int other = 0;
+        EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Other", "int32", 1, &other), 0);
         EXPECT_EQ(channel.asyncError(), "probe:thread|from a thread");
     }
 }
@@ -348,12 +296,12 @@ TEST(EventTest, PropertiesFollowTheDevice)
 TEST(ConversionTest, AFailureLosesOnePacketAtMost)
 {
     Channel channel(probe, infinity, infinity, plugins + "pickyConverter.so");
-    ASSERT_EQ(initProbe(channel, "io", {10, 10, 10}), 1);
+    ASSERT_EQ(channel.init({{"Streams", "io"}, {"Packets", {10, 10, 10}}}), 1);
     EXPECT_EQ(channel.write({1, 13}), 0);
-    EXPECT_EQ(channel.error(), "brenix:OutputStream:couldNotConvertOutputData|");
+    EXPECT_EQ(channel.error(), noOutputConversion);
     ASSERT_EQ(channel.open(), 1);
     EXPECT_EQ(channel.read(30, 3), Numbers{});
-    EXPECT_EQ(channel.error(), "brenix:InputStream:couldNotConvertInputData|");
+    EXPECT_EQ(channel.error(), noInputConversion);
     EXPECT_EQ(channel.peek(), (Numbers{10, 10}));
     Numbers rest = range(0, 10);
     const Numbers third = range(20, 30);
@@ -363,25 +311,22 @@ TEST(ConversionTest, AFailureLosesOnePacketAtMost)
 
 TEST(ConversionTest, SpoiltPacketsGoNoFurther)
 {
-    const std::string noConversion = "brenix:InputStream:couldNotConvertInputData|";
-    const std::string noOutputConversion = "brenix:OutputStream:couldNotConvertOutputData|";
     Channel channel(probe, infinity, infinity, plugins + "pickyConverter.so");
-    ASSERT_EQ(initProbe(channel, "io", {14, 1, 1, 1, 1, 1}), 1);
+    ASSERT_EQ(channel.init({{"Streams", "io"}, {"Packets", {14, 1, 1, 1, 1, 1}}}), 1);
     ASSERT_EQ(channel.open(), 1);
     EXPECT_EQ(channel.read(14, 1), Numbers{}); // 0 to 13
     for (const double mistake : range(14, 18)) {
         SCOPED_TRACE(mistake);
         EXPECT_EQ(channel.read(1, 1), Numbers{});
-        EXPECT_EQ(channel.error(), noConversion);
+        EXPECT_EQ(channel.error(), noInputConversion);
         EXPECT_EQ(channel.write({mistake}), 0);
         EXPECT_EQ(channel.error(), noOutputConversion);
     }
     EXPECT_EQ(channel.read(1, 1), Numbers{18});
 
     Channel filtered("loopback");
-    ASSERT_EQ(filtered.init(0), 1);
-    const std::string filter = plugins + "pickyFilter.so";
-    ASSERT_EQ(coderStreamAddFilter(filtered.output, filter.c_str(), 0), 1);
+    ASSERT_EQ(filtered.init(), 1);
+    ASSERT_EQ(Channel::addFilter(filtered.output, pickyFilter), 1);
     for (const double mistake : {13, 14, 16, 17}) {
         EXPECT_EQ(filtered.write({mistake}), 0);
         EXPECT_EQ(filtered.error(), noOutputConversion) << mistake;
@@ -393,7 +338,7 @@ TEST(ConversionTest, SpoiltPacketsGoNoFurther)
                                                  CODER_BUFFER(1, numbers + 1)),
               0);
     EXPECT_EQ(filtered.error(), noOutputConversion);
-    ASSERT_EQ(coderStreamAddFilter(filtered.input, filter.c_str(), 0), 1);
+    ASSERT_EQ(Channel::addFilter(filtered.input, pickyFilter), 1);
     EXPECT_EQ(filtered.write({1}), 1);
     ASSERT_EQ(filtered.open(), 1);
     EXPECT_EQ(filtered.read(1, 1), Numbers{1});
@@ -401,44 +346,35 @@ TEST(ConversionTest, SpoiltPacketsGoNoFurther)
 
 TEST(FilterTest, FiltersApplyInOrderAndAreTuned)
 {
-    const std::string filter = plugins + "pickyFilter.so";
 #ifdef OTHER_FILTER
     const std::string inputFilter = OTHER_FILTER; // made by another compiler
 #else
-    const std::string& inputFilter = filter;
+    const std::string& inputFilter = pickyFilter;
 #endif
     Channel channel("loopback");
-    ASSERT_EQ(channel.init(0), 1);
-    double factor = 2;
-    const auto add = [&](void* stream, const std::string& name) {
-        coderStreamAddFilter(stream, name.c_str(), 1, CODER_OPTION("Factor", "double", 1, &factor));
+    ASSERT_EQ(channel.init(), 1);
+    const auto add = [&](void* stream, const std::string& name, const char* option = "Factor") {
+        Channel::addFilter(stream, name, {{option, 2.0}});
         return channel.error();
     };
     EXPECT_EQ(add(channel.input, inputFilter), "|");
-    EXPECT_EQ(add(channel.output, filter), "|");
+    EXPECT_EQ(add(channel.output, pickyFilter), "|");
     EXPECT_EQ(add(channel.output, "./none"), "brenix:Stream:couldNotLoadFilter|");
     EXPECT_EQ(add(channel.output, "loopback"), "brenix:Stream:couldNotCreateFilter|");
-    EXPECT_EQ(coderStreamAddFilter(channel.input, inputFilter.c_str(), 1,
-                                   CODER_OPTION("Factr", "double", 1, &factor)),
-              0);
-    EXPECT_EQ(channel.error(), unexpected + "Option Factr: is not known.");
+    EXPECT_EQ(add(channel.input, inputFilter, "Factr"), unexpected + "Option Factr: is not known.");
     ASSERT_EQ(channel.open(), 1);
-    EXPECT_EQ(add(channel.input, filter), "brenix:Stream:cannotAddFilterWhileOpen|");
+    EXPECT_EQ(add(channel.input, pickyFilter), "brenix:Stream:cannotAddFilterWhileOpen|");
 
     EXPECT_EQ(channel.write({1, 2}), 2);
     EXPECT_EQ(channel.read(2, 1), (Numbers{4, 8}));
     EXPECT_EQ(channel.write({13}), 0);
-    EXPECT_EQ(channel.error(), "brenix:OutputStream:couldNotConvertOutputData|");
+    EXPECT_EQ(channel.error(), noOutputConversion);
     EXPECT_EQ(channel.write({6.5}), 1); // 13 for the second filter
     EXPECT_EQ(channel.asyncError(), "brenix:Stream:filterFailed|13 is refused");
 
-    factor = 0; // drops all output
-    EXPECT_EQ(
-        coderStreamTuneFilters(channel.output, 1, CODER_OPTION("Factor", "double", 1, &factor)), 1);
+    EXPECT_EQ(Channel::tune(channel.output, {{"Factor", 0.0}}), 1); // drops all output
     EXPECT_EQ(channel.write({1}), 1);
-    factor = 5;
-    EXPECT_EQ(
-        coderStreamTuneFilters(channel.output, 1, CODER_OPTION("Factor", "double", 1, &factor)), 1);
+    EXPECT_EQ(Channel::tune(channel.output, {{"Factor", 5.0}}), 1);
     EXPECT_EQ(channel.write({3}), 1);
     EXPECT_EQ(channel.read(1, 1), Numbers{30});
 }
@@ -446,17 +382,9 @@ TEST(FilterTest, FiltersApplyInOrderAndAreTuned)
 TEST(FilterTest, ScaleAndDecimate)
 {
     Channel channel("loopback");
-    ASSERT_EQ(channel.init(0), 1);
-    const int factor = 3;
-    const double gain = -2;
-    const double offset = 0.5;
-    ASSERT_EQ(coderStreamAddFilter(channel.output, "decimate", 1,
-                                   CODER_OPTION("Factor", "int32", 1, &factor)),
-              1);
-    ASSERT_EQ(coderStreamAddFilter(channel.input, "scale", 2,
-                                   CODER_OPTION("Gain", "double", 1, &gain),
-                                   CODER_OPTION("Offset", "double", 1, &offset)),
-              1);
+    ASSERT_EQ(channel.init(), 1);
+    ASSERT_EQ(Channel::addFilter(channel.output, "decimate", {{"Factor", 3}}), 1);
+    ASSERT_EQ(Channel::addFilter(channel.input, "scale", {{"Gain", -2.0}, {"Offset", 0.5}}), 1);
     ASSERT_EQ(channel.open(), 1);
     EXPECT_EQ(channel.write(range(0, 5)), 5); // 0 and 3 stay
     EXPECT_EQ(channel.write(range(5, 6)), 1); // none
@@ -478,18 +406,11 @@ TEST(FilterTest, ScaleAndDecimate)
 TEST(FilterTest, DifferentOnesTogether)
 {
     Channel channel("loopback", infinity, 2);
-    ASSERT_EQ(channel.init(0), 1);
-    const int factor = 3;
-    const double gain = 10;
-    ASSERT_EQ(coderStreamAddFilter(channel.output, "decimate", 1,
-                                   CODER_OPTION("Factor", "int32", 1, &factor)),
-              1);
-    ASSERT_EQ(coderStreamAddFilter(channel.output, "scale", 0), 1);
-    ASSERT_EQ(coderStreamTuneFilters(channel.output, 1, CODER_OPTION("Gain", "double", 1, &gain)),
-              1)
-        << channel.error();
-    EXPECT_EQ(coderStreamTuneFilters(channel.output, 1, CODER_OPTION("Gian", "double", 1, &gain)),
-              0);
+    ASSERT_EQ(channel.init(), 1);
+    ASSERT_EQ(Channel::addFilter(channel.output, "decimate", {{"Factor", 3}}), 1);
+    ASSERT_EQ(Channel::addFilter(channel.output, "scale"), 1);
+    ASSERT_EQ(Channel::tune(channel.output, {{"Gain", 10.0}}), 1) << channel.error();
+    EXPECT_EQ(Channel::tune(channel.output, {{"Gian", 10.0}}), 0);
     EXPECT_EQ(channel.error(), unexpected + "Option Gian: is not known.");
     EXPECT_EQ(channel.write({0, 1}), 2);
     EXPECT_EQ(channel.write({2, 3}), 0); // has room for one; the filters have not seen it
@@ -501,99 +422,62 @@ TEST(FilterTest, DifferentOnesTogether)
 TEST(SignalTest, WaveformsChannelsAndCommands)
 {
     Channel channel("signal", 16, 0, "columns");
-    const double rate = 8;
-    double frequency = 1;
-    const int channels = 2;
-    const int block = 4;
     const auto start = [&](const char* waveform, const char* pace, int frames) {
-        const int result = channel.init(7, CODER_OPTION("Waveform", "char", 9, waveform),
-                                        CODER_OPTION("Pace", "char", 9, pace),
-                                        CODER_OPTION("SampleRate", "double", 1, &rate),
-                                        CODER_OPTION("Frequency", "double", 1, &frequency),
-                                        CODER_OPTION("Channels", "int32", 1, &channels),
-                                        CODER_OPTION("BlockSize", "int32", 1, &block),
-                                        CODER_OPTION("Frames", "int32", 1, &frames));
+        channel.close(); // the one before
+        const int result = channel.init({{"Waveform", waveform},
+                                         {"Pace", pace},
+                                         {"SampleRate", 8.0},
+                                         {"Frequency", 1.0},
+                                         {"Channels", 2},
+                                         {"BlockSize", 4},
+                                         {"Frames", frames}});
         return result == 1 && channel.open() == 1;
     };
-    const auto stop = [&] { ASSERT_EQ(coderChannelClose(channel.handle), 1); };
-
     ASSERT_TRUE(start("ramp", "fast", 8)) << channel.error();
     EXPECT_EQ(channel.read(8, 2, "Data1"), (Numbers{-1, -0.75, -0.5, -0.25, 0, 0.25, 0.5, 0.75}));
-    stop();
     ASSERT_TRUE(start("square", "fast", 6));
     EXPECT_EQ(channel.read(6, 2, "Data2"), (Numbers{-1, -1, -1, -1, 1, 1})); // half a period ahead
-    stop();
     ASSERT_TRUE(start("noise", "fast", 4));
     const Numbers noise = channel.read(4, 1, "Data1");
-    stop();
     ASSERT_TRUE(start("noise", "fast", 4));
     EXPECT_EQ(channel.read(4, 1, "Data1"), noise);
-    stop();
 
     const auto begin = std::chrono::steady_clock::now();
     ASSERT_TRUE(start("sine", "realtime", 1000)); // a block takes half a second
     EXPECT_EQ(channel.read(4, 1, "Data1")[2], 1);
     EXPECT_GE(std::chrono::steady_clock::now() - begin, std::chrono::milliseconds(500));
-    frequency = 2;
-    ASSERT_EQ(coderChannelExecute(channel.handle, "set", 1,
-                                  CODER_OPTION("Frequency", "double", 1, &frequency)),
-              1);
-    double reflected = 0;
-    EXPECT_EQ(coderChannelGetPropertyValue(channel.handle, "Frequency", "double", 1, &reflected),
-              1);
-    EXPECT_EQ(reflected, 2);
-    frequency = 4.5;
-    EXPECT_EQ(coderChannelExecute(channel.handle, "set", 1,
-                                  CODER_OPTION("Frequency", "double", 1, &frequency)),
-              0);
+    ASSERT_EQ(channel.execute("set", {{"Frequency", 2.0}}), 1);
+    EXPECT_EQ(channel.property<double>("Frequency", "double"), 2);
+    EXPECT_EQ(channel.execute("set", {{"Frequency", 4.5}}), 0);
     EXPECT_EQ(channel.error(),
               unexpected + "Option Frequency: must be from 0 Hz to half the sample rate.");
-    stop();
 }
 
 TEST(AudioFileTest, WhatIsWrittenIsReadBack)
 {
-    const std::string file = testing::TempDir() + "t\xC3\xB6ne.wav";
-    const double rate = 44100;
-    const int channels = 2;
+    const std::string file = testing::TempDir() + std::to_string(getpid()) + "t\xC3\xB6ne.wav";
     const Numbers samples = {0.5, -0.25, 0.125, -1, 0.75, 0.1};
     {
         Channel writer("audiofile");
-        ASSERT_EQ(writer.init(5, CODER_OPTION("FileName", "char", 4096, file.c_str()),
-                              CODER_OPTION("Mode", "char", 9, "write"),
-                              CODER_OPTION("SampleRate", "double", 1, &rate),
-                              CODER_OPTION("Channels", "int32", 1, &channels),
-                              CODER_OPTION("SampleFormat", "char", 9, "DOUBLE")),
+        ASSERT_EQ(writer.init({{"FileName", file},
+                               {"Mode", "write"},
+                               {"Channels", 2},
+                               {"SampleFormat", "DOUBLE"}}),
                   1)
             << writer.error();
         ASSERT_EQ(writer.open(), 1);
+        EXPECT_EQ(writer.write(samples), 6);
+        EXPECT_EQ(writer.close(), 1) << writer.error();
+        ASSERT_EQ(writer.open(), 1) << writer.error();                      // starts again
         EXPECT_EQ(writer.write({samples.begin(), samples.begin() + 3}), 3); // in mid-frame
         EXPECT_EQ(writer.write({samples.begin() + 3, samples.end()}), 3);
-        EXPECT_EQ(coderChannelClose(writer.handle), 1) << writer.error();
-        ASSERT_EQ(writer.open(), 1) << writer.error();
-    }
-    {
-        Channel writer("audiofile");
-        ASSERT_EQ(writer.init(4, CODER_OPTION("FileName", "char", 4096, file.c_str()),
-                              CODER_OPTION("Mode", "char", 9, "write"),
-                              CODER_OPTION("Channels", "int32", 1, &channels),
-                              CODER_OPTION("SampleFormat", "char", 9, "DOUBLE")),
-                  1);
-        ASSERT_EQ(writer.open(), 1);
-        EXPECT_EQ(writer.write(samples), 6);
         EXPECT_EQ(writer.write({1}), 1);
-        EXPECT_EQ(coderChannelClose(writer.handle), 1);
+        EXPECT_EQ(writer.close(), 1);
         EXPECT_NE(writer.asyncError().find("has 1 of 2 samples"), std::string::npos);
     }
     Channel reader("audiofile", infinity, infinity, "columns");
-    const int block = 2;
-    ASSERT_EQ(reader.init(2, CODER_OPTION("FileName", "char", 4096, file.c_str()),
-                          CODER_OPTION("BlockSize", "int32", 1, &block)),
-              1)
-        << reader.error();
-    int64_t frames = 0;
-    EXPECT_EQ(coderChannelGetPropertyValue(reader.handle, "Frames", "int64", 1, &frames), 1);
-    EXPECT_EQ(frames, 3);
+    ASSERT_EQ(reader.init({{"FileName", file}, {"BlockSize", 2}}), 1) << reader.error();
+    EXPECT_EQ(reader.property<int64_t>("Frames", "int64"), 3);
     for (int round = 0; round < 2; ++round) { // opening again starts from the first frame
         ASSERT_EQ(reader.open(), 1);
         reader.waitForEnd();
@@ -603,36 +487,75 @@ TEST(AudioFileTest, WhatIsWrittenIsReadBack)
         EXPECT_EQ(coderInputStreamReadBufferData(reader.input, 1, 2, "Data", "double", 2, second),
                   1);
         EXPECT_EQ(second[1], -1);
-        EXPECT_EQ(coderChannelClose(reader.handle), 1);
+        EXPECT_EQ(reader.close(), 1);
+    }
+    std::remove(file.c_str());
+}
+
+TEST(OptionsTest, BadOnesAreNamed)
+{
+    const std::map<std::string, std::pair<Option, Option>> good = {
+        {"audiofile", {{"FileName", "a.x"}, {"FileName", "a.x"}}},
+        {"serial", {{"Port", "/no/such"}, {"BaudRate", 9600}}},
+        {"tcp", {{"Host", "127.0.0.1"}, {"Port", 9}}},
+        {"udp", {{"LocalHost", "127.0.0.1"}, {"LocalPort", 0}}},
+    };
+    const struct {
+        const char* device;
+        Option bad; ///< replaces a good one of the same name
+        std::string error;
+    } rows[] = {
+        {"audiofile", {"FileName", ""}, "FileName: must name a sound file."},
+        {"audiofile", {"Mode", "play"}, "Mode: must be read or write, not play."},
+        {"audiofile", {"Mode", 0}, "Mode: must be a text."},
+        {"audiofile",
+         {"Mode", "write"},
+         "FileName: has an ending that names no sound file format: a.x."},
+        {"audiofile", {"SampleFormat", "PCM_16"}, "SampleFormat: is not known."},
+        {"audiofile", {"BlokSize", 1}, "BlokSize: is not known."},
+        {"audiofile", {"BlockSize", 0}, "BlockSize: must be a whole number from 1 to 16777216."},
+        {"audiofile", {"BlockSize", "1"}, "BlockSize: must be one number."},
+        {"audiofile", {"Timeout", "1"}, "Timeout: must be one number."},
+        {"tcp", {"Host", ""}, "Host: must name a host."},
+        {"tcp", {"Port", "x"}, "Port: must be one number."},
+        {"tcp", {"Port", 65536}, "Port: must be a whole number from 1 to 65535."},
+        {"tcp",
+         {"ConnectTimeout", 0},
+         "ConnectTimeout: must be more than 0 and at most 86400 seconds."},
+        {"tcp", {"ElementType", "int24"}, "ElementType: is not a numeric type: int24."},
+        {"tcp", {"ByteOrder", "pdp"}, "ByteOrder: must be little or big, not pdp."},
+        {"tcp", {"BlockSize", 0.5}, "BlockSize: must be a whole number from 1 to 16777216."},
+        {"tcp", {"Hots", "x"}, "Hots: is not known."},
+        {"udp", {"LocalHost", "here"}, "LocalHost: must be an IP address, not here."},
+        {"udp", {"LocalPort", -1}, "LocalPort: must be a whole number from 0 to 65535."},
+        {"udp", {"Host", "::1"}, "Port: is missing: a peer has a host and a port."},
+        {"udp", {"Port", 9}, "Host: is missing: a peer has a host and a port."},
+        {"udp", {"BlockSize", 1}, "BlockSize: is not known."},
+        {"serial", {"Port", ""}, "Port: must name a serial port."},
+        {"serial", {"BaudRate", 0}, "BaudRate: must be a whole number from 1 to 4000000."},
+        {"serial", {"Parity", "mark"}, "Parity: must be none, even or odd, not mark."},
+        {"serial", {"StopBits", 1.5}, "StopBits: must be a whole number from 1 to 2."},
+        {"serial", {"FlowControl", "x"}, "FlowControl: must be none, software or hardware, not x."},
+    };
+    for (const auto& [device, bad, error] : rows) {
+        SCOPED_TRACE(device + " "s + error);
+        Channel channel(device);
+        EXPECT_EQ(channel.init({good.at(device).first, good.at(device).second, bad}), 0);
+        EXPECT_EQ(channel.error(), unexpected + "Option " + error);
     }
 }
 
-TEST(AudioFileTest, BadOptionsAreNamed)
+TEST(OpenTest, WhatIsNotThere)
 {
-    const double zero = 0;
-    const std::string rows[][4] = {
-        {"FileName", "", "x", "Option FileName: must name a sound file."},
-        {"FileName", "/no/such.wav", "x", "Could not open /no/such.wav: "},
-        {"Mode", "play", "x", "Option Mode: must be read or write, not play."},
-        {"Mode", "write", "x",
-         "Option FileName: has an ending that names no sound file format: a.x"},
-        {"SampleFormat", "PCM_16", "x", "Option SampleFormat: is not known."},
-        {"BlokSize", "1", "x", "Option BlokSize: is not known."},
-        {"BlockSize", "", "n", "Option BlockSize: must be a whole number from 1 to 16777216."},
-        {"BlockSize", "1", "x", "Option BlockSize: must be one number."},
-        {"Mode", "", "n", "Option Mode: must be a text."},
-        {"Timeout", "1", "x", "Option Timeout: must be one number."},
-    };
-    for (const auto& [name, text, kind, error] : rows) {
-        SCOPED_TRACE(name + "=" + text);
-        Channel channel("audiofile");
-        const int result =
-            kind == "n"
-                ? coderChannelInit(channel.handle, 2, CODER_OPTION("FileName", "char", 4, "a.x"),
-                                   CODER_OPTION(name.c_str(), "double", 1, &zero))
-                : coderChannelInit(channel.handle, 2, CODER_OPTION("FileName", "char", 4, "a.x"),
-                                   CODER_OPTION(name.c_str(), "char", 99, text.c_str()));
-        EXPECT_EQ(result, 0);
-        EXPECT_EQ(channel.error().substr(0, unexpected.size() + error.size()), unexpected + error);
+    Channel file("audiofile");
+    EXPECT_EQ(file.init({{"FileName", "/no/such.wav"}}), 0);
+    EXPECT_EQ(file.error().find(unexpected + "Could not open /no/such.wav: "), 0);
+    Channel serial("serial");
+    const std::pair<const char*, const char*> ports[] = {
+        {"/no/such", "No such file or directory"}, {"/dev/null", "Inappropriate ioctl for device"}};
+    for (const auto& [port, reason] : ports) {
+        ASSERT_EQ(serial.init({{"Port", port}}), 1);
+        EXPECT_EQ(serial.open(), 0);
+        EXPECT_EQ(serial.error(), unexpected + "Could not open " + port + ": " + reason);
     }
 }

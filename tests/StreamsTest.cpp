@@ -2,6 +2,8 @@
 
 #include "scripted/ChannelFixture.hpp"
 
+#include <numeric>
+
 using namespace scripted;
 
 class StreamsTest : public ChannelTest
@@ -43,6 +45,33 @@ TEST_F(StreamsTest, FieldsThatCannotBeRead)
     EXPECT_EQ(to.written(), "");
     EXPECT_EQ(coderInputStreamReadBufferData(input, 1, 2, "Data", "int32", 1, to.data()), 1);
     EXPECT_EQ(to.written(), "\2\0\0\0"s);
+}
+
+TEST_F(StreamsTest, PeekFillsTheArrayThatThereIs)
+{
+    core.counts = {3, 4, 1};
+    const std::tuple<double, double, double, std::string> rows[] = {
+        // size of the array, most counts; total, as the core is to see it
+        {NAN, 2.9, 0, "2"},
+        {-1, -1, 0, "0"},
+        {0.9, 0x1p64, 0, "18446744073709551615"},
+        {1, 1e18, 3, "1000000000000000000"},
+        {2.9, 0, 7, "0"},
+        {INFINITY, 0.9, 8, "0"},
+    };
+    for (const auto& [size, most, sum, limit] : rows) {
+        Buffer counts(3 * sizeof(double));
+        double total = -1;
+        double buffers = size;
+        EXPECT_EQ(coderInputStreamPeek(input, &total, reinterpret_cast<double*>(counts.data()),
+                                       &buffers, most),
+                  1);
+        const double all[] = {3, 4, 1};
+        EXPECT_EQ(counts.written(), bytesOf(all, static_cast<std::size_t>(buffers)));
+        EXPECT_EQ(std::accumulate(all, all + static_cast<int>(buffers), 0.0), sum);
+        EXPECT_EQ(total, sum);
+        EXPECT_EQ(takeLog(), Log{"input.peekCounts(" + limit + ")"});
+    }
 }
 
 TEST_F(StreamsTest, Writes)

@@ -34,8 +34,6 @@ long resident()
 
 TEST(StressTest, FourThreadsReportWhileTheOwnerWorks)
 {
-    const int threads = 4;
-    const int packets[] = {30, 30};
     const auto end = Clock::now() + std::chrono::seconds(STRESS_SECONDS);
     long lives = 0;
     long errors = 0;
@@ -43,22 +41,16 @@ TEST(StressTest, FourThreadsReportWhileTheOwnerWorks)
     for (; Clock::now() < end; ++lives) {
         Channel channel(TEST_PLUGINS "/probe.so", 20);
         for (int round = 0; round < 2; ++round) { // the second init ends and starts the threads
-            ASSERT_EQ(channel.init(3, CODER_OPTION("Threads", "int32", 1, &threads),
-                                   CODER_OPTION("Streams", "char", 9, "io"),
-                                   CODER_OPTION("Packets", "int32", 2, packets)),
-                      1);
+            ASSERT_EQ(channel.init({{"Threads", 4}, {"Streams", "io"}, {"Packets", {30, 30}}}), 1);
             ASSERT_EQ(channel.open(), 1);
             for (double next = 0; next < 60; next += 10) {
                 channel.peek();
                 ASSERT_EQ(coderInputStreamReadBuffers(channel.input, 10, 1), 1) << channel.error();
-                double value = -1;
                 EXPECT_EQ(coderInputStreamReadBufferData(channel.input, 1, 0, "data", "double", 10,
                                                          Numbers(10).data()),
                           1);
                 EXPECT_EQ(channel.write({1, 2}), 2);
-                EXPECT_EQ(
-                    coderChannelGetPropertyValue(channel.handle, "Level", "double", 1, &value), 1);
-                levels.insert(value);
+                levels.insert(channel.property<double>("Level", "double"));
                 uint8_t has = 0;
                 EXPECT_EQ(coderChannelHasAsyncError(channel.handle, &has), 1);
                 const std::string error = channel.error(coderChannelGetLastAsyncError);
@@ -67,9 +59,9 @@ TEST(StressTest, FourThreadsReportWhileTheOwnerWorks)
                 EXPECT_TRUE(has == 0 || error != "|");
                 errors += has;
             }
-            EXPECT_EQ(coderChannelClose(channel.handle), 1);
+            EXPECT_EQ(channel.close(), 1);
         }
-        EXPECT_EQ(coderChannelTerm(channel.handle), 1);
+        EXPECT_EQ(channel.term(), 1);
     }
     EXPECT_GT(errors, 0);
     EXPECT_GT(levels.size(), 1);
@@ -84,7 +76,7 @@ TEST(StressTest, ManyChannelsAtOnce)
         std::vector<std::unique_ptr<Channel>> channels(1000 / STRESS_SCALE);
         for (auto& channel : channels) {
             channel = std::make_unique<Channel>("loopback");
-            ASSERT_EQ(channel->init(0), 1);
+            ASSERT_EQ(channel->init(), 1);
             ASSERT_EQ(channel->open(), 1) << channel->error();
         }
         EXPECT_GT(entries("/proc/self/task"), 1000 / STRESS_SCALE);
@@ -97,8 +89,8 @@ TEST(StressTest, ManyChannelsAtOnce)
             ASSERT_EQ(channel->read(1, 1), Numbers{++number}) << channel->error();
         }
         for (const auto& channel : channels) {
-            ASSERT_EQ(coderChannelClose(channel->handle), 1);
-            ASSERT_EQ(coderChannelTerm(channel->handle), 1);
+            ASSERT_EQ(channel->close(), 1);
+            ASSERT_EQ(channel->term(), 1);
         }
     }
     EXPECT_EQ(allocations::live, before);
@@ -110,12 +102,12 @@ TEST(StressTest, ManyLivesOfAChannel)
     Channel channel("loopback");
     const Numbers numbers = range(0, 100);
     const auto live = [&] {
-        ASSERT_EQ(channel.init(0), 1);
+        ASSERT_EQ(channel.init(), 1);
         ASSERT_EQ(channel.open(), 1);
         ASSERT_EQ(channel.write(numbers), 100) << channel.error();
         ASSERT_EQ(channel.read(100, 1), numbers) << channel.error();
-        ASSERT_EQ(coderChannelClose(channel.handle), 1);
-        ASSERT_EQ(coderChannelTerm(channel.handle), 1);
+        ASSERT_EQ(channel.close(), 1);
+        ASSERT_EQ(channel.term(), 1);
     };
     const int cycles = 10000 / STRESS_SCALE;
     for (int i = 0; i < cycles / 10; ++i) {

@@ -67,64 +67,20 @@ struct Program {
 class Life
 {
 public:
-    enum Step {
-        Create,
-        Init,
-        AddFilter,
-        Open,
-        Write,
-        Read,
-        Copy,
-        ReadOn,
-        CopyOn,
-        Close,
-        Term,
-        End
-    };
+    enum Step { Read = 5, ReadOn = 7, Close = 9, End = 11 };
 
     explicit Life(const Program& theProgram) : program(theProgram) {}
     Life(const Life&) = delete;
     Life& operator=(const Life&) = delete;
     ~Life() { coderChannelDestroy(channel); }
 
-    bool step(int number)
-    {
-        const int factor = 2;
-        const bool hasInput = program.reads > 0;
-        switch (number) {
-        case Create:
-            channel = coderChannelCreate(program.device, program.converter, id, message,
-                                         program.limit, infinity);
-            return channel != nullptr;
-        case Init:
-            return program.init(channel) == 1;
-        case AddFilter:
-            return program.filter == nullptr ||
-                   coderStreamAddFilter(hasInput ? input() : output(), program.filter, 1,
-                                        CODER_OPTION("Factor", "int32", 1, &factor)) == 1;
-        case Open:
-            return coderChannelOpen(channel, 0) == 1;
-        case Write:
-            return program.writes == 0 ||
-                   coderOutputStreamWriteTypedDataOld(output(), &written, 1, "double",
-                                                      CODER_BUFFER(program.writes, numbers)) == 1;
-        case Read:
-        case ReadOn:
-            return !hasInput || (await() && read());
-        case Copy:
-        case CopyOn:
-            return !hasInput || copy();
-        case Close:
-            return coderChannelClose(channel) == 1;
-        default:
-            return coderChannelTerm(channel) == 1;
-        }
-    }
-
     /// Does steps up to the first that fails.
     int run(int first)
     {
-        while (first < End && step(first)) {
+        constexpr bool (Life::*steps[End])() = {
+            &Life::create, &Life::init, &Life::addFilter, &Life::open,  &Life::write, &Life::read,
+            &Life::copy,   &Life::read, &Life::copy,      &Life::close, &Life::term};
+        while (first < End && (this->*steps[first])()) {
             ++first;
         }
         return first;
@@ -144,30 +100,49 @@ private:
     void* input() const { return coderChannelGetInputStream(channel); }
     void* output() const { return coderChannelGetOutputStream(channel); }
 
-    /// Waits for the counts; false when they will not come.
-    bool await() const
+    bool create()
+    {
+        channel = coderChannelCreate(program.device, program.converter, id, message, program.limit,
+                                     infinity);
+        return channel != nullptr;
+    }
+    bool init() { return program.init(channel) == 1; }
+    bool addFilter()
+    {
+        return program.filter == nullptr ||
+               withOptions({{"Factor", 2}}, coderStreamAddFilter,
+                           program.reads > 0 ? input() : output(), program.filter) == 1;
+    }
+    bool open() { return coderChannelOpen(channel, 0) == 1; }
+    bool write()
+    {
+        return program.writes == 0 ||
+               coderOutputStreamWriteTypedDataOld(output(), &written, 1, "double",
+                                                  CODER_BUFFER(program.writes, numbers)) == 1;
+    }
+    bool close() { return coderChannelClose(channel) == 1; }
+    bool term() { return coderChannelTerm(channel) == 1; }
+
+    /// Waits for the counts and reads them; false when they will not come.
+    bool read()
     {
         const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
         double available = 0;
         uint8_t failed = 0;
-        while (failed == 0 && std::chrono::steady_clock::now() < end) {
+        while (available < program.reads) {
+            if (failed == 1 || std::chrono::steady_clock::now() > end) {
+                return false;
+            }
             coderChannelHasAsyncError(channel, &failed); // before the last look at the data
             coderStreamGetDataAvailable(input(), &available);
-            if (available >= program.reads) {
-                return true;
-            }
             std::this_thread::sleep_for(std::chrono::microseconds(50));
         }
-        return false;
-    }
-
-    bool read()
-    {
         double total = 0;
         double counts[8];
-        buffers = 8;
-        return coderInputStreamPeek(input(), &total, counts, &buffers, program.reads) == 1 &&
-               coderInputStreamReadBuffers(input(), program.reads, buffers) == 1;
+        buffers = program.reads > 0 ? 8 : 0;
+        return program.reads == 0 ||
+               (coderInputStreamPeek(input(), &total, counts, &buffers, program.reads) == 1 &&
+                coderInputStreamReadBuffers(input(), program.reads, buffers) == 1);
     }
 
     bool copy()
@@ -200,49 +175,46 @@ protected:
     const std::string file = testing::TempDir() + "sweep-" + std::to_string(getpid()) + ".wav";
     const std::string host = "127.1." + std::to_string(getpid() >> 8 & 255) + "." +
                              std::to_string(getpid() & 255); // of this process alone
-    const int large[2] = {7, 1}, uneven[2] = {3, 5}, port = 47110, block = 4, frames = 8,
-              channels = 2;
-
     /// The devices, converters and filters.
     const std::vector<Program> programs = {
         {probe.c_str(), "identity", pickyFilter.c_str(), 4, 0, 4, "data",
-         [this](void* channel) {
-             return coderChannelInit(channel, 1, CODER_OPTION("Packets", "int32", 2, large));
+         [](void* channel) {
+             return init(channel, {{"Packets", {7, 1}}});
          }},
         {probe.c_str(), "identity", nullptr, infinity, 0, 4, "data",
-         [this](void* channel) {
-             return coderChannelInit(channel, 1, CODER_OPTION("Packets", "int32", 2, uneven));
+         [](void* channel) {
+             return init(channel, {{"Packets", {3, 5}}});
          }},
         {"loopback", "identity", "decimate", infinity, 8, 2, "data",
-         [](void* channel) { return coderChannelInit(channel, 0); }},
+         [](void* channel) { return init(channel, {}); }},
         {"signal", "columns", nullptr, infinity, 0, 4, "Data1",
-         [this](void* channel) {
-             return coderChannelInit(channel, 4, CODER_OPTION("Pace", "char", 9, "fast"),
-                                     CODER_OPTION("BlockSize", "int32", 1, &block),
-                                     CODER_OPTION("Frames", "int32", 1, &frames),
-                                     CODER_OPTION("Channels", "int32", 1, &channels));
+         [](void* channel) {
+             return init(channel,
+                         {{"Pace", "fast"}, {"BlockSize", 4}, {"Frames", 8}, {"Channels", 2}});
          }},
         {"audiofile", "identity", "decimate", infinity, 8, 0, "",
          [this](void* channel) {
-             return coderChannelInit(channel, 3,
-                                     CODER_OPTION("FileName", "char", 999, file.c_str()),
-                                     CODER_OPTION("Mode", "char", 9, "write"),
-                                     CODER_OPTION("SampleFormat", "char", 9, "DOUBLE"));
+             return init(channel,
+                         {{"FileName", file}, {"Mode", "write"}, {"SampleFormat", "DOUBLE"}});
          }},
         {"audiofile", "columns", nullptr, infinity, 0, 2, "Data1",
          [this](void* channel) {
-             return coderChannelInit(channel, 1,
-                                     CODER_OPTION("FileName", "char", 999, file.c_str()));
+             return init(channel, {{"FileName", file}});
          }},
         {"udp", "identity", nullptr, infinity, 8, 4, "data",
          [this](void* channel) {
-             return coderChannelInit(channel, 5, CODER_OPTION("Host", "char", 99, host.c_str()),
-                                     CODER_OPTION("LocalHost", "char", 99, host.c_str()),
-                                     CODER_OPTION("Port", "int32", 1, &port),
-                                     CODER_OPTION("LocalPort", "int32", 1, &port),
-                                     CODER_OPTION("ElementType", "char", 9, "double"));
+             return init(channel, {{"Host", host},
+                                   {"LocalHost", host},
+                                   {"Port", 47110},
+                                   {"LocalPort", 47110},
+                                   {"ElementType", "double"}});
          }},
     };
+
+    static int init(void* channel, Options options)
+    {
+        return withOptions(options, coderChannelInit, channel);
+    }
 };
 
 } // namespace
@@ -255,18 +227,16 @@ TEST_F(SweepTest, EveryCall)
         for (std::size_t i = 0; i < handles; ++i) {
             SCOPED_TRACE(std::to_string(&call - calls.rows.data()) + " " + call.operation);
             sweepWithoutLeak([&](long number, bool lasts) {
-                const int packets[] = {10, 10};
                 Channel channel(probe);
-                channel.init(2, CODER_OPTION("Streams", "char", 9, "io"),
-                             CODER_OPTION("Packets", "int32", 2, packets));
-                coderStreamAddFilter(channel.input, "scale", 0);
-                coderStreamAddFilter(channel.output, "scale", 0);
+                channel.init({{"Streams", "io"}, {"Packets", {10, 10}}});
+                Channel::addFilter(channel.input, "scale");
+                Channel::addFilter(channel.output, "scale");
                 channel.open();
                 Channel::waitUntil(
                     [&] { return channel.ask(coderStreamGetDataAvailable, channel.input) == 20; });
                 EXPECT_EQ(channel.read(5, 1), range(0, 5));
                 if (call.operation != "close") {
-                    coderChannelClose(channel.handle);
+                    channel.close();
                 }
                 void* const handle = call.handles(channel.handle, channel.input, channel.output)[i];
                 const double unwritten = 0x1.23456789p3;
@@ -289,8 +259,8 @@ TEST_F(SweepTest, EveryCall)
                 const Failing all(1); // no end needs memory
                 coderInputStreamFreeBuffer(coderChannelGetInputStream(channel.handle), 1);
                 coderInputStreamFreeBuffer(coderChannelGetInputStream(channel.handle), 9);
-                coderChannelClose(channel.handle);
-                coderChannelTerm(channel.handle);
+                channel.close();
+                channel.term();
                 coderChannelDestroy(std::exchange(channel.handle, nullptr));
                 return failed;
             });
@@ -356,9 +326,9 @@ TEST_F(SweepTest, AnErrorOfAPlugInIsKept)
 {
     sweepWithoutLeak([&](long number, bool lasts) {
         Channel channel(probe);
-        channel.init(1, CODER_OPTION("RaiseIn", "char", 9, "term"));
+        channel.init({{"RaiseIn", "term"}});
         Failing failing(number, lasts);
-        const int result = coderChannelTerm(channel.handle);
+        const int result = channel.term();
         const bool failed = Failing::end();
         EXPECT_EQ(result, 0);
         EXPECT_EQ(channel.error(), failed ? unexpected + "std::bad_alloc" : "|");
