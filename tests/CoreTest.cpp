@@ -130,8 +130,9 @@ TEST(DataTest, MovesByPointerFromDeviceToCaller)
         Channel channel(probe, converter, handler, UINT64_MAX, UINT64_MAX);
         PropertyMap properties;
         const std::string name = "Packets";
-        channel.init({{name, new brenixplugin::kit::device::TScalarProperty<int>(name, 1000)}},
-                     properties);
+        channel.init(
+            {{name, new brenixplugin::kit::device::TScalarProperty<std::u16string>(name, u"1000")}},
+            properties);
         channel.open({});
         std::vector<void*> buffers;
         unsigned long read = 0;

@@ -35,33 +35,28 @@ inline std::string create(void*& channel, const std::string& device, const std::
     return id + "|"s + message;
 }
 
-/// An option whose value is a text, a number, or several. Needs no memory.
+/// An option whose value is a text or a number. Needs no memory.
 class Option
 {
 public:
     Option(const char* option, const char* text)
-        : name(option), type("char"), count(std::strlen(text)), elements(text)
+        : name(option), type("char"), count(std::strlen(text)), characters(text)
     {
     }
     Option(const char* option, const std::string& text) : Option(option, text.c_str()) {}
     Option(const char* option, double value) : name(option), type("double"), number(value) {}
     Option(const char* option, int value) : name(option), type("int32"), whole(value) {}
-    Option(const char* option, std::initializer_list<int> values)
-        : name(option), type("int32"), count(values.size()), elements(values.begin())
-    {
-    }
     const void* data() const
     {
-        return elements != nullptr ? elements
-               : *type == 'd'      ? static_cast<const void*>(&number)
-                                   : &whole;
+        const void* const numeric = *type == 'd' ? static_cast<const void*>(&number) : &whole;
+        return characters != nullptr ? characters : numeric;
     }
 
     const char *name, *type;
     std::size_t count = 1;
 
 private:
-    const void* elements = nullptr;
+    const char* characters = nullptr;
     double number = 0;
     int whole = 0;
 };
@@ -104,6 +99,12 @@ public:
     int open(double timeout = 10) const
     {
         return withOptions({{"Timeout", timeout}}, coderChannelOpen, handle);
+    }
+    /// Initialises and opens.
+    void start(Options options = {}, double timeout = 10)
+    {
+        ASSERT_EQ(init(options), 1) << error();
+        ASSERT_EQ(open(timeout), 1) << error();
     }
     int execute(const char* command, Options options = {}) const
     {
@@ -189,6 +190,18 @@ public:
             }
         }
         return all;
+    }
+
+    /// The error of a read or a write that has to fail.
+    std::string readError(double counts, double buffers) const
+    {
+        EXPECT_EQ(coderInputStreamReadBuffers(input, counts, buffers), 0);
+        return error();
+    }
+    std::string writeError(const Numbers& values) const
+    {
+        EXPECT_EQ(write(values), 0);
+        return error();
     }
 
     /// Writes one buffer; the counts written.

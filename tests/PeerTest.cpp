@@ -335,25 +335,6 @@ TEST(AudioFileTest, WhatIsWrittenIsWhatSoxReads)
     }
 }
 
-TEST(AudioFileTest, WhatSoxMakesIsRead)
-{
-    const std::pair<const char*, const char*> rows[] = {
-        {".wav", "-b 16"},  {".wav", "-b 8"},   {".wav", "-b 32 -e floating-point"},
-        {".flac", "-b 24"}, {".aiff", "-b 24"}, {".au", "-b 8 -e mu-law"},
-        {".w64", "-b 32"},
-    };
-    for (const auto& [ending, encoding] : rows) {
-        SCOPED_TRACE(ending + " "s + encoding);
-        const std::string soundFile = file + ending;
-        sox("-n -r 8000 -c 2 "s + encoding + " " + soundFile + " synth 0.2 brownnoise");
-        Channel reader("audiofile");
-        ASSERT_EQ(reader.init({{"FileName", soundFile}}), 1) << reader.error();
-        ASSERT_EQ(reader.open(), 1);
-        EXPECT_EQ(reader.read(1600, 2), soxSamples(soundFile));
-        std::remove(soundFile.c_str());
-    }
-}
-
 TEST(TcpTest, NobodyListens)
 {
     Channel channel("tcp");

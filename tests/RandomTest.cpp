@@ -57,9 +57,9 @@ public:
     {
         using S = Sequence;
         constexpr void (Sequence::*steps[])() = {
-            &S::init,   &S::passing, &S::passing, &S::passing,   &S::passing, &S::property,
-            &S::errors, &S::errors,  &S::handles, &S::happening, &S::read,    &S::read,
-            &S::field,  &S::field,   &S::free,    &S::destroy};
+            &S::init,     &S::passing, &S::passing, &S::passing,   &S::passing,
+            &S::property, &S::errors,  &S::errors,  &S::happening, &S::read,
+            &S::read,     &S::field,   &S::field,   &S::free,      &S::destroy};
         while (calls < 200 && !testing::Test::HasFailure()) {
             const std::size_t step = pick(std::size(steps));
             SCOPED_TRACE("call " + std::to_string(calls) + ", step " + std::to_string(step));
@@ -128,7 +128,7 @@ private:
             return;
         }
         std::function<void()>& hook = core.on[operation];
-        switch (pick(c->handle == nullptr ? 2 : 5)) {
+        switch (pick(5)) {
         case 0:
             hook = [] { throw brenixcore::CannotAddFilterWhileOpen("text"); };
             throw Failure{"brenix:Stream:cannotAddFilterWhileOpen|"};
@@ -167,8 +167,8 @@ private:
     {
         const std::string name = anyOf({"error", "error", "errorMessage", "warning",
                                         "warningMessage", "trace", "traceMessage", "Error", ""});
-        const std::string id = anyOf({"", "i"});
-        event = somewhere([=] { raiseEvent(name, id, "m"); });
+        const std::string identifier = anyOf({"", "i"});
+        event = somewhere([=] { raiseEvent(name, identifier, "m"); });
         if (name == "error") {
             expected.emplace_back("getMessage()");
         }
@@ -177,7 +177,7 @@ private:
         }
         if (name.starts_with("error")) {
             const auto* const fixed = "Array-based errors are not yet supported in Zelkor";
-            (elsewhere ? c->async : c->sync) = id + "|" + (name == "error" ? "m" : fixed);
+            (elsewhere ? c->async : c->sync) = identifier + "|" + (name == "error" ? "m" : fixed);
             require(elsewhere, "|");
         }
     }
@@ -242,20 +242,9 @@ private:
 
     void create()
     {
-        *c = ChannelModel();
         core = {};
-        Buffer id(CODER_ERROR_SIZE);
-        Buffer message(CODER_ERROR_SIZE);
-        std::string error = "|";
-        try {
-            expectCore("Converter");
-            expectCore("Channel");
-        } catch (const Failure& failure) {
-            error = failure.error;
-            expected.resize(expected.size() == 2 ? 3 : 1, "~Converter()");
-        }
+        expected = {"Converter(c)", "Channel(d, 1, 1)"};
         c->handle = coderChannelCreate("d", "c", id, message, 1, 1);
-        EXPECT_EQ(c->handle == nullptr ? id.text() + "|" + message.text() : "|", error);
         compareLog();
     }
 
@@ -288,15 +277,15 @@ private:
             make(*core.properties, c->properties);
         }
         for (StreamModel* s : {&c->input, &c->output}) {
-            void* const handle = streamOf(c->handle, s->isInput);
+            void* const handle = s->isInput ? coderChannelGetInputStream(c->handle)
+                                            : coderChannelGetOutputStream(c->handle);
             EXPECT_EQ(std::exchange(s->handle, handle) != handle, std::exchange(s->isNew, false));
+            EXPECT_EQ(coderStreamGetChannel(handle), handle == nullptr ? nullptr : c->handle);
+            uint8_t supported = 0;
+            coderStreamIsSupported(handle, &supported);
+            EXPECT_EQ(supported == 1, s->supported);
         }
         c->last = "|";
-    }
-
-    static void* streamOf(void* channel, bool isInput)
-    {
-        return isInput ? coderChannelGetInputStream(channel) : coderChannelGetOutputStream(channel);
     }
 
     StreamModel& anyStream() { return pick(2) == 1 ? c->input : c->output; }
@@ -337,23 +326,6 @@ private:
         call(row.target == Channels ? c->handle : s.handle, model,
              [&](void* handle) { return row.run(handle, answer.data()); });
         EXPECT_EQ(answer.written(), bytes);
-    }
-
-    void handles()
-    {
-        const StreamModel& s = anyStream();
-        call(
-            c->handle, [] {},
-            [&](void* handle) {
-                EXPECT_EQ(streamOf(handle, s.isInput), handle == nullptr ? nullptr : s.handle);
-                return handle != nullptr;
-            });
-        EXPECT_EQ(coderStreamGetChannel(s.handle), s.handle == nullptr ? nullptr : c->handle);
-        uint8_t supported = 0;
-        call(
-            s.handle, [] {},
-            [&](void* handle) { return coderStreamIsSupported(handle, &supported); });
-        EXPECT_TRUE(supported == 0 || s.supported);
     }
 
     void property()
@@ -484,6 +456,7 @@ private:
         });
     }
 
+    char id[CODER_ERROR_SIZE] = "", message[CODER_ERROR_SIZE] = "";
     std::mt19937_64 random;
     Calls table{"a", "b", "f", "o"};
     ChannelModel channels[3];

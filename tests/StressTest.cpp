@@ -41,7 +41,7 @@ TEST(StressTest, FourThreadsReportWhileTheOwnerWorks)
     for (; Clock::now() < end; ++lives) {
         Channel channel(TEST_PLUGINS "/probe.so", 20);
         for (int round = 0; round < 2; ++round) { // the second init ends and starts the threads
-            ASSERT_EQ(channel.init({{"Threads", 4}, {"Streams", "io"}, {"Packets", {30, 30}}}), 1);
+            ASSERT_EQ(channel.init({{"Threads", 4}, {"Streams", "io"}, {"Packets", "30 30"}}), 1);
             ASSERT_EQ(channel.open(), 1);
             for (double next = 0; next < 60; next += 10) {
                 channel.peek();

@@ -179,11 +179,11 @@ protected:
     const std::vector<Program> programs = {
         {probe.c_str(), "identity", pickyFilter.c_str(), 4, 0, 4, "data",
          [](void* channel) {
-             return init(channel, {{"Packets", {7, 1}}});
+             return init(channel, {{"Packets", "7 1"}});
          }},
         {probe.c_str(), "identity", nullptr, infinity, 0, 4, "data",
          [](void* channel) {
-             return init(channel, {{"Packets", {3, 5}}});
+             return init(channel, {{"Packets", "3 5"}});
          }},
         {"loopback", "identity", "decimate", infinity, 8, 2, "data",
          [](void* channel) { return init(channel, {}); }},
@@ -228,7 +228,7 @@ TEST_F(SweepTest, EveryCall)
             SCOPED_TRACE(std::to_string(&call - calls.rows.data()) + " " + call.operation);
             sweepWithoutLeak([&](long number, bool lasts) {
                 Channel channel(probe);
-                channel.init({{"Streams", "io"}, {"Packets", {10, 10}}});
+                channel.init({{"Streams", "io"}, {"Packets", "10 10"}});
                 Channel::addFilter(channel.input, "scale");
                 Channel::addFilter(channel.output, "scale");
                 channel.open();

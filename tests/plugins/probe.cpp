@@ -6,7 +6,9 @@
 
 #include <atomic>
 #include <chrono>
+#include <iterator>
 #include <memory>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <thread>
@@ -32,7 +34,7 @@ struct UnknownProperty : interfaces::IPropertyInfo {
     void destroy() override { delete this; }
 };
 
-/// Options: Packets (counts of the packets to push, as int32; of those below 0 each is a mistake of
+/// Options: Packets (counts of the packets to push, as a text or as int32; of those below 0 each is a mistake of
 /// its own), Streams ("i", "o", "io", ""), FailIn and RaiseIn (an operation: init, open, run, execute,
 /// close, term), FailAs (what is thrown: "", "int", "own", "silent", "long"; or "slow"), Threads (how
 /// many report things from init to term).
@@ -49,13 +51,13 @@ public:
         failAs = options.text("FailAs").value_or("");
         raiseIn = options.text("RaiseIn").value_or("");
         const std::string streams = options.text("Streams").value_or("i");
-        packets.clear();
-        if (const auto found = optionMap.find("Packets"); found != optionMap.end()) {
-            auto* const property = asProperty(found->second);
-            const auto* const one = dynamic_cast<device::TScalarProperty<int>*>(property);
-            packets = one != nullptr
-                          ? std::vector<int>{one->value}
-                          : dynamic_cast<device::TVectorProperty<int>&>(*property).values;
+        const auto given = optionMap.find("Packets");
+        auto* const property = given == optionMap.end() ? nullptr : asProperty(given->second);
+        if (const auto* list = dynamic_cast<device::TVectorProperty<int>*>(property)) {
+            packets = list->values;
+        } else {
+            std::istringstream text(options.text("Packets").value_or(""));
+            packets.assign(std::istream_iterator<int>(text), {});
         }
         reach("init");
         host->updateProperty(makeScalar("Level", 0.0)); // too early: there is no property yet
