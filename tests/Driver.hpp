@@ -8,12 +8,13 @@
 
 #include <chrono>
 #include <cstdint>
-#include <cstring>
 #include <initializer_list>
 #include <limits>
 #include <numeric>
 #include <string>
+#include <string_view>
 #include <thread>
+#include <variant>
 #include <vector>
 
 namespace driver
@@ -36,29 +37,24 @@ inline std::string create(void*& channel, const std::string& device, const std::
 }
 
 /// An option whose value is a text or a number. Needs no memory.
-class Option
-{
-public:
-    Option(const char* option, const char* text)
-        : name(option), type("char"), count(std::strlen(text)), characters(text)
+struct Option {
+    const char* name;
+    std::variant<std::string_view, double, int> value;
+
+    const char* type() const
     {
+        constexpr const char* types[] = {"char", "double", "int32"};
+        return types[value.index()];
     }
-    Option(const char* option, const std::string& text) : Option(option, text.c_str()) {}
-    Option(const char* option, double value) : name(option), type("double"), number(value) {}
-    Option(const char* option, int value) : name(option), type("int32"), whole(value) {}
+    std::size_t count() const { return value.index() == 0 ? std::get<0>(value).size() : 1; }
     const void* data() const
     {
-        const void* const numeric = *type == 'd' ? static_cast<const void*>(&number) : &whole;
-        return characters != nullptr ? characters : numeric;
+        const void* const number = std::get_if<double>(&value);
+        if (value.index() == 0) {
+            return std::get<0>(value).data();
+        }
+        return number != nullptr ? number : std::get_if<int>(&value);
     }
-
-    const char *name, *type;
-    std::size_t count = 1;
-
-private:
-    const char* characters = nullptr;
-    double number = 0;
-    int whole = 0;
 };
 using Options = std::initializer_list<Option>;
 
@@ -66,9 +62,9 @@ using Options = std::initializer_list<Option>;
 template <typename Function, typename... Arguments>
 int withOptions(Options options, Function function, Arguments... arguments)
 {
-    const Option none("", 0);
+    const Option none{"", 0};
     const auto at = [&](std::size_t i) { return i < options.size() ? options.begin() + i : &none; };
-#define OPTION(i) CODER_OPTION(at(i)->name, at(i)->type, at(i)->count, at(i)->data())
+#define OPTION(i) CODER_OPTION(at(i)->name, at(i)->type(), at(i)->count(), at(i)->data())
     return function(arguments..., options.size(), OPTION(0), OPTION(1), OPTION(2), OPTION(3),
                     OPTION(4), OPTION(5), OPTION(6));
 }

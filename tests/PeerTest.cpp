@@ -302,6 +302,7 @@ TEST(SerialTest, TwoPortsTalk)
         end->waitForEnd();
         EXPECT_EQ(end->peek(), Numbers{});
     }
+    std::remove(other.c_str());
 }
 
 TEST(AudioFileTest, WhatIsWrittenIsWhatSoxReads)
