@@ -52,6 +52,28 @@ void Stream::Impl::setTimeout(double seconds)
     }
 }
 
+bool Stream::Impl::giveWay(std::unique_lock<std::mutex>& lock)
+{
+    if (sleeps > 0) {
+        --sleeps;
+        return false;
+    }
+    using std::chrono::steady_clock;
+    lock.unlock();
+    const auto begin = steady_clock::now();
+    std::this_thread::yield();
+    const bool tookLong = steady_clock::now() - begin > std::chrono::microseconds(200);
+    lock.lock();
+    // Busy threads leave the processor to one that is woken, but not to one that gave it away.
+    if (tookLong) {
+        sleeps = caution;
+        caution = std::min(2 * caution, 1U << 16);
+    } else {
+        caution = std::max(caution - 1, 16U);
+    }
+    return !tookLong;
+}
+
 bool Stream::Impl::push(plugin::Packet& packet, bool waits)
 {
     std::unique_lock lock(mutex);

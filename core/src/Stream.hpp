@@ -92,8 +92,8 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     bool fits(std::uint64_t more) const { return counts <= limit && more <= limit - counts; }
 
     /// Waits until the condition holds, or for so long. Under the mutex. It gives way a few times before
-    /// it sleeps: while data flows there is seldom long to wait, and sleeping and being woken takes
-    /// longer than most packets do.
+    /// it sleeps: while data flows there is seldom long to wait, and to sleep and be woken takes longer
+    /// than most packets do.
     template <typename Condition>
     void waitUntil(std::unique_lock<std::mutex>& lock, const Condition& over,
                    std::optional<std::chrono::steady_clock::duration> atMost = std::nullopt)
@@ -101,10 +101,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
         if (atMost == std::chrono::steady_clock::duration::zero()) {
             return;
         }
-        for (int turn = 0; turn < 10 && !over(); ++turn) {
-            lock.unlock();
-            std::this_thread::yield();
-            lock.lock();
+        for (int turn = 0; turn < 10 && !over() && giveWay(lock); ++turn) {
         }
         if (!atMost) {
             changed.wait(lock, over);
@@ -112,6 +109,9 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
             changed.wait_for(lock, *atMost, over);
         }
     }
+
+    /// Lets other threads run. Returns whether that is better than to sleep. Under the mutex.
+    bool giveWay(std::unique_lock<std::mutex>& lock);
 
     /// Moves from `pending` to `packets` what has room. When it throws, the rest stays. Under the mutex.
     void refill();
@@ -149,6 +149,8 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     Packets packets;
     std::uint64_t counts = 0; ///< in `packets`
     std::uint64_t wanted = 0; ///< that a read is waiting for
+    unsigned sleeps = 0;      ///< so many waits to come do not give way
+    unsigned caution = 16;    ///< and so many after the next time that this takes long
     Packets pending;          ///< pushed by the device, which then waits; not yet all in `packets`
 };
 
