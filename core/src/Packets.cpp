@@ -129,9 +129,13 @@ void requireWhole(const plugin::Packet& packet)
     if (!packet.fields) {
         throw std::invalid_argument("A packet has no fields.");
     }
+    if (packet.fields.isChecked()) {
+        return;
+    }
     for (const auto& [name, property] : *packet.fields) {
         visitField(name, property, RequireElements());
     }
+    packet.fields.setChecked();
 }
 
 } // namespace brenixcore

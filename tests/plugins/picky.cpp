@@ -33,7 +33,7 @@ void spoil(Packet& packet, double first)
         packet.counts = UINT64_MAX;
         break;
     case 16:
-        packet.fields.reset();
+        Fields(std::move(packet.fields)); // leaves none
         break;
     case 17:
         packet.fields->emplace("null", nullptr);

@@ -224,7 +224,7 @@ private:
         Packet packet;
         packet.counts = mistake == -1 ? 0 : 5;
         if (mistake == -2) {
-            packet.fields.reset();
+            Fields(std::move(packet.fields)); // leaves none
         } else if (mistake == -3) {
             setField(packet, OwnedProperty(new UnknownProperty));
         } else if (mistake == -4) {

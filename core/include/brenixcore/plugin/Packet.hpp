@@ -12,13 +12,39 @@
 namespace brenixcore::plugin
 {
 
-/// Property objects by field name, and the number of counts (samples, frames, elements) that they
-/// hold. It owns its fields and is moved, never copied. Where a packet has to be divided, a field
-/// with a whole number of elements for each count is divided with it, and any other field is
-/// repeated in each part.
+/// Property objects by field name, owned; used like a pointer to their map. It notes whether anybody
+/// used it, so that fields which pass through untouched are checked once.
+class Fields
+{
+public:
+    brenixplugin::PropertyMap& operator*() const
+    {
+        checked = false;
+        return *map;
+    }
+    brenixplugin::PropertyMap* operator->() const { return &**this; }
+
+    /// Whether there is a map.
+    explicit operator bool() const { return map != nullptr; }
+
+    /// Hands the map and its objects over; none is left.
+    brenixplugin::PropertyMap* release() { return map.release(); }
+
+    /// For the core: whether nobody used the fields since it found them sound.
+    bool isChecked() const { return checked; }
+    void setChecked() const { checked = true; }
+
+private:
+    brenixplugin::OwnedDataBuffer map{new brenixplugin::PropertyMap};
+    mutable bool checked = false;
+};
+
+/// Fields, and the number of counts (samples, frames, elements) that they hold. A packet is moved, never
+/// copied. Where it has to be divided, a field with a whole number of elements for each count is divided
+/// with it, and any other field is repeated in each part.
 struct Packet {
-    brenixplugin::OwnedDataBuffer fields{new brenixplugin::PropertyMap}; ///< never null
-    std::uint64_t counts = 0;                                            ///< of each field
+    Fields fields;            ///< never null
+    std::uint64_t counts = 0; ///< of each field
 };
 
 /// Adds a field, or replaces the one of its name.
