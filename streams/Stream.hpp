@@ -27,6 +27,9 @@ public:
     Channel& getChannel() const noexcept { return *channel; }
     bool isSupported() const noexcept { return coreStream != nullptr; }
 
+    /// Of which class the stream is, an InputStream or an OutputStream.
+    StreamDirection getDirection() const noexcept { return direction; }
+
     /// Leaves the stream without its core stream, as if the channel had none.
     void detach() noexcept { coreStream = nullptr; }
 
