@@ -18,7 +18,6 @@ double OutputStream::writeTypedData(uint64_t numBuffers, const std::string& type
     // filled.
     DataList dataList;
     for (uint64_t i = 0; i < numBuffers; ++i) {
-        brenixplugin::OwnedDataBuffer buffer(new brenixplugin::PropertyMap);
         const int count = va_arg(*buffers, int);
         const void* const data = va_arg(*buffers, const void*);
         brenixplugin::OwnedProperty property(
@@ -26,6 +25,7 @@ double OutputStream::writeTypedData(uint64_t numBuffers, const std::string& type
         if (!property) {
             throw std::runtime_error("Unsupported type: " + typeName + " for data being written.");
         }
+        brenixplugin::OwnedDataBuffer buffer(new brenixplugin::PropertyMap);
         brenixplugin::storeProperty(*buffer, fieldName, std::move(property));
         dataList.buffers.push_back(buffer.get());
         buffer.release();
