@@ -4,6 +4,7 @@
 #include "brenixcore/Converter.hpp"
 #include "brenixcore/Exceptions.hpp"
 #include "brenixcore/Stream.hpp"
+#include "brenixcore/plugin/Visit.hpp"
 #include "brenixplugin/Property.hpp"
 
 #include <gtest/gtest.h>
@@ -151,4 +152,31 @@ TEST(DataTest, MovesByPointerFromDeviceToCaller)
         brenixplugin::releaseProperties(properties);
     }
     EXPECT_FALSE(isLoaded(probe));
+}
+
+TEST(VisitTest, FindsTheClassOrOneItIsDerivedFrom)
+{
+    using Vector = brenixplugin::kit::device::TVectorProperty<signed char>;
+    struct Derived : Vector {
+        using Vector::Vector;
+    };
+    struct Own : brenixplugin::interfaces::IPropertyInfo {
+        const char* getName() const override { return "own"; }
+        void destroy() override {}
+    };
+    Vector vector("v", 3);
+    Derived derived("d", 2);
+    Own own;
+    const std::pair<brenixplugin::interfaces::IPropertyInfo*, std::size_t> rows[] = {
+        {&vector, 3}, {&derived, 2}, {&own, 0}, {nullptr, 0}};
+    for (const auto& [property, size] : rows) {
+        std::size_t found = 0;
+        const auto visitor = [&](auto& visited) {
+            if constexpr (std::is_same_v<decltype(visited), Vector&>) {
+                found = visited.values.size();
+            }
+        };
+        EXPECT_EQ(plugin::visitProperty(property, visitor), size > 0);
+        EXPECT_EQ(found, size);
+    }
 }

@@ -4,6 +4,7 @@
 
 #include <unistd.h>
 
+#include <cmath>
 #include <map>
 
 using namespace driver;
@@ -146,14 +147,29 @@ TEST(StreamTest, AnInputLimitNeitherLosesNorBlocks)
         EXPECT_EQ(channel.read(2, static_cast<double>(channel.peek(2).size())),
                   range(next, next + 2));
     }
+
+    channel.close();
+    channel.start({{"Streams", "i"}, {"Packets", "3 3 2 1"}});
+    const auto waiting = [&] { return channel.ask(coderStreamGetDataAvailable, channel.input); };
+    Channel::waitUntil([&] { return waiting() == 3; });
+    std::this_thread::sleep_for(std::chrono::milliseconds(20)); // for the second, which has no room
+    EXPECT_EQ(coderStreamFlush(channel.input), 1);
+    Channel::waitUntil([&] { return waiting() == 3; });
+    EXPECT_EQ(channel.peek(), (Numbers{2, 1})); // both were discarded
 }
 
 TEST(StreamTest, EveryWaitEnds)
 {
+    const auto begin = std::chrono::steady_clock::now();
     Channel slow(probe);
     slow.start({{"Streams", "io"}, {"Packets", "1 1"}}, 0.05);
     EXPECT_EQ(slow.readError(3, 1), noInput);
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(5)); // not the default
     EXPECT_EQ(slow.read(2, 2), range(0, 2));
+    slow.close();
+    slow.start({{"Streams", "io"}, {"FailIn", "run"}});
+    slow.waitForEnd();
+    EXPECT_EQ(slow.writeError({1}), noOutput); // nobody takes it
 
     Channel full(probe, 1); // the device waits for room, and close ends it
     full.start({{"Streams", "i"}, {"Packets", "1 1 1"}});
@@ -396,6 +412,15 @@ TEST(FilterTest, FiltersOfOneStreamSeeWhatIsWrittenOnce)
     ASSERT_EQ(channel.open(), 1);
     EXPECT_EQ(channel.write({2, 3}), 2);
     EXPECT_EQ(channel.read(2, 2), (Numbers{0, 30}));
+    channel.close();
+    ASSERT_EQ(Channel::addFilter(channel.input, "decimate", {{"Factor", 2}}), 1);
+    ASSERT_EQ(channel.open(), 1);
+    for (const double value : {0, 0, 4, 0, 0, 5}) { // 4 and 5 pass the output's filters
+        EXPECT_EQ(channel.write({value}), 1);
+    }
+    channel.close();
+    EXPECT_EQ(channel.peek(), Numbers{1}); // nothing is left of the packet that was dropped
+    EXPECT_EQ(channel.read(1, 1), Numbers{40});
 }
 
 TEST(SignalTest, WaveformsChannelsAndCommands)
@@ -468,6 +493,19 @@ TEST(AudioFileTest, WhatIsWrittenIsReadBack)
         EXPECT_EQ(second[1], -1);
         EXPECT_EQ(reader.close(), 1);
     }
+    std::remove(file.c_str());
+
+    Channel loud("audiofile"); // an encoding that goes through a table
+    loud.start({{"FileName", file}, {"Mode", "write"}, {"Channels", 1}, {"SampleFormat", "ULAW"}});
+    EXPECT_EQ(loud.write({1e6, -1e6, std::nan("")}), 3);
+    EXPECT_EQ(loud.close(), 1);
+    ASSERT_EQ(reader.init({{"FileName", file}}), 1) << reader.error();
+    ASSERT_EQ(reader.open(), 1);
+    const Numbers read = reader.read(3, 1, "Data1");
+    ASSERT_EQ(read.size(), 3);
+    EXPECT_GT(read[0], 0.95);
+    EXPECT_LT(read[1], -0.95);
+    EXPECT_NEAR(read[2], 0, 0.001);
     std::remove(file.c_str());
 }
 
