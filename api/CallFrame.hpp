@@ -74,11 +74,11 @@ int queryStream(void* handle, Value* answer, const char* argument) noexcept
 
 /// A stream handle as one of the direction that the function needs. Without a dynamic_cast: a copy-out
 /// of much data would find what that reads gone from the cache.
-template <typename Directed, StreamDirection direction>
+template <typename Directed>
 Directed& directed(Stream& stream)
 {
-    if (stream.getDirection() != direction) {
-        throwNotSupported(direction);
+    if (stream.getDirection() != Directed::ownDirection) {
+        throwNotSupported(Directed::ownDirection);
     }
     return static_cast<Directed&>(stream);
 }

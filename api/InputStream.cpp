@@ -4,16 +4,6 @@
 
 using namespace brenixcoder;
 
-namespace
-{
-
-InputStream& input(Stream& stream)
-{
-    return directed<InputStream, StreamDirection::Input>(stream);
-}
-
-} // namespace
-
 int coderInputStreamPeek(void* stream, double* totalCounts, double* bufferCounts,
                          double* numBuffers, double maxCounts) noexcept
 {
@@ -24,14 +14,15 @@ int coderInputStreamPeek(void* stream, double* totalCounts, double* bufferCounts
         requireArgument(totalCounts, "totalCounts");
         requireArgument(bufferCounts, "bufferCounts");
         requireArgument(numBuffers, "numBuffers");
-        input(s).peek(totalCounts, bufferCounts, numBuffers, maxCounts);
+        directed<InputStream>(s).peek(totalCounts, bufferCounts, numBuffers, maxCounts);
     });
 }
 
 int coderInputStreamReadBuffers(void* stream, double countsToRead, double expectedBuffers) noexcept
 {
-    return callStream(stream,
-                      [&](Stream& s) { input(s).readBuffers(countsToRead, expectedBuffers); });
+    return callStream(stream, [&](Stream& s) {
+        directed<InputStream>(s).readBuffers(countsToRead, expectedBuffers);
+    });
 }
 
 int coderInputStreamReadBufferData(void* stream, int32_t bufferIndex, int32_t fieldIndex,
@@ -42,13 +33,15 @@ int coderInputStreamReadBufferData(void* stream, int32_t bufferIndex, int32_t fi
         requireArgument(destination, "destination");
         const std::string type = typeName;
         const std::string field = fieldName;
-        input(s).readBufferData(bufferIndex, fieldIndex, field, type, capacity, destination);
+        directed<InputStream>(s).readBufferData(bufferIndex, fieldIndex, field, type, capacity,
+                                                destination);
     });
 }
 
 void coderInputStreamFreeBuffer(void* stream, int32_t bufferIndex) noexcept
 {
     callStream(stream, [&](Stream& s) {
-        guarded([&] { input(s).freeBuffer(bufferIndex); }, [](const std::exception*) {});
+        guarded([&] { directed<InputStream>(s).freeBuffer(bufferIndex); },
+                [](const std::exception*) {});
     });
 }

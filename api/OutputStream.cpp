@@ -16,8 +16,7 @@ int coderOutputStreamWriteTypedDataOld(void* stream, double* written, uint64_t n
     const int result = callStream(stream, [&](Stream& s) {
         requireArgument(written, "written");
         const std::string type = typeName;
-        *written = directed<OutputStream, StreamDirection::Output>(s).writeTypedData(
-            numBuffers, type, &buffers);
+        *written = directed<OutputStream>(s).writeTypedData(numBuffers, type, &buffers);
     });
     va_end(buffers);
     return result;

@@ -15,8 +15,10 @@ namespace brenixcoder
 class InputStream : public Stream
 {
 public:
+    static constexpr StreamDirection ownDirection = StreamDirection::Input;
+
     InputStream(brenixcore::InputStream* stream, Channel& owner) noexcept
-        : Stream(stream, StreamDirection::Input, owner)
+        : Stream(stream, ownDirection, owner)
     {
     }
 

@@ -14,8 +14,10 @@ namespace brenixcoder
 class OutputStream : public Stream
 {
 public:
+    static constexpr StreamDirection ownDirection = StreamDirection::Output;
+
     OutputStream(brenixcore::OutputStream* stream, Channel& owner) noexcept
-        : Stream(stream, StreamDirection::Output, owner)
+        : Stream(stream, ownDirection, owner)
     {
     }
 

@@ -157,7 +157,11 @@ bool Channel::Impl::push(plugin::Packet packet)
 
 bool Channel::Impl::tryPush(plugin::Packet& packet)
 {
-    return enter(packet, false);
+    const bool isTaken = enter(packet, false);
+    if (!isTaken) {
+        packet.fields.setChecked(false); // it is in the device's hands again
+    }
+    return isTaken;
 }
 
 bool Channel::Impl::enter(plugin::Packet& packet, bool waits)
@@ -169,12 +173,7 @@ bool Channel::Impl::enter(plugin::Packet& packet, bool waits)
         throw std::invalid_argument("The device pushed a packet without counts.");
     }
     requireWhole(packet);
-    try {
-        return input->impl->push(packet, waits);
-    } catch (const CouldNotConvertInputData& failure) { // by a filter
-        raise("error", "brenix:Stream:filterFailed", failure.what());
-        return true; // without this packet
-    }
+    return input->impl->push(packet, waits, *this);
 }
 
 std::optional<plugin::Packet> Channel::Impl::pull()

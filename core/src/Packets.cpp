@@ -135,7 +135,7 @@ void requireWhole(const plugin::Packet& packet)
     for (const auto& [name, property] : *packet.fields) {
         visitField(name, property, RequireElements());
     }
-    packet.fields.setChecked();
+    packet.fields.setChecked(true);
 }
 
 } // namespace brenixcore

@@ -74,7 +74,7 @@ bool Stream::Impl::giveWay(std::unique_lock<std::mutex>& lock)
     return !tookLong;
 }
 
-bool Stream::Impl::push(plugin::Packet& packet, bool waits)
+bool Stream::Impl::push(plugin::Packet& packet, bool waits, plugin::DeviceHost& host)
 {
     std::unique_lock lock(mutex);
     if (waits) {
@@ -88,12 +88,13 @@ bool Stream::Impl::push(plugin::Packet& packet, bool waits)
         try {
             applyFilters(packet);
         } catch (...) {
-            throw CouldNotConvertInputData(currentExceptionText());
+            host.raise("error", "brenix:Stream:filterFailed", currentExceptionText().c_str());
+            return true; // without this packet
         }
         lock.lock();
     }
     if (packet.counts > 0) {
-        pending.push_back({std::move(packet)});
+        pending.emplace_back(std::move(packet));
         refill();
     }
     const bool ends = wanted > 0 && counts >= wanted; // the wait of a read
@@ -120,7 +121,7 @@ void Stream::Impl::refill()
         if (part == next.packet.counts) {
             packets.splice(packets.end(), pending, pending.begin());
         } else {
-            packets.push_back({slice(next.packet, next.taken, part)});
+            packets.emplace_back(slice(next.packet, next.taken, part));
             next.taken += part;
             if (next.counts() == 0) {
                 pending.pop_front();
@@ -165,7 +166,8 @@ Stream::Impl::Packets Stream::Impl::take(std::uint64_t count)
             QueuedPacket& front = packets.front();
             const std::uint64_t part = std::min(missing, front.counts());
             if (part < front.packet.counts) {
-                result.push_back({slice(front.packet, front.taken, part), 0, front.converted});
+                result.emplace_back(slice(front.packet, front.taken, part)).converted =
+                    front.converted;
                 front.taken += part;
                 if (front.counts() == 0) {
                     packets.pop_front();
@@ -469,7 +471,7 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
         }
         if (packet.counts > 0) {
             written += packet.counts;
-            outgoing.push_back({std::move(packet)});
+            outgoing.emplace_back(std::move(packet));
         }
     }
 

@@ -13,6 +13,7 @@
 #include <optional>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 namespace brenixcore
@@ -28,6 +29,8 @@ enum class Phase {
 
 /// A waiting packet of which the first `taken` counts are gone.
 struct QueuedPacket {
+    explicit QueuedPacket(plugin::Packet&& whole) noexcept : packet(std::move(whole)) {}
+
     plugin::Packet packet;
     std::uint64_t taken = 0;
     bool converted = false;
@@ -69,7 +72,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     void setTimeout(double seconds);
 
     /// For the device's thread; see plugin::DeviceStreams.
-    bool push(plugin::Packet& packet, bool waits);
+    bool push(plugin::Packet& packet, bool waits, plugin::DeviceHost& host);
     std::optional<plugin::Packet> pull(bool waits);
 
     void addFilter(const std::string& name, const brenixplugin::PropertyMap& options);
@@ -92,8 +95,8 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     bool fits(std::uint64_t more) const { return counts <= limit && more <= limit - counts; }
 
     /// Waits until the condition holds, or for so long. Under the mutex. It gives way a few times before
-    /// it sleeps: while data flows there is seldom long to wait, and to sleep and be woken takes longer
-    /// than most packets do.
+    /// it sleeps and the time begins: while data flows there is seldom long to wait, and to sleep and be
+    /// woken takes longer than most packets do.
     template <typename Condition>
     void waitUntil(std::unique_lock<std::mutex>& lock, const Condition& over,
                    std::optional<std::chrono::steady_clock::duration> atMost = std::nullopt)

@@ -12,8 +12,9 @@
 namespace brenixcore::plugin
 {
 
-/// Property objects by field name, owned; used like a pointer to their map. It notes whether anybody
-/// used it, so that fields which pass through untouched are checked once.
+/// Property objects by field name, owned; used like a pointer to their map. It notes that it was used,
+/// so that fields which pass through untouched are checked once. References to the map or to an object
+/// are to be used no longer once the packet was pushed.
 class Fields
 {
 public:
@@ -32,7 +33,7 @@ public:
 
     /// For the core: whether nobody used the fields since it found them sound.
     bool isChecked() const { return checked; }
-    void setChecked() const { checked = true; }
+    void setChecked(bool sound) const { checked = sound; }
 
 private:
     brenixplugin::OwnedDataBuffer map{new brenixplugin::PropertyMap};
