@@ -10,6 +10,7 @@
 #include <cstring>
 #include <stdexcept>
 #include <string>
+#include <typeinfo>
 
 namespace brenixcoder
 {
@@ -29,6 +30,15 @@ bool isReadable(const brenixplugin::kit::coderconverter::TPointerProperty<T>* pr
     return property != nullptr && (property->data != nullptr || property->count == 0);
 }
 
+/// A dynamic_cast that first looks whether the property is of the very class.
+template <typename Property>
+const Property* quickCast(const brenixplugin::interfaces::IPropertyInfo* info)
+{
+    return info != nullptr && typeid(*info) == typeid(Property)
+               ? static_cast<const Property*>(info)
+               : dynamic_cast<const Property*>(info);
+}
+
 /// For the eleven numeric and logical types.
 template <typename T>
 void copyTypedValue(const void* property, const std::string& name, const std::string& typeName,
@@ -38,7 +48,7 @@ void copyTypedValue(const void* property, const std::string& name, const std::st
     const auto* const info = static_cast<const brenixplugin::interfaces::IPropertyInfo*>(property);
 
     // The class of data first, for a cast that fails is what takes longest here.
-    if (const auto* array = dynamic_cast<const coderconverter::TPointerProperty<T>*>(info);
+    if (const auto* array = quickCast<coderconverter::TPointerProperty<T>>(info);
         isReadable(array)) {
         requireCapacity(name, array->count, capacity);
         if (array->count > 0) {

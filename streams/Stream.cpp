@@ -3,8 +3,6 @@
 #include "channel/Exceptions.hpp"
 #include "properties/OptionMap.hpp"
 
-#include <limits>
-
 namespace brenixcoder
 {
 
@@ -14,13 +12,6 @@ void throwNotSupported(StreamDirection direction)
         throw OutputStreamNotSupported("This channel does not support an output stream.");
     }
     throw InputStreamNotSupported("This channel does not support an input stream.");
-}
-
-void Stream::checkSupported() const
-{
-    if (coreStream == nullptr) {
-        throwNotSupported(direction);
-    }
 }
 
 brenixcore::InputStream& Stream::coreInput() const
@@ -41,30 +32,11 @@ bool Stream::isDeviceDone() const
                                                : coreOutput().isDeviceDone();
 }
 
-bool Stream::isOpen() const
-{
-    checkSupported();
-    return coreStream->isOpen();
-}
-
 double Stream::getCountDimension() const
 {
     return static_cast<double>(direction == StreamDirection::Input
                                    ? coreInput().getCountDimension()
                                    : coreOutput().getCountDimension());
-}
-
-double Stream::getDataAvailable() const
-{
-    checkSupported();
-    return static_cast<double>(coreStream->getDataAvailable());
-}
-
-double Stream::getSpaceAvailable() const
-{
-    checkSupported();
-    return coreStream->isUnlimited() ? std::numeric_limits<double>::infinity()
-                                     : static_cast<double>(coreStream->getSpaceAvailable());
 }
 
 void Stream::flush()

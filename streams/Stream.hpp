@@ -5,6 +5,7 @@
 
 #include <cstdarg>
 #include <cstdint>
+#include <limits>
 #include <string>
 
 namespace brenixcoder
@@ -13,6 +14,8 @@ namespace brenixcoder
 class Channel;
 
 enum class StreamDirection : int32_t { Input = 0, Output = 1 };
+
+[[noreturn]] void throwNotSupported(StreamDirection direction);
 
 /// The object behind a stream handle. It exists also when the channel has no stream of its
 /// direction; then every operation that needs one throws InputStreamNotSupported or
@@ -34,11 +37,25 @@ public:
     void detach() noexcept { coreStream = nullptr; }
 
     bool isDeviceDone() const;
-    bool isOpen() const;
     double getCountDimension() const;
-    double getDataAvailable() const;
+
+    bool isOpen() const
+    {
+        checkSupported();
+        return coreStream->isOpen();
+    }
+    double getDataAvailable() const
+    {
+        checkSupported();
+        return static_cast<double>(coreStream->getDataAvailable());
+    }
     /// Positive infinity for an unlimited stream.
-    double getSpaceAvailable() const;
+    double getSpaceAvailable() const
+    {
+        checkSupported();
+        return coreStream->isUnlimited() ? std::numeric_limits<double>::infinity()
+                                         : static_cast<double>(coreStream->getSpaceAvailable());
+    }
     void flush();
 
     /// The options are `optionCount` groups as buildOptionMap() reads them.
@@ -52,7 +69,12 @@ protected:
     }
 
     /// Throws unless there is a core stream; the first step of everything that uses it.
-    void checkSupported() const;
+    void checkSupported() const
+    {
+        if (coreStream == nullptr) {
+            throwNotSupported(direction);
+        }
+    }
 
     /// The core stream as that of one direction, after checkSupported().
     brenixcore::InputStream& coreInput() const;
@@ -63,8 +85,6 @@ private:
     StreamDirection direction;
     Channel* channel;
 };
-
-[[noreturn]] void throwNotSupported(StreamDirection direction);
 
 } // namespace brenixcoder
 

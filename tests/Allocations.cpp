@@ -8,7 +8,7 @@ using namespace allocations;
 static bool fails()
 {
     std::atomic<long>& next = isHere ? failingHere : failingElsewhere;
-    if (next == 0 || --next > 0) {
+    if (isExempt || next == 0 || --next > 0) {
         return false;
     }
     next = lasting ? 1 : 0;

@@ -16,8 +16,9 @@ inline std::atomic<long> live = 0; ///< blocks that are not freed yet
 /// allocations fail, and those of all other threads.
 inline std::atomic<long> failingHere = 0, failingElsewhere = 0;
 inline std::atomic<long> failed = 0;
-inline std::atomic<bool> lasting = false; ///< whether all after that one fail as well
-inline thread_local bool isHere = false;  ///< whether failingHere counts for this thread
+inline std::atomic<bool> lasting = false;  ///< whether all after that one fail as well
+inline thread_local bool isHere = false;   ///< whether failingHere counts for this thread
+inline thread_local bool isExempt = false; ///< whether nothing fails on this thread
 
 /// Lets allocation `number` fail, and with `lasts` all later ones.
 class Failing
@@ -40,6 +41,15 @@ public:
         failingHere = failingElsewhere = 0;
         return failed > 0;
     }
+};
+
+/// Exempts a scripted core and the tests themselves.
+struct Allowed {
+    Allowed() { isExempt = true; }
+    Allowed(const Allowed&) = delete;
+    Allowed& operator=(const Allowed&) = delete;
+    ~Allowed() { isExempt = wasExempt; }
+    const bool wasExempt = isExempt;
 };
 
 inline long points = 0; ///< allocations failed by sweeps

@@ -1,9 +1,11 @@
 // What holds for every exported function of a channel or stream: one table of calls, and for each
-// the null handle, the last error, failures of the core, missing streams, wrong directions and null
-// pointers. SweepTest lets the allocations of the same calls fail.
+// the null handle, the last error, failures of the core, missing streams, wrong directions, null
+// pointers and failing allocations, which SweepTest lets fail with the built core as well.
 
 #include "Calls.hpp"
 #include "scripted/ChannelFixture.hpp"
+
+#include <filesystem>
 
 using namespace scripted;
 
@@ -16,7 +18,10 @@ protected:
     void refresh()
     {
         init(scalar("p", 1.0));
-        core.on["read"] = [] { core.delivery = {dataBuffer({scalar(Calls::text, 1.0)})}; };
+        core.on["read"] = [] {
+            const allocations::Allowed allowed;
+            core.delivery = {dataBuffer({scalar(Calls::text, 1.0)})};
+        };
         EXPECT_EQ(coderInputStreamReadBuffers(input, 1, 1), 1);
         core.counts = {1};
         answer = Buffer(8);
@@ -87,6 +92,57 @@ TEST_F(ExportedCallsTest, MissingStreamsAndWrongDirectionsAreNotSupported)
     uint8_t supported = 2;
     EXPECT_EQ(coderStreamIsSupported(input, &supported), 1);
     EXPECT_EQ(supported, 0);
+}
+
+TEST_F(ExportedCallsTest, EveryAllocationMayFail)
+{
+    const allocations::PrintPoints print;
+    const std::string outOfMemory = unexpected + "std::bad_alloc";
+    for (const Call& call : calls.rows) {
+        for (std::size_t i = 0; i < handles(call).size(); ++i) {
+            allocations::sweep([&](long number, bool lasts) {
+                refresh();
+                void* const handle = handles(call)[i];
+                const allocations::Failing failing(number, lasts);
+                const bool result = call.run(handle, answer.data());
+                const bool failed = failing.end();
+                EXPECT_EQ(result, !failed);
+                EXPECT_EQ(failed ? lastError() : "|", failed ? outOfMemory : "|");
+                if (failed) {
+                    EXPECT_EQ(answer.written(), call.resets() ? std::string(8, 0) : "");
+                }
+                return failed;
+            });
+        }
+    }
+    // A plug-in's error is kept, whatever becomes of the exception that tells the core.
+    allocations::sweep([&](long number, bool lasts) {
+        const allocations::Failing failing(number, lasts);
+        EXPECT_ANY_THROW(raiseEvent("error", "id", "m"));
+        const bool failed = failing.end();
+        EXPECT_EQ(syncError(), "id|m");
+        return failed;
+    });
+    allocations::sweep([&](long number, bool lasts) {
+        const char* const text = Calls::text;
+        id = message = Buffer(CODER_ERROR_SIZE);
+        const allocations::Failing failing(number, lasts);
+        void* const created = coderChannelCreate(text, text, id, message, 0, 0);
+        const bool failed = failing.end();
+        EXPECT_EQ(created == nullptr, failed);
+        EXPECT_EQ(failed ? error() : "|", failed ? outOfMemory : "|");
+        coderChannelDestroy(created);
+        return failed;
+    });
+    const std::string path = std::filesystem::current_path();
+    allocations::sweep([&](long number, bool lasts) {
+        Buffer absolute(CODER_PATH_SIZE);
+        const allocations::Failing failing(number, lasts);
+        coderComputeAbsolutePath(path.c_str(), absolute);
+        const bool failed = failing.end();
+        EXPECT_EQ(absolute.text(), failed ? "" : path);
+        return failed;
+    });
 }
 
 TEST_F(ExportedCallsTest, NullPointersAreNamed)

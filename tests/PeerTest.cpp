@@ -336,6 +336,21 @@ TEST(AudioFileTest, WhatIsWrittenIsWhatSoxReads)
     }
 }
 
+TEST(AudioFileTest, WhatSoxMakesIsRead)
+{
+    for (const std::string made : {".wav -b 16", ".wav -b 8", ".wav -b 32 -e floating-point",
+                                   ".flac -b 24", ".aiff -b 24", ".au -b 8 -e mu-law"}) {
+        SCOPED_TRACE(made);
+        const std::string soundFile = file + made.substr(0, made.find(' '));
+        sox("-n -r 8000 -c 2 " + made.substr(made.find(' ')) + " " + soundFile +
+            " synth 0.1 brownnoise");
+        Channel reader("audiofile");
+        reader.start({{"FileName", soundFile}});
+        EXPECT_EQ(reader.read(800, 1), soxSamples(soundFile));
+        std::remove(soundFile.c_str());
+    }
+}
+
 TEST(TcpTest, NobodyListens)
 {
     Channel channel("tcp");

@@ -1,5 +1,6 @@
 # The product's sources on a scripted core.
 add_executable(product-tests
+    Allocations.cpp
     ChannelTest.cpp
     ErrorsTest.cpp
     ExportedCallsTest.cpp

@@ -3,6 +3,7 @@
 #ifndef BRENIXCODER_TESTS_SCRIPTED_CHANNELFIXTURE_HPP
 #define BRENIXCODER_TESTS_SCRIPTED_CHANNELFIXTURE_HPP
 
+#include "Allocations.hpp"
 #include "brenixcoder/coder.h"
 #include "brenixcore/Channel.hpp"
 
@@ -48,6 +49,7 @@ inline Core core;
 /// Logs "what(argument)".
 inline void log(const std::string_view what, const std::string& argument = "")
 {
+    const allocations::Allowed allowed;
     core.log.push_back(std::string(what) + '(' + argument + ')');
 }
 
@@ -146,7 +148,10 @@ inline void raiseEvent(const std::string& name, const std::string& id, const std
         void onAccepted() override { log("accept"); }
         Log texts;
     } event;
-    event.texts = {name, id, message};
+    {
+        const allocations::Allowed allowed;
+        event.texts = {name, id, message};
+    }
     core.handler->onCustomEvent(event);
 }
 

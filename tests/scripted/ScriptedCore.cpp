@@ -20,6 +20,7 @@ std::ostream& operator<<(std::ostream& out, const PropertyMap& options)
 /// Keeps the fields of the buffers written; the buffers stay.
 unsigned long takeFields(const std::vector<void*>& buffers)
 {
+    const allocations::Allowed allowed;
     core.written.clear();
     for (void* buffer : buffers) {
         core.written.emplace_back(new PropertyMap)->swap(*static_cast<PropertyMap*>(buffer));
@@ -31,12 +32,15 @@ unsigned long takeFields(const std::vector<void*>& buffers)
 template <typename... Types>
 void called(const void* object, const std::string_view operation, const Types&... arguments)
 {
-    const bool isInput = object == core.input.get();
-    const char* side = isInput ? "input." : object == core.output.get() ? "output." : "";
-    std::ostringstream text;
-    [[maybe_unused]] const char* separator = "";
-    ((text << std::exchange(separator, ", ") << arguments), ...);
-    log(side + std::string(operation), text.str());
+    {
+        const allocations::Allowed allowed;
+        const bool isInput = object == core.input.get();
+        const char* side = isInput ? "input." : object == core.output.get() ? "output." : "";
+        std::ostringstream text;
+        [[maybe_unused]] const char* separator = "";
+        ((text << std::exchange(separator, ", ") << arguments), ...);
+        log(side + std::string(operation), text.str());
+    }
     if (const auto hook = core.on.find(operation); hook != core.on.end()) {
         hook->second();
     }
