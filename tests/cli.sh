@@ -82,6 +82,8 @@ done <<END
 1|a WAV file needs a whole number as sample rate|read signal -n 1 -r 44100.5 -w rate.wav
 1|does not load|plugins nosuch
 1|brenix: nosuch: notFound|plugins --names signal nosuch
+1|field Stamp has no fixed number of elements|read $plugins/probe.so -o Packets:int32=10,10,5 --field Stamp
+1|field Odd has no fixed number of elements|scope $plugins/probe.so -o Packets:int32=10,10,5 --field Odd
 1|the data has no field Foo|read signal -n 1 --field Foo
 0|RMS 0.7071|scope signal -o Pace=fast -n 4800 --png picture.png
 END
@@ -170,6 +172,20 @@ printf '12345678123' >torn.raw
 if ./program torn.raw 2>errors || ! grep -q 'last element' errors; then
     fail "the program of a torn file: $(cat errors)"
 fi
+
+# Floating-point WAV has the levels of integers, from the command and from its program.
+printf '0.5\n-0.25\n1.5\n' | brenix write audiofile -o FileName=loud.wav -o Mode=write -o SampleFormat=DOUBLE -q
+write=(brenix write udp -o Host=127.0.0.1 -o Port=27111 -o ElementType=int16 -t int16 -i loud.wav -q)
+"${write[@]}" --emit-c program.c
+compile
+for sender in "${write[*]}" ./program; do
+    timeout 20 brenix read udp -o LocalPort=27111 -o ElementType=int16 -n 3 -q -w levels.csv &
+    while kill -0 $! 2>/dev/null; do
+        $sender
+        sleep 0.02
+    done
+    [[ $(tr '\n' ' ' <levels.csv) == 'data 16384 -8192 32767 ' ]] || fail "levels of: $sender: $(cat levels.csv)"
+done
 
 # They tell what is wrong in their input, and keep what came before an error of the device.
 brenix write loopback -q -t int8 -i samples.csv --emit-c program.c

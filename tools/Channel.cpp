@@ -42,6 +42,14 @@ Failure explained(const Failure& failure, const std::vector<std::string>& names)
     return {failure.getId(), message};
 }
 
+void requireFixedNumber(const Field& field, std::size_t rows)
+{
+    if (field.type->isText || field.elements.size() != rows * field.perCount * field.type->size) {
+        throw Failure("",
+                      "field " + field.name + " has no fixed number of elements for each count");
+    }
+}
+
 } // namespace
 
 std::optional<Failure> caught(const std::function<void()>& work)
@@ -274,10 +282,12 @@ std::optional<Field> Channel::findField(const std::string& name, double counts)
 {
     Field field;
     field.name = name;
+    const auto rows = static_cast<std::size_t>(counts);
     for (const ElementType& type : elementTypes()) {
         field.type = &type;
-        if (readAll(type, fieldCopier(field), static_cast<std::size_t>(counts), field.elements)) {
-            field.perCount = field.elements.size() / type.size / static_cast<std::size_t>(counts);
+        if (readAll(type, fieldCopier(field), rows, field.elements)) {
+            field.perCount = field.elements.size() / type.size / rows;
+            requireFixedNumber(field, rows);
             return field;
         }
     }
@@ -316,10 +326,7 @@ void Channel::readField(Field& field, double counts)
     if (!readAll(*field.type, fieldCopier(field), rows * field.perCount, field.elements)) {
         throw lastError();
     }
-    if (field.type->isText || field.elements.size() != rows * field.perCount * field.type->size) {
-        throw Failure("",
-                      "field " + field.name + " has no fixed number of elements for each count");
-    }
+    requireFixedNumber(field, rows);
 }
 
 } // namespace brenix

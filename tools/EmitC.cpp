@@ -269,6 +269,14 @@ constexpr std::string_view checkWav = R"(    if (info.channels != COLUMNS) {
     }
 )";
 
+constexpr std::string_view readScaled = R"(    static double samples[ROWS * COLUMNS];
+    const int count = (int)sf_read_double(file, samples, most * COLUMNS);
+    for (int i = 0; i < count; ++i) {
+        elements[i] = (@CTYPE@)lrint(fmax(@LOW@.0, fmin(@HIGH@.0, samples[i] * -(@LOW@.0))));
+    }
+    return count / COLUMNS;
+)";
+
 constexpr std::string_view readRaw =
     R"(    const size_t size = fread(elements, 1, (size_t)most * sizeof(elements[0]), file);
     if (size % sizeof(elements[0]) != 0) {
@@ -626,8 +634,13 @@ void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInp
         values["FLUSH"] = flushInput;
     }
     if (settings.file.format == "wav") {
-        values["READ"] = std::string("    return (int)") + wavEncoding(type).readName +
-                         "(file, elements, most);\n";
+        values["LIBRARIES"] += isFloating(type) ? "" : " -lm";
+        const long high = (1L << (8 * type.size - 1)) - 1;
+        values["LOW"] = std::to_string(-high - 1);
+        values["HIGH"] = std::to_string(high);
+        values["READ"] = isFloating(type) ? std::string("    return (int)sf_readf_") + type.name +
+                                                "(file, elements, most);\n"
+                                          : fill(readScaled, values);
         values["OPENED"] = checkWav;
     } else if (settings.file.format == "raw") {
         values["READ"] = readRaw;

@@ -21,21 +21,34 @@ namespace
 {
 
 template <typename T, sf_count_t (*function)(SNDFILE*, T*, sf_count_t)>
-sf_count_t readAs(SNDFILE* sound, void* elements, sf_count_t frames)
+sf_count_t readAs(SNDFILE* sound, void* elements, sf_count_t count)
 {
-    return function(sound, static_cast<T*>(elements), frames);
+    return function(sound, static_cast<T*>(elements), count);
+}
+
+/// Full scale is that of T for every file: libsndfile itself scales floating-point samples to
+/// integers by the loudest of them, or not at all.
+template <typename T>
+sf_count_t readScaled(SNDFILE* sound, void* elements, sf_count_t count)
+{
+    constexpr double low = std::numeric_limits<T>::min();
+    constexpr double high = std::numeric_limits<T>::max();
+    std::vector<double> samples(static_cast<std::size_t>(count));
+    auto* next = static_cast<T*>(elements);
+    count = sf_read_double(sound, samples.data(), count);
+    samples.resize(static_cast<std::size_t>(count));
+    for (const double sample : samples) {
+        *next++ = static_cast<T>(std::lrint(std::fmax(low, std::fmin(high, sample * -low))));
+    }
+    return count;
 }
 
 constexpr std::array encodings = {
-    WavEncoding{"double", SF_FORMAT_DOUBLE, "SF_FORMAT_DOUBLE", "sf_readf_double",
-                readAs<double, sf_readf_double>},
-    WavEncoding{"float", SF_FORMAT_FLOAT, "SF_FORMAT_FLOAT", "sf_readf_float",
-                readAs<float, sf_readf_float>},
-    WavEncoding{"int32", SF_FORMAT_PCM_32, "SF_FORMAT_PCM_32", "sf_readf_int",
-                readAs<int, sf_readf_int>},
-    WavEncoding{"int16", SF_FORMAT_PCM_16, "SF_FORMAT_PCM_16", "sf_readf_short",
-                readAs<short, sf_readf_short>},
-    WavEncoding{"uint8", SF_FORMAT_PCM_U8, "SF_FORMAT_PCM_U8", nullptr, nullptr},
+    WavEncoding{"double", SF_FORMAT_DOUBLE, "SF_FORMAT_DOUBLE", readAs<double, sf_read_double>},
+    WavEncoding{"float", SF_FORMAT_FLOAT, "SF_FORMAT_FLOAT", readAs<float, sf_read_float>},
+    WavEncoding{"int32", SF_FORMAT_PCM_32, "SF_FORMAT_PCM_32", readScaled<std::int32_t>},
+    WavEncoding{"int16", SF_FORMAT_PCM_16, "SF_FORMAT_PCM_16", readScaled<std::int16_t>},
+    WavEncoding{"uint8", SF_FORMAT_PCM_U8, "SF_FORMAT_PCM_U8", nullptr},
 };
 
 [[noreturn]] void fail(const std::string& file, const std::string& problem)
@@ -390,13 +403,13 @@ public:
     {
         const std::size_t size = elements.size();
         elements.resize(size + rows * columns * type.size);
-        const sf_count_t frames = wavEncoding(type).read(
-            sound.get(), &elements[size], static_cast<sf_count_t>(rows)); // 0 at the end
+        const auto count = static_cast<std::size_t>(wavEncoding(type).read(
+            sound.get(), &elements[size], static_cast<sf_count_t>(rows * columns))); // 0 at the end
         if (const int error = sf_error(sound.get()); error != SF_ERR_NO_ERROR) {
             fail(name, sf_error_number(error));
         }
-        elements.resize(size + static_cast<std::size_t>(frames) * columns * type.size);
-        return static_cast<std::size_t>(frames);
+        elements.resize(size + count * type.size);
+        return count / columns;
     }
 
 private:

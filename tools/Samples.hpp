@@ -80,9 +80,8 @@ std::string csvHeader(const std::vector<Field>& fields);
 struct WavEncoding {
     std::string_view type;
     int format;
-    const char* formatName; ///< in C
-    const char* readName;   ///< of the function that reads; null if there is none
-    sf_count_t (*read)(SNDFILE* sound, void* elements, sf_count_t frames);
+    const char* formatName;                                               ///< in C
+    sf_count_t (*read)(SNDFILE* sound, void* elements, sf_count_t count); ///< null if there is none
 };
 
 /// Throws a Failure for a type that WAV does not have.
