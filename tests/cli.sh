@@ -106,10 +106,16 @@ got=0
 timeout -s INT 1 brenix read signal -w part.raw 2>summary || got=$?
 [[ -s part.raw && $(stat -c %s part.raw) -eq $(($(awk '{ print $2 * 8 }' summary))) ]] ||
     fail "an interrupted read: $(cat summary)"
-got=0
+write=(brenix write audiofile -o Mode=write -o SampleFormat=DOUBLE -q)
 exec 3<>pipe
-timeout --preserve-status -s INT -k 5 0.5 brenix write loopback -q <&3 || got=$?
-[[ $got -eq 130 ]] || fail "an interrupted write that waits for its input: exit code $got"
+for format in csv raw; do
+    got=0
+    if [[ $format == csv ]]; then printf '0.5\n0.25\n0.' >&3; else head -c 19 /dev/zero >&3; fi
+    timeout --preserve-status -s INT -k 5 0.5 "${write[@]}" -o FileName=cut.wav --format $format <&3 || got=$?
+    brenix read audiofile -o FileName=cut.wav -q >cut.csv
+    [[ $got -eq 130 && $(tr '\n' ' ' <cut.csv) =~ ^'data 0.5 0.25 '$|^'data 0 0 '$ ]] ||
+        fail "an interrupted write that waits for its input: exit code $got, $(cat cut.csv)"
+done
 
 # Completion offers what fits.
 # shellcheck source=/dev/null
@@ -168,13 +174,23 @@ emitted a.wav read "${signal[@]}" -c columns -n 5000 -w a.wav
 emitted b.au write audiofile -o FileName=b.au -o Mode=write -o Channels=2 -o SampleFormat=DOUBLE -i a.wav
 emitted c.wav write audiofile -o FileName=c.wav -o Mode=write -o Channels=2 -i samples.csv -f 'scale Gain=0.1'
 emitted d.wav write audiofile -o FileName=d.wav -o Mode=write -o Channels=2 --format raw -i samples.raw -n 3000
-printf '12345678123' >torn.raw
-if ./program torn.raw 2>errors || ! grep -q 'last element' errors; then
-    fail "the program of a torn file: $(cat errors)"
-fi
+
+# Both write what comes before bad input.
+{ seq 1500 && echo x; } >torn.csv
+head -c 12003 /dev/zero >torn.raw
+for format in csv raw; do
+    "${write[@]}" -o FileName=good.wav --format $format -i /dev/null --emit-c program.c
+    compile
+    for command in "${write[*]} -o FileName=good.wav -i" ./program; do
+        if $command torn.$format 2>errors || ! grep -qE 'line 1501: not|last element' errors ||
+            [[ $(brenix read audiofile -o FileName=good.wav -q | wc -l) -ne 1501 ]]; then
+            fail "good.wav of $command torn.$format: $(cat errors)"
+        fi
+    done
+done
 
 # Floating-point WAV has the levels of integers, from the command and from its program.
-printf '0.5\n-0.25\n1.5\n' | brenix write audiofile -o FileName=loud.wav -o Mode=write -o SampleFormat=DOUBLE -q
+printf '0.5\n-0.25\n1.5\n' | "${write[@]}" -o FileName=loud.wav
 write=(brenix write udp -o Host=127.0.0.1 -o Port=27111 -o ElementType=int16 -t int16 -i loud.wav -q)
 "${write[@]}" --emit-c program.c
 compile

@@ -228,7 +228,9 @@ enum { ROWS = @ROWS@, COLUMNS = @COLUMNS@ }; /* of one buffer */
 
 static @CTYPE@ elements[ROWS * COLUMNS];
 
-@TAKE@/* Reads up to `most` rows. Returns how many, 0 at the end, -1 after printing what is wrong. */
+static int inputOk = 1; /* 0 once readRows has printed what is wrong */
+
+@TAKE@/* Reads up to `most` rows. Returns how many, 0 at the end. */
 static int readRows(@FILE@* file, int most)
 {
 @READ@}
@@ -237,12 +239,12 @@ static int transfer(void* channel, @FILE@* file)
 {
     void* const output = coderChannelGetOutputStream(channel);
     double left = @COUNTS@;
-@START@    while (left > 0.0@TIME@) {
+@START@    while (inputOk && left > 0.0@TIME@) {
         uint8_t done = 0;
         double written = 0.0;
         const int rows = readRows(file, left < ROWS ? (int)left : ROWS);
-        if (rows <= 0) {
-            return rows == 0;
+        if (rows == 0) {
+            break;
         }
         if (!check(channel, "coderStreamIsDeviceDone", coderStreamIsDeviceDone(output, &done))) {
             return 0;
@@ -259,7 +261,7 @@ static int transfer(void* channel, @FILE@* file)
         }
         left -= rows;
     }
-    return 1;
+    return inputOk;
 }
 )";
 
@@ -281,7 +283,7 @@ constexpr std::string_view readRaw =
     R"(    const size_t size = fread(elements, 1, (size_t)most * sizeof(elements[0]), file);
     if (size % sizeof(elements[0]) != 0) {
         fputs("The last element is not complete.\n", stderr);
-        return -1;
+        inputOk = 0;
     }
     return (int)(size / sizeof(elements[0]));
 )";
@@ -306,7 +308,8 @@ constexpr std::string_view readCsv = R"(    static char* text = NULL;
         }
         if (next != text + length) {
             fprintf(stderr, "line %ld: not %d values of type @TYPENAME@: %s\n", line, COLUMNS, text);
-            return -1;
+            inputOk = 0;
+            break;
         }
         ++rows;
     }

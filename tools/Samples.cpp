@@ -1,5 +1,7 @@
 #include "Samples.hpp"
 
+#include "Commands.hpp"
+
 #include <unistd.h>
 
 #include <array>
@@ -289,7 +291,7 @@ public:
         }
     }
 
-    std::size_t read(std::size_t rows, Bytes& elements) override
+    void read(std::size_t rows, Bytes& elements) override
     {
         std::size_t count = 0;
         if (!first.empty() && rows > 0) {
@@ -300,14 +302,13 @@ public:
         for (; count < rows && readLine(); ++count) {
             parseLine(elements);
         }
-        return count;
     }
 
 private:
     /// The next line that is not empty.
     bool readLine()
     {
-        while (std::getline(stream, line)) {
+        while (std::getline(stream, line) && !(stream.eof() && isInterrupted())) {
             ++lineNumber;
             if (line.find_first_not_of(" \t\r") != std::string::npos) {
                 return true;
@@ -321,10 +322,15 @@ private:
     {
         const std::size_t size = elements.size();
         std::string wrong;
-        if (!parseRow(type, line, elements, wrong)) {
+        const bool isRow = parseRow(type, line, elements, wrong);
+        const std::size_t cells = (elements.size() - size) / type.size;
+        if (!isRow || cells != columns) {
+            elements.resize(size);
+        }
+        if (!isRow) {
             failAt(wrong);
         }
-        if (const std::size_t cells = (elements.size() - size) / type.size; cells != columns) {
+        if (cells != columns) {
             fail(name,
                  place() + std::to_string(cells) + " values instead of " + std::to_string(columns));
         }
@@ -356,20 +362,20 @@ public:
         total = static_cast<double>(elements);
     }
 
-    std::size_t read(std::size_t rows, Bytes& elements) override
+    void read(std::size_t rows, Bytes& elements) override
     {
         const std::size_t size = elements.size();
         elements.resize(size + rows * type.size);
         stream.read(reinterpret_cast<char*>(&elements[size]),
                     static_cast<std::streamsize>(rows * type.size));
-        requireRead(name, stream);
         const auto length = static_cast<std::size_t>(stream.gcount());
-        if (length % type.size != 0) {
-            fail(name, "the last element has " + std::to_string(length % type.size) + " of " +
+        const std::size_t torn = length % type.size;
+        elements.resize(size + length - torn);
+        requireRead(name, stream);
+        if (torn != 0 && !isInterrupted()) {
+            fail(name, "the last element has " + std::to_string(torn) + " of " +
                            std::to_string(type.size) + " bytes");
         }
-        elements.resize(size + length);
-        return length / type.size;
     }
 
 private:
@@ -399,17 +405,16 @@ public:
         total = file.isPipe() ? 0 : static_cast<double>(info.frames);
     }
 
-    std::size_t read(std::size_t rows, Bytes& elements) override
+    void read(std::size_t rows, Bytes& elements) override
     {
         const std::size_t size = elements.size();
         elements.resize(size + rows * columns * type.size);
         const auto count = static_cast<std::size_t>(wavEncoding(type).read(
             sound.get(), &elements[size], static_cast<sf_count_t>(rows * columns))); // 0 at the end
+        elements.resize(size + count * type.size);
         if (const int error = sf_error(sound.get()); error != SF_ERR_NO_ERROR) {
             fail(name, sf_error_number(error));
         }
-        elements.resize(size + count * type.size);
-        return count / columns;
     }
 
 private:

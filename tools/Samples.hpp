@@ -54,8 +54,9 @@ public:
     }
     virtual ~SampleReader() = default;
 
-    /// Appends up to that many rows, none at the end. Returns how many.
-    virtual std::size_t read(std::size_t rows, Bytes& elements) = 0;
+    /// Appends up to that many rows, none at the end. A Failure comes after the rows before it, which
+    /// are then there. A row that an interruption has cut is none.
+    virtual void read(std::size_t rows, Bytes& elements) = 0;
     std::size_t getColumns() const { return columns; }
     double getRate() const { return rate; }                  ///< 0 when the file does not tell
     std::size_t getHeaderLine() const { return headerLine; } ///< that names columns; 0 for none

@@ -151,7 +151,12 @@ ExitCode writeSamples(const Settings& given)
         while (rows < most && secondsSince(start) < mostSeconds && !isInterrupted()) {
             elements.clear();
             const double room = std::min(most - rows, static_cast<double>(settings.block));
-            const std::size_t count = reader->read(static_cast<std::size_t>(room), elements);
+            const auto bad =
+                caught([&] { reader->read(static_cast<std::size_t>(room), elements); });
+            const std::size_t count = elements.size() / (columns * type.size);
+            if (bad && count == 0) {
+                throw Failure(*bad);
+            }
             if (count == 0) {
                 break;
             }
@@ -168,6 +173,9 @@ ExitCode writeSamples(const Settings& given)
             }
             rows += static_cast<double>(count);
             progress.update(rows);
+            if (bad) { // after the rows before it
+                throw Failure(*bad);
+            }
             if (channel.hasDeviceError()) { // finish() throws it
                 break;
             }
