@@ -135,7 +135,8 @@ bool hasNumber(std::string_view list)
     bool found = false;
     splitCommas(list, [&](std::string_view part) {
         double value = 0;
-        found = found || type.parse(part, reinterpret_cast<unsigned char*>(&value));
+        found = found || part.find_first_of("+-.0123456789") == 0 ||
+                type.parse(part, reinterpret_cast<unsigned char*>(&value));
     });
     return found;
 }

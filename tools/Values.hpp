@@ -32,7 +32,7 @@ const ElementType& elementType(std::string_view name);
 /// Appends the elements of a list with commas. On false `wrong` is the first that is not of the type.
 bool parseRow(const ElementType& type, std::string_view list, Bytes& elements, std::string& wrong);
 
-/// Whether an element of a list with commas is a number, of whatever type.
+/// Whether an element of a list with commas is a number, of whatever type, or begins like one.
 bool hasNumber(std::string_view list);
 
 /// Elements as text: a char array as it stands up to its NUL, all others with commas.
