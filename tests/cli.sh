@@ -27,6 +27,7 @@ printf 'left,right\n1,-2\n3,-4\n' >samples.csv
 printf '1,2\n3\n' >uneven.csv
 printf '1\nx\n' >letters.csv
 printf '1.5,2\n3,4\n' >fraction.csv
+printf '1e400\n1\n' >range.csv
 printf 'a,b\n1\n' >header.csv
 seq 50000 >many.csv
 mkdir folder
@@ -67,6 +68,7 @@ done <<END
 0|wrote 2 counts|write loopback -i samples.csv -t int16
 1|uneven.csv: line 2: 1 values instead of 2|write loopback -i uneven.csv
 1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
+1|range.csv: line 1: not a number of type double: 1e400|write loopback -i range.csv
 1|fraction.csv: line 1: not a number of type int16: 1.5|write loopback -i fraction.csv -t int16
 1|header.csv: line 2: 1 values instead of 2|write loopback -i header.csv
 1|folder: cannot be read|write loopback -i folder
@@ -208,10 +210,22 @@ brenix write loopback -q -t int8 -i samples.csv --emit-c program.c
 compile
 for row in 300,1 1 1,2,3 1,x; do
     printf 'a,b\n1,2\n%s\n' "$row" >bad.csv
-    if ./program bad.csv 2>errors || ! grep -q "line 3: not 2 values of type int8: $row" errors; then
+    if ./program bad.csv 2>errors || [[ $(cat errors; echo .) != "bad.csv: line 3: not 2 values of type int8: $row
+." ]]; then
         fail "the program of $row: $(cat errors)"
     fi
 done
+for row in '0x10,a' 'nan ,inf'; do
+    echo "$row" >first.csv
+    for command in "brenix write loopback -q -t int8 -i" ./program; do
+        if $command first.csv 2>errors || ! grep -q 'first.csv: line 1: not' errors; then
+            fail "$command of a first line $row: $(cat errors)"
+        fi
+    done
+done
+printf '\xEF\xBB\xBF1,2\n' >marked.csv
+printf '\xEF\xBB\xBF\na,info\n1,2\n' >names.csv
+for file in marked.csv names.csv; do ./program $file || fail "the program of $file"; done
 brenix read "$plugins/probe.so" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
 sed -i 's/{2, 3, 4}/{2, 3, -4}/' program.c
 compile

@@ -155,6 +155,7 @@ static double now(void)
 )";
 
 constexpr std::string_view readProgram = R"(
+static const char* name; /* of the file */
 enum { MOST = 4096 }; /* counts of one buffer */
 @FIELDS@@PRINT@
 static int writeCounts(@FILE@* file, int counts)
@@ -228,7 +229,8 @@ enum { ROWS = @ROWS@, COLUMNS = @COLUMNS@ }; /* of one buffer */
 
 static @CTYPE@ elements[ROWS * COLUMNS];
 
-static int inputOk = 1; /* 0 once readRows has printed what is wrong */
+static const char* name; /* of the file */
+static int inputOk = 1;  /* 0 once readRows has printed what is wrong */
 
 @TAKE@/* Reads up to `most` rows. Returns how many, 0 at the end. */
 static int readRows(@FILE@* file, int most)
@@ -267,6 +269,7 @@ static int transfer(void* channel, @FILE@* file)
 
 constexpr std::string_view checkWav = R"(    if (info.channels != COLUMNS) {
         fprintf(stderr, "%s: %d channels instead of %d\n", name, info.channels, COLUMNS);
+        (void)sf_close(file);
         return EXIT_FAILURE;
     }
 )";
@@ -282,7 +285,7 @@ constexpr std::string_view readScaled = R"(    static double samples[ROWS * COLU
 constexpr std::string_view readRaw =
     R"(    const size_t size = fread(elements, 1, (size_t)most * sizeof(elements[0]), file);
     if (size % sizeof(elements[0]) != 0) {
-        fputs("The last element is not complete.\n", stderr);
+        fprintf(stderr, "%s: the last element is not complete\n", name);
         inputOk = 0;
     }
     return (int)(size / sizeof(elements[0]));
@@ -291,14 +294,17 @@ constexpr std::string_view readRaw =
 constexpr std::string_view readCsv = R"(    static char* text = NULL;
     static size_t size = 0;
     static long line = 0;
+    static int isFirst = 1;
     ssize_t length;
     int rows = 0;
     while (rows < most && (length = getline(&text, &size, file)) > 0) {
-        char* next = skipSpace(text);
-        ++line;
-        if (next == text + length@HEADER@) {
-            continue; /* an empty line@NAMES@ */
+        char* const begin = text + (++line == 1 && strncmp(text, "\xEF\xBB\xBF", 3) == 0 ? 3 : 0);
+        char* next = skipSpace(begin);
+        const int mayBeNames = isFirst;
+        if (next == text + length) {
+            continue; /* an empty line */
         }
+        isFirst = 0;
         for (int column = 0; column < COLUMNS; ++column) {
             if ((column > 0 && *next++ != ',') ||
                 !takeElement(&next, &elements[rows * COLUMNS + column])) {
@@ -306,8 +312,12 @@ constexpr std::string_view readCsv = R"(    static char* text = NULL;
                 break;
             }
         }
+        if (next != text + length && mayBeNames && !hasNumber(begin)) {
+            continue; /* the names of the columns */
+        }
         if (next != text + length) {
-            fprintf(stderr, "line %ld: not %d values of type @TYPENAME@: %s\n", line, COLUMNS, text);
+            fprintf(stderr, "%s: line %ld: not %d values of type @TYPENAME@: %.*s\n", name, line, COLUMNS,
+                    (int)strcspn(begin, "\r\n"), begin);
             inputOk = 0;
             break;
         }
@@ -348,6 +358,20 @@ static int takeElement(char** text, @CTYPE@* element)
     return 1;
 }
 
+/* Whether something between the commas of a line is a number or begins like one. */
+static int hasNumber(char* cell)
+{
+    for (; cell != NULL; cell = strchr(cell, ',')) {
+        char* end;
+        cell = skipSpace(cell + (*cell == ','));
+        (void)strtod(cell, &end); /* it may be inf or nan, too */
+        if (strspn(cell, "+-.0123456789") > 0 || (end != cell && strchr(",", *skipSpace(end)) != NULL)) {
+            return 1;
+        }
+    }
+    return 0;
+}
+
 )";
 
 constexpr std::string_view flushInput = R"( ||
@@ -357,10 +381,11 @@ constexpr std::string_view flushInput = R"( ||
 constexpr std::string_view fileMain = R"(
 int main(int argc, char** argv)
 {
-    const char* const name = argc > 1 ? argv[1] : @NAME@;
+@INFO@    @FILE@* file;
     void* channel;
     int ok;
-@INFO@    @FILE@* const file = @OPENFILE@;
+    name = argc > 1 ? argv[1] : @NAME@;
+    file = @OPENFILE@;
     if (file == NULL) {
         fprintf(stderr, "%s: %s\n", name, @WHY@);
         return EXIT_FAILURE;
@@ -663,10 +688,6 @@ void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInp
             values["WRONG"] = "value < 0 || value > 1";
         }
         values["TAKE"] = fill(takeElement, values);
-        if (const std::size_t line = reader.getHeaderLine(); line > 0) {
-            values["HEADER"] = " || line == " + std::to_string(line);
-            values["NAMES"] = ", or the names of the columns";
-        }
         values["TYPENAME"] = type.name;
         values["READ"] = fill(readCsv, values);
     }

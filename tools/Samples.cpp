@@ -280,7 +280,6 @@ public:
             const bool isRow = parseRow(type, line, first, wrong);
             columns = first.size() / type.size;
             if (!isRow && !hasNumber(line)) {
-                headerLine = lineNumber;
                 first.clear();
                 if (readLine()) {
                     parseLine(first);

@@ -58,9 +58,8 @@ public:
     /// are then there. A row that an interruption has cut is none.
     virtual void read(std::size_t rows, Bytes& elements) = 0;
     std::size_t getColumns() const { return columns; }
-    double getRate() const { return rate; }                  ///< 0 when the file does not tell
-    std::size_t getHeaderLine() const { return headerLine; } ///< that names columns; 0 for none
-    double getTotalRows() const { return total; }            ///< 0 when it is not known
+    double getRate() const { return rate; }       ///< 0 when the file does not tell
+    double getTotalRows() const { return total; } ///< 0 when it is not known
 
 protected:
     std::string name;
@@ -68,7 +67,6 @@ protected:
     std::size_t columns = 1;
     double rate = 0;
     double total = 0;
-    std::size_t headerLine = 0;
 };
 
 std::unique_ptr<SampleReader> openReader(const SampleFile& file, const ElementType& type);
