@@ -27,9 +27,9 @@ using Acceptor = asio::ip::tcp::acceptor;
 const std::string host = "127.2." + std::to_string(getpid() >> 8 & 255) + "." +
                          std::to_string(getpid() & 255); // of this process alone
 const asio::ip::tcp::endpoint any(asio::ip::make_address(host), 0);
-constexpr int port = 47110;
+constexpr int port = 27110;
 const std::string peer = host + ":" + std::to_string(port);
-const std::string server = "socat TCP-LISTEN:47110,reuseaddr,bind=" + host + " ";
+const std::string server = "socat TCP-LISTEN:27110,reuseaddr,bind=" + host + " ";
 const std::string lost = "brenix:Device:dataLost|";
 const std::string file = testing::TempDir() + "peer-" + std::to_string(getpid());
 
@@ -135,7 +135,7 @@ TEST(TcpTest, SixtyFourMiBComeBackAndThenThePeerIsKilled)
 TEST(TcpTest, APeerThatClosesEndsTheDevice)
 {
     const Program nc("sh -c \"printf '\\277\\360\\0\\0\\0\\0\\0\\0abc' | exec nc -N -l " + host +
-                     " 47110\" >" + file);
+                     " 27110\" >" + file);
     Channel channel("tcp");
     ASSERT_EQ(init(channel, "double", port, "big"), 1);
     ASSERT_EQ(channel.write({-2}), 1);
@@ -217,7 +217,7 @@ TEST(TcpTest, AResetEndsEveryWait)
 TEST(TcpTest, TheExampleStreams)
 {
     const Program echo(server + "EXEC:cat");
-    const std::string run = EXAMPLE_STREAM " " + host + " 47110 >" + file;
+    const std::string run = EXAMPLE_STREAM " " + host + " 27110 >" + file;
     Channel::waitUntil([&] { return std::system((run + " 2>/dev/null").c_str()) == 0; });
     EXPECT_NE(readFile().find("all came back"), npos);
 }
@@ -260,7 +260,7 @@ TEST(UdpTest, DatagramsArePackets)
 
 TEST(UdpTest, APeerAnswers)
 {
-    const Program echo("socat UDP-RECVFROM:47110,bind=" + host + ",fork EXEC:cat");
+    const Program echo("socat UDP-RECVFROM:27110,bind=" + host + ",fork EXEC:cat");
     Channel channel("udp");
     ASSERT_EQ(init(channel, "double", port, "big"), 1);
     ASSERT_EQ(channel.open(0), 1);

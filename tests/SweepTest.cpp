@@ -205,8 +205,8 @@ protected:
          [this](void* channel) {
              return init(channel, {{"Host", host},
                                    {"LocalHost", host},
-                                   {"Port", 47110},
-                                   {"LocalPort", 47110},
+                                   {"Port", 27110},
+                                   {"LocalPort", 27110},
                                    {"ElementType", "double"}});
          }},
     };
