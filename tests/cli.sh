@@ -105,9 +105,11 @@ file picture.png | grep -q 'PNG image data' || fail "picture.png is no picture"
 
 # What an interrupted read has read is complete.
 got=0
-timeout -s INT 1 brenix read signal -w part.raw 2>summary || got=$?
+timeout -s INT 1 brenix read signal -w part.raw 2>summary <&- || got=$?
 [[ -s part.raw && $(stat -c %s part.raw) -eq $(($(awk '{ print $2 * 8 }' summary))) ]] ||
     fail "an interrupted read: $(cat summary)"
+got=$(timeout -s KILL 0.5 brenix read signal -o SampleRate=500 -o BlockSize=10 -o Frequency=100 --format raw | wc -c) || true
+[[ $got -gt 0 ]] || fail "raw samples do not come at once"
 write=(brenix write audiofile -o Mode=write -o SampleFormat=DOUBLE -q)
 exec 3<>pipe
 for format in csv raw; do

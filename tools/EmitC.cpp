@@ -509,7 +509,8 @@ void addFile(const Settings& settings, bool writes, const std::string& wavFormat
 {
     const bool wav = settings.file.format == "wav";
     values["USAGE"] = std::string(" * usage: program [FILE], ") +
-                      (writes ? "to which it writes samples\n" : "from which it takes samples\n");
+                      (writes ? "to which it writes samples\n" : "from which it takes samples\n") +
+                      (writes && wav ? " * The file is not a pipe.\n" : "");
     values["FILE"] = wav ? "SNDFILE" : "FILE";
     values["ERROR"] = wav ? "sf_error" : "ferror";
     values["CLOSE"] = wav ? "sf_close" : "fclose";

@@ -146,9 +146,6 @@ public:
             text += '\n';
         }
         put(text.data(), text.size());
-        if (std::fflush(file.get()) != 0) { // a reader of a pipe wants them now
-            failAsErrno(name);
-        }
     }
 
     void finish() override
@@ -161,7 +158,8 @@ public:
 private:
     void put(const void* data, std::size_t size)
     {
-        if (std::fwrite(data, 1, size, file.get()) != size) {
+        if (std::fwrite(data, 1, size, file.get()) != size ||
+            std::fflush(file.get()) != 0) { // a reader of a pipe wants them now
             failAsErrno(name);
         }
     }

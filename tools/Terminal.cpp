@@ -23,6 +23,10 @@ volatile std::sig_atomic_t interrupted = 0;
 
 void catchInterrupts()
 {
+    if (::fcntl(STDIN_FILENO, F_GETFD) ==
+        -1) { // closed: else the handler takes a file that is there
+        ::open("/dev/null", O_RDONLY);
+    }
     struct sigaction action {
     };
     action.sa_handler = [](int /*signal*/) {
