@@ -36,7 +36,7 @@ mkdir folder
 while IFS='|' read -r code text arguments; do
     eval "set -- $arguments"
     got=0
-    timeout 20 brenix "$@" >out 2>&1 </dev/null || got=$?
+    timeout -k 5 20 brenix "$@" >out 2>&1 </dev/null || got=$?
     if [[ $got -ne $code ]] || ! grep -qF -- "$text" out; then
         fail "brenix $arguments: exit code $got, wanted $code with: $text"
         cat out >&2
