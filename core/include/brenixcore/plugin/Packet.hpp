@@ -18,11 +18,13 @@ namespace brenixcore::plugin
 class Fields
 {
 public:
+    /// The map, which must be there.
     brenixplugin::PropertyMap& operator*() const
     {
         checked = false;
         return *map;
     }
+    /// The same.
     brenixplugin::PropertyMap* operator->() const { return &**this; }
 
     /// Whether there is a map.
@@ -33,6 +35,7 @@ public:
 
     /// For the core: whether nobody used the fields since it found them sound.
     bool isChecked() const { return checked; }
+    /// For the core: whether it found them sound.
     void setChecked(bool sound) const { checked = sound; }
 
 private:
