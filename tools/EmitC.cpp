@@ -277,7 +277,8 @@ constexpr std::string_view checkWav = R"(    if (info.channels != COLUMNS) {
 constexpr std::string_view readScaled = R"(    static double samples[ROWS * COLUMNS];
     const int count = (int)sf_read_double(file, samples, most * COLUMNS);
     for (int i = 0; i < count; ++i) {
-        elements[i] = (@CTYPE@)lrint(fmax(@LOW@.0, fmin(@HIGH@.0, samples[i] * -(@LOW@.0))));
+        const double level = isnan(samples[i]) ? 0.0 : samples[i] * -(@LOW@.0);
+        elements[i] = (@CTYPE@)lrint(fmax(@LOW@.0, fmin(@HIGH@.0, level)));
     }
     return count / COLUMNS;
 )";

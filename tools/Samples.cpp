@@ -40,7 +40,8 @@ sf_count_t readScaled(SNDFILE* sound, void* elements, sf_count_t count)
     count = sf_read_double(sound, samples.data(), count);
     samples.resize(static_cast<std::size_t>(count));
     for (const double sample : samples) {
-        *next++ = static_cast<T>(std::lrint(std::fmax(low, std::fmin(high, sample * -low))));
+        const double level = std::isnan(sample) ? 0 : sample * -low;
+        *next++ = static_cast<T>(std::lrint(std::clamp(level, low, high)));
     }
     return count;
 }
