@@ -80,8 +80,7 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost, plugin::Dev
     Impl(const std::string& devicePath, plugin::Converter& channelConverter,
          IEventHandler& eventHandler, unsigned long firstLimit, unsigned long secondLimit)
         : converter(channelConverter), inputLimit(firstLimit), outputLimit(secondLimit),
-          device(loadPlugin<plugin::Device, CouldNotLoadDevice, CouldNotCreateDevice>(
-              devicePath, "brenixcoreCreateDevice")),
+          device(loadPlugin<plugin::Device, CouldNotLoadDevice, CouldNotCreateDevice>(devicePath)),
           handler(&eventHandler)
     {
     }

@@ -5,7 +5,7 @@ namespace brenixcore
 
 Converter::Converter(const std::string& converterPath)
     : impl(new Impl{loadPlugin<plugin::Converter, CouldNotLoadConverter, CouldNotCreateConverter>(
-          converterPath, "brenixcoreCreateConverter")})
+          converterPath)})
 {
 }
 

@@ -3,7 +3,6 @@
 #include "Plugin.hpp"
 #include "brenixcore/plugin/Describe.hpp"
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <fstream>
@@ -36,44 +35,61 @@ void requireElf(const std::string& path)
 
 /// Makes an object and releases it.
 template <typename Interface>
-void tryFactory(const PluginLibrary& library, const char* factory)
+void tryFactory(const PluginLibrary& library)
 {
-    createPlugin<Interface>(library, factory);
+    createPlugin<Interface>(library);
 }
 
-struct Kind {
-    const char* name;
-    const char* factory;
-    void (*tryFactory)(const PluginLibrary& library, const char* factory);
-};
+constexpr std::array tryFactories = {tryFactory<Device>, tryFactory<Converter>, tryFactory<Filter>};
 
-constexpr std::array kinds = {
-    Kind{"Device", "brenixcoreCreateDevice", tryFactory<Device>},
-    Kind{"Converter", "brenixcoreCreateConverter", tryFactory<Converter>},
-    Kind{"Filter", "brenixcoreCreateFilter", tryFactory<Filter>},
-};
+DescribedValue described(const OptionInfo& row)
+{
+    return {row.name, row.type, row.unit, row.defaultValue, row.meaning};
+}
+
+template <typename Info>
+DescribedValue described(const Info& row)
+{
+    return {row.name, row.type, row.unit, "", row.meaning};
+}
+
+/// The rows of a table, which ends with a null name.
+template <typename Info>
+std::vector<DescribedValue> rowsOf(const Info* row)
+{
+    std::vector<DescribedValue> rows;
+    for (; row->name != nullptr; ++row) {
+        rows.push_back(described(*row));
+    }
+    return rows;
+}
+
+/// The rows of the table that a function exports; none when it does not.
+template <typename Info>
+std::vector<DescribedValue> exportedRows(const PluginLibrary& library, const char* function)
+{
+    return library.has(function) ? rowsOf(library.function<const Info*()>(function)())
+                                 : std::vector<DescribedValue>();
+}
 
 void describe(const PluginLibrary& library, PluginReport& report)
 {
-    if (library.has("brenixcorePluginOptions")) {
-        report.describesOptions = true;
-        const auto* row = library.function<const OptionInfo*()>("brenixcorePluginOptions")();
+    report.describesOptions = library.has("brenixcorePluginOptions");
+    report.options = exportedRows<OptionInfo>(library, "brenixcorePluginOptions");
+    report.properties = exportedRows<PropertyInfo>(library, "brenixcorePluginProperties");
+    report.inputFields = exportedRows<FieldInfo>(library, "brenixcorePluginInputFields");
+    report.outputFields = exportedRows<FieldInfo>(library, "brenixcorePluginOutputFields");
+    if (library.has("brenixcorePluginCommands")) {
+        const auto* row = library.function<const CommandInfo*()>("brenixcorePluginCommands")();
         for (; row->name != nullptr; ++row) {
-            report.options.push_back(
-                {row->name, row->type, row->unit, row->defaultValue, row->meaning});
-        }
-    }
-    if (library.has("brenixcorePluginProperties")) {
-        const auto* row = library.function<const PropertyInfo*()>("brenixcorePluginProperties")();
-        for (; row->name != nullptr; ++row) {
-            report.properties.push_back({row->name, row->type, row->unit, "", row->meaning});
+            report.commands.push_back({row->name, rowsOf(row->options), row->meaning});
         }
     }
 }
 
 } // namespace
 
-PluginReport inspectPlugin(const std::string& name)
+PluginReport inspectPlugin(const std::string& name, const std::string& kind)
 {
     PluginReport report;
     std::optional<PluginLibrary> library; // outlives what the plug-in throws
@@ -93,17 +109,13 @@ PluginReport inspectPlugin(const std::string& name)
         report.problem = "abiVersion";
         library->requireAbiVersion();
         report.problem = "noFactory";
-        const auto* const kind =
-            std::find_if(kinds.begin(), kinds.end(),
-                         [&](const Kind& candidate) { return library->has(candidate.factory); });
-        if (kind == kinds.end()) {
-            throw std::runtime_error("it exports none of brenixcoreCreateDevice, "
-                                     "brenixcoreCreateConverter and brenixcoreCreateFilter");
-        }
-        report.kind = kind->name;
+        const PluginKind& found = library->kind();
+        report.kind = found.name;
         describe(*library, report);
+        report.problem = "otherKind";
+        library->requireKind(kind.empty() ? report.kind : kind);
         report.problem = "factoryFailed";
-        kind->tryFactory(*library, kind->factory);
+        tryFactories.at(static_cast<std::size_t>(&found - pluginKinds.data()))(*library);
         report.problem.clear();
     } catch (...) {
         report.message = currentExceptionText();

@@ -114,6 +114,29 @@ bool PluginLibrary::has(const char* symbol) const noexcept
     return dlsym(handle.get(), symbol) != nullptr;
 }
 
+const PluginKind& PluginLibrary::kind() const
+{
+    for (const PluginKind& candidate : pluginKinds) {
+        if (has(candidate.factory)) {
+            return candidate;
+        }
+    }
+    throw std::runtime_error("it exports none of brenixcoreCreateDevice, "
+                             "brenixcoreCreateConverter and brenixcoreCreateFilter");
+}
+
+void PluginLibrary::requireKind(const std::string& name) const
+{
+    const std::string found = kind().name;
+    if (found != name) {
+        const auto noun = [](std::string kindName) {
+            kindName[0] = static_cast<char>(kindName[0] - 'A' + 'a');
+            return kindName;
+        };
+        throw std::runtime_error("it is a " + noun(found) + " and no " + noun(name));
+    }
+}
+
 void* PluginLibrary::address(const char* symbol) const
 {
     void* const found = dlsym(handle.get(), symbol);

@@ -6,11 +6,14 @@
 #include "brenixcore/plugin/Inspect.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
+#include <array>
+#include <cstddef>
 #include <exception>
 #include <memory>
 #include <optional>
 #include <stdexcept>
 #include <string>
+#include <type_traits>
 #include <utility>
 
 /// For the implementations of exported classes, which are not exported themselves.
@@ -26,6 +29,21 @@ std::string pluginPath(const std::string& name);
 /// Throws for what is there but is no regular file: opening a pipe, say, could wait without end.
 void requireNoOtherFile(const std::string& path);
 
+/// What a plug-in can be.
+struct PluginKind {
+    const char* name;
+    const char* factory;
+};
+inline constexpr std::array pluginKinds = {PluginKind{"Device", "brenixcoreCreateDevice"},
+                                           PluginKind{"Converter", "brenixcoreCreateConverter"},
+                                           PluginKind{"Filter", "brenixcoreCreateFilter"}};
+
+/// The index of the kind that an interface is.
+template <typename Interface>
+constexpr std::size_t kindOf = std::is_same_v<Interface, plugin::Device>      ? 0
+                               : std::is_same_v<Interface, plugin::Converter> ? 1
+                                                                              : 2;
+
 /// A loaded shared library; unloads it.
 class PluginLibrary
 {
@@ -37,6 +55,12 @@ public:
     void requireAbiVersion() const;
 
     bool has(const char* symbol) const noexcept;
+
+    /// The kind of which it is; throws std::runtime_error when it is of none.
+    const PluginKind& kind() const;
+
+    /// Throws std::runtime_error when it is of another kind than that of the name.
+    void requireKind(const std::string& name) const;
 
     /// An exported function; throws std::runtime_error when there is none of that name.
     template <typename Function>
@@ -66,11 +90,13 @@ struct LoadedPlugin {
 /// loaded.
 std::string currentExceptionText();
 
-/// Makes the object of a loaded plug-in.
+/// Makes the object of a loaded plug-in, which must be of the kind.
 template <typename Interface>
-std::unique_ptr<Interface> createPlugin(const PluginLibrary& library, const char* factory)
+std::unique_ptr<Interface> createPlugin(const PluginLibrary& library)
 {
-    std::unique_ptr<Interface> object(library.function<Interface*()>(factory)());
+    constexpr PluginKind kind = pluginKinds[kindOf<Interface>];
+    library.requireKind(kind.name);
+    std::unique_ptr<Interface> object(library.function<Interface*()>(kind.factory)());
     if (!object) {
         throw std::runtime_error("the factory returned nothing");
     }
@@ -80,7 +106,7 @@ std::unique_ptr<Interface> createPlugin(const PluginLibrary& library, const char
 /// Loads a plug-in and makes its object. Whatever goes wrong becomes one of the two exceptions
 /// while the library, to which an exception may belong, is still loaded.
 template <typename Interface, typename LoadError, typename CreateError>
-LoadedPlugin<Interface> loadPlugin(const std::string& name, const char* factory)
+LoadedPlugin<Interface> loadPlugin(const std::string& name)
 {
     std::optional<PluginLibrary> library;
     std::string path = name;
@@ -93,7 +119,7 @@ LoadedPlugin<Interface> loadPlugin(const std::string& name, const char* factory)
     }
     std::unique_ptr<Interface> object;
     try {
-        object = createPlugin<Interface>(*library, factory);
+        object = createPlugin<Interface>(*library);
     } catch (...) {
         throw CreateError("Could not create " + path + ": " + currentExceptionText());
     }

@@ -246,8 +246,7 @@ void Stream::Impl::addFilter(const std::string& name, const PropertyMap& options
     if (const std::lock_guard lock(mutex); phase != Phase::Closed) {
         throw CannotAddFilterWhileOpen("Cannot add filter " + name + " while the channel is open.");
     }
-    auto loaded = loadPlugin<plugin::Filter, CouldNotLoadFilter, CouldNotCreateFilter>(
-        name, "brenixcoreCreateFilter");
+    auto loaded = loadPlugin<plugin::Filter, CouldNotLoadFilter, CouldNotCreateFilter>(name);
     libraries.push_back(std::move(loaded.library));
     plugin::Options given(options);
     loaded.object->tune(given);

@@ -1,6 +1,7 @@
 /// @file
-/// How a plug-in tells what its options and properties are, for those who use it. A description is
-/// optional and read only when someone asks; it stands beside the macro that exports the class:
+/// How a plug-in tells what its options, properties, fields and commands are, for those who use it. A
+/// description is optional and read only when someone asks; it stands beside the macro that exports the
+/// class:
 ///
 ///     constexpr OptionInfo options[] = {{"Gain", "number", "", "1", "factor of every number"}, {}};
 ///     BRENIXCORE_EXPORT_FILTER(Scale)
@@ -30,8 +31,29 @@ struct PropertyInfo {
     const char* meaning; ///< in a few words
 };
 
-/// The table of a plug-in that has no options.
+/// One field of the packets of a stream. Tables end as those of options do.
+struct FieldInfo {
+    const char* name; ///< "#" in it stands for 1, 2, 3 and so on, as far as there are fields
+
+    /// The type name with which it is read or written; "(Name)" is the type that the option Name says,
+    /// and an empty text the one that the data has before.
+    const char* type;
+    const char* unit;    ///< empty when it has none
+    const char* meaning; ///< in a few words
+};
+
+/// One command of a device. Tables end as those of options do.
+struct CommandInfo {
+    const char* name;          ///< with which it is executed
+    const OptionInfo* options; ///< those that it takes, a table as of options
+    const char* meaning;       ///< in a few words
+};
+
+/// The table of a plug-in or a command that has no options.
 constexpr OptionInfo noOptions[] = {{}};
+
+/// The table of a stream that a device does not have, or that a converter leaves as it is.
+constexpr FieldInfo noFields[] = {{}};
 
 } // namespace brenixcore::plugin
 
@@ -47,6 +69,28 @@ constexpr OptionInfo noOptions[] = {{}};
 #define BRENIXCORE_DESCRIBE_PROPERTIES(table)                                                      \
     extern "C" BRENIXCORE_PLUGIN_SHARED const brenixcore::plugin::PropertyInfo*                    \
     brenixcorePluginProperties()                                                                   \
+    {                                                                                              \
+        return table;                                                                              \
+    }
+
+/// Exports two tables of fields, which must have static storage: what a device delivers and what it takes, or
+/// what a converter makes of input and what it takes to convert for output.
+#define BRENIXCORE_DESCRIBE_FIELDS(inputTable, outputTable)                                        \
+    extern "C" BRENIXCORE_PLUGIN_SHARED const brenixcore::plugin::FieldInfo*                       \
+    brenixcorePluginInputFields()                                                                  \
+    {                                                                                              \
+        return inputTable;                                                                         \
+    }                                                                                              \
+    extern "C" BRENIXCORE_PLUGIN_SHARED const brenixcore::plugin::FieldInfo*                       \
+    brenixcorePluginOutputFields()                                                                 \
+    {                                                                                              \
+        return outputTable;                                                                        \
+    }
+
+/// Exports a table of commands, which must have static storage.
+#define BRENIXCORE_DESCRIBE_COMMANDS(table)                                                        \
+    extern "C" BRENIXCORE_PLUGIN_SHARED const brenixcore::plugin::CommandInfo*                     \
+    brenixcorePluginCommands()                                                                     \
     {                                                                                              \
         return table;                                                                              \
     }

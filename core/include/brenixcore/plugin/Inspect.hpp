@@ -12,13 +12,20 @@
 namespace brenixcore::plugin
 {
 
-/// A row of a plug-in's description: OptionInfo, or PropertyInfo, which has no default.
+/// A row of a plug-in's description: OptionInfo, or PropertyInfo or FieldInfo, which have no default.
 struct DescribedValue {
-    std::string name;         ///< of the option or property
-    std::string type;         ///< as in OptionInfo and PropertyInfo
+    std::string name;         ///< of the option, property or field
+    std::string type;         ///< as in OptionInfo, PropertyInfo and FieldInfo
     std::string unit;         ///< empty when it has none
     std::string defaultValue; ///< of an option
     std::string meaning;      ///< in a few words
+};
+
+/// A row of a plug-in's commands.
+struct DescribedCommand {
+    std::string name;
+    std::vector<DescribedValue> options; ///< that it takes
+    std::string meaning;                 ///< in a few words
 };
 
 /// What is known of a plug-in.
@@ -27,19 +34,23 @@ struct PluginReport {
 
     /// Empty when the plug-in loads and its object can be made. Otherwise "notFound" (or not
     /// readable), "wrongFileType", "missingDependency", "notLoadable", "notAPlugin", "abiVersion",
-    /// "noFactory" or "factoryFailed"; then `message` says what exactly.
+    /// "noFactory", "otherKind" or "factoryFailed"; then `message` says what exactly.
     std::string problem;
     std::string message; ///< why, when there is a problem
 
     std::string kind; ///< "Device", "Converter" or "Filter"; empty when it has no factory
-    bool describesOptions = false;          ///< or else what its options are is not known
-    std::vector<DescribedValue> options;    ///< in the order of the plug-in's table
-    std::vector<DescribedValue> properties; ///< the same
+    bool describesOptions = false;            ///< or else what its options are is not known
+    std::vector<DescribedValue> options;      ///< in the order of the plug-in's table
+    std::vector<DescribedValue> properties;   ///< the same
+    std::vector<DescribedValue> inputFields;  ///< the same; empty when it describes none
+    std::vector<DescribedValue> outputFields; ///< the same
+    std::vector<DescribedCommand> commands;   ///< the same
 };
 
-/// Loads the plug-in of a path or a bare name, makes its object and releases both. Throws only when
-/// memory runs out.
-BRENIXCORE_PLUGIN_SHARED PluginReport inspectPlugin(const std::string& name);
+/// Loads the plug-in of a path or a bare name, makes its object and releases both. With a kind, "Device",
+/// "Converter" or "Filter", a plug-in of another one has a problem, too. Throws only when memory runs out.
+BRENIXCORE_PLUGIN_SHARED PluginReport inspectPlugin(const std::string& name,
+                                                    const std::string& kind = "");
 
 /// The folder of the bare names, with a slash at its end.
 BRENIXCORE_PLUGIN_SHARED std::string pluginFolder();
