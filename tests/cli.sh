@@ -103,6 +103,28 @@ if [[ $got -ne 1 ]] || ! grep -q 'is it installed' out; then
 fi
 file picture.png | grep -q 'PNG image data' || fail "picture.png is no picture"
 
+# A picture of few samples has a part of the trace in each of its 79 columns, and some more at its steps.
+brenix scope signal -o Waveform=ramp -o SampleRate=8 -o Frequency=1 -o BlockSize=8 -o Pace=fast -n 8 >picture
+[[ $(LC_ALL=C.UTF-8 grep -o '[█▀▄]' picture | wc -l) -eq 89 ]] || fail "scope of few samples: $(cat picture)"
+
+# On a terminal a picture fits the screen, keys are not echoed, and the terminal is left as it was.
+while IFS='|' read -r columns keys shown arguments; do
+    rm -f terminal
+    got=0
+    {
+        while ! grep -qs $'\e\[J' terminal; do sleep 0.1; done
+        printf '%b' "$keys"
+    } | timeout -k 5 20 script -qefc "stty rows 24 cols $columns; stty -g >before
+        brenix scope signal $arguments && stty -g | cmp before -" terminal >/dev/null || got=$?
+    if [[ $got -ne 0 ]] || ! grep -qF "$shown" terminal || grep -qE 'xy|\^C' terminal ||
+        ! awk 'BEGIN { RS = "\033\\[J" } lines > 24 { exit 1 } { lines = gsub("\n", "") }' terminal; then
+        fail "scope on $columns columns, keys $keys: exit code $got: $(cat -v terminal)"
+    fi
+done <<'END'
+80|xyq|11 of 12 channels|-o Channels=12
+1|\003|RMS|-o Channels=2
+END
+
 # What an interrupted read has read is complete.
 got=0
 timeout -s INT 1 brenix read signal -w part.raw 2>summary <&- || got=$?
