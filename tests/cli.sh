@@ -66,6 +66,8 @@ done <<END
 2|{"error":{"id":"","message":"The following argument was not expected: --nonsense|info signal --json --nonsense
 1|{"error":{"id":"brenix:Device:failed","message":"Field none|scope $plugins/probe.so -o Packets:int32=2,-4 --json
 0|wrote 2 counts|write loopback -i samples.csv -t int16
+0|{"counts":2,"seconds":|write loopback -i samples.csv --json
+0|"counts": 10,|scope signal -n 10 --json
 1|uneven.csv: line 2: 1 values instead of 2|write loopback -i uneven.csv
 1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
 1|range.csv: line 1: not a number of type double: 1e400|write loopback -i range.csv

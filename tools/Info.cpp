@@ -4,6 +4,7 @@
 #include "brenixcoder/coder.h"
 #include "brenixcore/plugin/Inspect.hpp"
 
+#include <cstdint>
 #include <iostream>
 #include <optional>
 #include <sstream>
@@ -83,7 +84,7 @@ ExitCode showInfo(const Settings& settings)
          {std::pair("input", channel.inputStream()), std::pair("output", channel.outputStream())}) {
         text << name << ": ";
         if (const auto dimension = countDimension(channel, stream)) {
-            streams[name] = {{"countDimension", *dimension}};
+            streams[name] = {{"countDimension", static_cast<std::int64_t>(*dimension)}};
             text << "counts along dimension " << *dimension << '\n';
         } else {
             streams[name] = nullptr;

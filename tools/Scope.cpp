@@ -10,6 +10,7 @@
 #include <array>
 #include <cmath>
 #include <csignal>
+#include <cstdint>
 #include <cstdio>
 #include <deque>
 #include <iostream>
@@ -270,7 +271,10 @@ ExitCode showScope(const Settings& settings)
             list.push_back({{"name", trace.name}, {"peak", trace.peak}, {"rms", trace.rms()}});
         }
         printJson(std::cout,
-                  {{"counts", reading.getCounts()}, {"seconds", seconds}, {"channels", list}}, 2);
+                  {{"counts", static_cast<std::int64_t>(reading.getCounts())},
+                   {"seconds", seconds},
+                   {"channels", list}},
+                  2);
     } else {
         std::cout << draw(settings, traces, seconds, fill, error, false);
     }

@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdint>
 #include <cstdio>
 #include <iostream>
 #include <thread>
@@ -29,8 +30,9 @@ std::pair<double, double> extent(const Settings& settings, double rate)
 void summarise(const Settings& settings, const char* verb, double counts, double seconds)
 {
     if (settings.json) {
-        printJson(std::cerr,
-                  {{"counts", counts}, {"seconds", seconds}, {"interrupted", isInterrupted()}});
+        printJson(std::cerr, {{"counts", static_cast<std::int64_t>(counts)},
+                              {"seconds", seconds},
+                              {"interrupted", isInterrupted()}});
     } else if (!settings.quiet) {
         std::fprintf(stderr, "%s %.0f counts in %.3g s%s\n", verb, counts, seconds,
                      isInterrupted() ? ", interrupted" : "");
