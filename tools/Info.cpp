@@ -1,6 +1,7 @@
 // The command info.
 
 #include "Commands.hpp"
+#include "Screen.hpp"
 #include "brenixcoder/coder.h"
 #include "brenixcore/plugin/Inspect.hpp"
 
@@ -72,7 +73,7 @@ std::optional<double> countDimension(Channel& channel, void* stream)
 
 ExitCode showInfo(const Settings& settings)
 {
-    Channel channel(settings.channel, false);
+    Channel channel(settings.channel, Use::Look);
     if (settings.open) {
         channel.open(settings.channel);
     }
@@ -97,8 +98,8 @@ ExitCode showInfo(const Settings& settings)
                         {"type", type->name},
                         {"unit", unit},
                         {"value", toJson(*type, elements)}});
-        text << name << ": " << printElements(*type, elements) << (unit.empty() ? "" : " ") << unit
-             << '\n';
+        text << name << ": " << printable(printElements(*type, elements))
+             << (unit.empty() ? "" : " ") << unit << '\n';
     }
     if (settings.json) {
         printJson(std::cout, {{"streams", streams}, {"properties", list}}, 2);

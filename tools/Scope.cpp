@@ -139,7 +139,7 @@ std::string printed(const char* format, double value)
 }
 
 /// The whole picture, lines that end with a newline. A screen has as many channels as there is room for.
-std::string draw(const Settings& settings, const std::vector<Trace>& traces, double seconds,
+std::string draw(const std::string& title, const std::vector<Trace>& traces, double seconds,
                  double fill, const std::string& error, bool onScreen)
 {
     const Size size = terminalSize();
@@ -149,8 +149,7 @@ std::string draw(const Settings& settings, const std::vector<Trace>& traces, dou
     const int height = std::clamp(room / std::max(shown, 1) - 1, 1, 12);
     const double counts = traces.empty() ? 0 : traces[0].count;
     std::string text =
-        settings.channel.device +
-        (shown < all ? printed("  %.0f of ", shown) + printed("%.0f channels", all) : "") +
+        title + (shown < all ? printed("  %.0f of ", shown) + printed("%.0f channels", all) : "") +
         printed("  %.1f s", seconds) + printed("  %.0f counts", counts) +
         printed("  %.4g counts/s", counts / seconds) + printed("  buffer %.0f%%\n", 100 * fill);
     for (int i = 0; i < shown; ++i) {
@@ -232,7 +231,7 @@ double bufferFill(Channel& channel)
 
 ExitCode showScope(const Settings& settings)
 {
-    Channel channel(settings.channel, false);
+    Channel channel(settings.channel, Use::Read);
     const double rate = countRate(channel, settings.file);
     channel.open(settings.channel);
     Reading reading(channel, settings, rate);
@@ -241,9 +240,14 @@ ExitCode showScope(const Settings& settings)
     std::string error;
     double drawn = -1;
     double fill = 0;
+    std::string title = settings.channel.device;
     std::optional<Screen> screen;
     if (live) {
+        const auto port = chosenPort(channel, settings.channel);
+        title += port ? "  LocalPort " + std::to_string(*port) : "";
         screen.emplace();
+    } else {
+        tellPort(channel, settings);
     }
     const auto failure = caught([&] {
         while (!reading.isOver() && !(live && Screen::isTyped('q'))) {
@@ -252,13 +256,13 @@ ExitCode showScope(const Settings& settings)
                 add(traces, reading, counts, settings.window);
             }
             if (const auto raised = channel.deviceError()) {
-                error = raised->text();
+                error = printable(raised->text());
                 if (!live) {
                     report(settings, *raised);
                 }
             }
             if (live && reading.getSeconds() - drawn > 0.04) {
-                Screen::show(draw(settings, traces, reading.getSeconds(), fill, error, true));
+                Screen::show(draw(title, traces, reading.getSeconds(), fill, error, true));
                 drawn = reading.getSeconds();
             }
         }
@@ -276,7 +280,7 @@ ExitCode showScope(const Settings& settings)
                    {"channels", list}},
                   2);
     } else {
-        std::cout << draw(settings, traces, seconds, fill, error, false);
+        std::cout << draw(title, traces, seconds, fill, error, false);
     }
     const auto noPicture = caught([&] {
         if (!settings.png.empty() && !traces.empty()) {

@@ -4,7 +4,9 @@
 #include <termios.h>
 #include <unistd.h>
 
+#include <array>
 #include <csignal>
+#include <cstdio>
 #include <iostream>
 #include <string_view>
 
@@ -58,6 +60,29 @@ void catchOnce(int signal) noexcept
 }
 
 } // namespace
+
+std::string printable(std::string_view text)
+{
+    std::string result;
+    while (!text.empty()) {
+        const auto byte = [&](std::size_t i) { return static_cast<unsigned char>(text[i]); };
+        const std::size_t length = byte(0) < 0x80 ? 1 : byte(0) < 0xE0 ? 2 : byte(0) < 0xF0 ? 3 : 4;
+        bool plain = length == 1 ? (byte(0) >= ' ' && byte(0) != 0x7F) || text[0] == '\n'
+                                 : byte(0) >= 0xC2 && byte(0) < 0xF5 && length <= text.size();
+        for (std::size_t i = 1; plain && i < length; ++i) {
+            plain = (byte(i) & 0xC0U) == 0x80 && (byte(0) != 0xC2 || byte(i) >= 0xA0);
+        }
+        if (plain) {
+            result += text.substr(0, length);
+        } else {
+            std::array<char, 8> escaped{};
+            std::snprintf(escaped.data(), escaped.size(), "\\x%02x", byte(0));
+            result += escaped.data();
+        }
+        text.remove_prefix(plain ? length : 1);
+    }
+    return result;
+}
 
 Size terminalSize()
 {

@@ -1,11 +1,16 @@
-// The screen of a terminal, for pictures that are drawn one over the other.
+// What is shown on a terminal: text that does it no harm, and pictures that are drawn one over the other.
 #ifndef BRENIX_TOOLS_SCREEN_HPP
 #define BRENIX_TOOLS_SCREEN_HPP
 
 #include <string>
+#include <string_view>
 
 namespace brenix
 {
+
+/// A text without control characters, but for newlines, and without what is not UTF-8: these bytes become
+/// such as \\x1b.
+std::string printable(std::string_view text);
 
 /// Of the standard output's terminal, or what fits elsewhere.
 struct Size {
