@@ -96,6 +96,7 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost, plugin::Dev
     std::optional<plugin::Packet> tryPull() override;
     bool isClosing() const override;
     void refuseOutput() override;
+    void endInput() override;
 
     bool enter(plugin::Packet& packet, bool waits);
     std::optional<plugin::Packet> leave(bool waits);
@@ -206,6 +207,13 @@ void Channel::Impl::refuseOutput()
 {
     if (output) {
         output->impl->setDeviceDone();
+    }
+}
+
+void Channel::Impl::endInput()
+{
+    if (input) {
+        input->impl->setDeviceDone();
     }
 }
 
