@@ -46,6 +46,7 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost,
     std::optional<plugin::Packet> tryPull() override;
     bool isClosing() const override;
     void refuseOutput() override;
+    void endInput() override;
 
     bool enter(plugin::Packet& packet, bool waits);
     std::optional<plugin::Packet> leave(bool waits);

@@ -128,6 +128,13 @@ void Channel::Impl::refuseOutput()
     }
 }
 
+void Channel::Impl::endInput()
+{
+    if (input) {
+        input->impl->queue.setDeviceDone();
+    }
+}
+
 // --- The device's thread ---
 
 void Channel::Impl::runDevice() noexcept

@@ -76,6 +76,10 @@ public:
     /// stream is discarded at close, and told.
     virtual void refuseOutput() = 0;
 
+    /// Says that the device pushes nothing more, while it may go on with its output: its reader is told
+    /// that the device is done, and one that waits ends.
+    virtual void endInput() = 0;
+
 protected:
     ~DeviceStreams() = default;
 };
