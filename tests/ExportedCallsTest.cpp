@@ -160,13 +160,14 @@ TEST_F(ExportedCallsTest, NullPointersAreNamed)
         }
     }
     double total = 0;
+    double size = 1;
     char* const m = message;
     expectNamed(coderChannelGetLastSyncError(channel, nullptr, m), "errorId");
     expectNamed(coderChannelGetLastSyncError(channel, m, nullptr), "errorMessage");
     expectNamed(coderChannelGetLastAsyncError(channel, nullptr, m), "errorId");
     expectNamed(coderChannelGetLastAsyncError(channel, m, nullptr), "errorMessage");
     expectNamed(coderInputStreamPeek(input, &total, &total, nullptr, 1), "numBuffers");
-    expectNamed(coderInputStreamPeek(input, &total, nullptr, &total, 1), "bufferCounts");
+    expectNamed(coderInputStreamPeek(input, &total, nullptr, &size, 1), "bufferCounts");
     expectNamed(coderChannelGetLastError(channel, nullptr, m), "bufferCounts"); // still this one
     expectNamed(coderChannelGetLastError(channel, m, nullptr), "bufferCounts");
     EXPECT_EQ(answer.written(), "");

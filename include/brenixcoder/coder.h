@@ -345,9 +345,9 @@ CODER_API int coderStreamTuneFilters(void* stream, uint64_t optionCount, ...) CO
  * @param stream       input stream handle
  * @param totalCounts  receives the sum of the counts reported; 0.0 at once, so also on failure
  * @param bufferCounts receives one count for each reported buffer, oldest first; an array of at
- *                     least `*numBuffers` elements
- * @param numBuffers   in: how many elements `bufferCounts` has (negative or NaN is 0); out: how
- *                     many were written
+ *                     least `*numBuffers` elements. With room for none it may be NULL.
+ * @param numBuffers   in: how many elements `bufferCounts` has (below 0 or NaN is 0, fractions are
+ *                     cut); out: how many were written
  * @param maxCounts    list no more counts than this; below 0 is 0, INFINITY lists all. A read of
  *                     that many counts delivers just these buffers.
  * @return 1, or 0 with the last error
