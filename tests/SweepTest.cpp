@@ -35,6 +35,7 @@ bool isOutOfMemory(const std::string& error)
         "brenix:OutputStream:couldNotConvertOutputData|",
         "brenix:Device:failed|std::bad_alloc",
         "brenix:Stream:filterFailed|std::bad_alloc",
+        "brenix:Stream:dataLost|The device ended and did not take 8 counts: std::bad_alloc",
     };
     return std::find(std::begin(errors), std::end(errors), error) != std::end(errors);
 }
@@ -331,7 +332,8 @@ TEST_F(SweepTest, AnErrorOfAPlugInIsKept)
         const int result = channel.term();
         const bool failed = Failing::end();
         EXPECT_EQ(result, 0);
-        EXPECT_EQ(channel.error(), failed ? unexpected + "std::bad_alloc" : "|");
+        const std::string error = channel.error(); // without memory for the property, the same
+        EXPECT_TRUE(error == "|" || (failed && isOutOfMemory(error))) << error;
         EXPECT_EQ(channel.error(coderChannelGetLastSyncError), "probe:raised|term");
         return failed;
     });

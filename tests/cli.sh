@@ -94,7 +94,8 @@ done <<END
 2|--nonsense; see brenix read --help|read signal --nonsense
 0|Usage: brenix write|help write
 1|line 2: not a number of type double: \x1b[31m\xc2\x9bä\xff|write loopback -i escapes.csv
-1|brenix:Device:failed: failed in run|write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
+1|brenix:Device:failed: failed in run; also: brenix:Stream:dataLost: The device ended and did not take|write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
+1|brenix:InputStream:couldNotConvertInputData: 13 is refused|read $plugins/probe.so -c $plugins/pickyConverter.so -o Packets:int32=5,15 -w refused.csv
 1|Field none has no elements|read $plugins/probe.so -o Packets:int32=2,3,-4 -w kept.csv
 2|--counts: 1.5 is not a whole number of at least 1|read signal -n 1.5
 2|--limit: 0.5 is not a whole number of at least 1|read signal -n 1 --limit 0.5
@@ -195,6 +196,20 @@ compile() {
     "$cc" -std=c99 -Wall -Wextra -Wpedantic -Werror "-I$source/include" program.c -o program \
         "-L$build/lib" -lbrenixcoder -lsndfile -lm "-Wl,-rpath,$build/lib"
 }
+
+# Plug-ins are found also by a library that was found in a relative folder, before the program left it.
+cat >program.c <<'END'
+#include <brenixcoder/coder.h>
+#include <unistd.h>
+int main(void)
+{
+    char id[CODER_ERROR_SIZE], message[CODER_ERROR_SIZE];
+    return chdir("/") != 0 || coderChannelCreate("signal", "identity", id, message, 1.0, 1.0) == NULL;
+}
+END
+"$cc" "-I$source/include" program.c -o program "-L$build/lib" -lbrenixcoder "-Wl,-rpath-link,$build/lib"
+program=$PWD/program
+(cd "$build" && LD_LIBRARY_PATH=lib "$program") || fail "plug-ins beside a library in a relative folder"
 
 # Emitted programs: each does the same again. The result is a file, or what is printed.
 emitted() { # FILE-OF-RESULT ARGUMENTS...

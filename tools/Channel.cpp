@@ -141,6 +141,13 @@ void Channel::open(const ChannelSettings& settings)
 
 void Channel::finish(const std::optional<Failure>& failure)
 {
+    std::vector<Failure> failures;
+    const auto add = [&](const std::optional<Failure>& one) {
+        if (one) {
+            failures.push_back(*one);
+        }
+    };
+    add(deviceError());
     const auto ended = failure ? failure : caught([&] {
         std::uint8_t isOpen = 0;
         check(coderChannelIsOpen(handle, &isOpen));
@@ -148,13 +155,15 @@ void Channel::finish(const std::optional<Failure>& failure)
             check(coderChannelClose(handle));
         }
     });
-    coderChannelClose(handle); // the device may tell its error only now
-    if (const auto error = deviceError()) {
-        throw Failure(error->getId(),
-                      error->what() + (ended ? "; also: " + ended->text() : std::string()));
-    }
-    if (ended) {
-        throw Failure(*ended);
+    coderChannelClose(handle);
+    add(deviceError()); // some are told only now
+    add(ended);
+    if (!failures.empty()) {
+        std::string message = failures[0].what();
+        for (std::size_t i = 1; i < failures.size(); ++i) {
+            message += "; also: " + failures[i].text();
+        }
+        throw Failure(failures[0].getId(), message);
     }
     check(coderChannelTerm(handle));
 }

@@ -74,7 +74,7 @@ public:
     void open(const ChannelSettings& settings);
 
     /// Closes, when it is open, and terminates. Throws what fails, or the failure that ended a
-    /// transfer, behind the device's error if there is one: mostly that is the reason.
+    /// transfer, behind the device's errors if there are any: mostly they are the reason.
     void finish(const std::optional<Failure>& failure = {});
 
     /// Throws the error of a call that returned 0.

@@ -25,7 +25,13 @@ public:
     void convertOutput(Packet& /*packet*/) override {}
 };
 
+constexpr FieldInfo fieldTable[] = {
+    {"Values", "", "", "what was the field data"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_CONVERTER(Rename)
 BRENIXCORE_DESCRIBE_OPTIONS(brenixcore::plugin::noOptions)
+BRENIXCORE_DESCRIBE_FIELDS(fieldTable, brenixcore::plugin::noFields)

@@ -65,6 +65,7 @@ struct Bench : Base, DeviceStreams, DeviceHost {
     }
 
     void refuseOutput() override {}
+    void endInput() override {}
 
     bool isClosing() const override
     {

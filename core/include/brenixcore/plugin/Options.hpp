@@ -72,11 +72,11 @@ public:
         return static_cast<long>(*value);
     }
 
-    /// Refuses options that were not asked for. The core's own is always allowed.
+    /// Refuses options that were not asked for.
     void requireAllKnown() const
     {
         for (const auto& option : options) {
-            if (asked.find(option.first) == asked.end() && option.first != "Timeout") {
+            if (asked.find(option.first) == asked.end()) {
                 fail(option.first, "is not known");
             }
         }

@@ -6,8 +6,8 @@
 ///     BRENIXCORE_EXPORT_DEVICE(Silence)
 ///
 /// It is built with hidden visibility, C++17 or later, and links neither brenixcore nor
-/// brenixcoder. Any operation may throw a std::exception; its text reaches the caller, or, from a
-/// thread of the core, becomes an "error" event.
+/// brenixcoder. Any operation may throw a std::exception; its text reaches the caller, as the message of the
+/// error or as the channel's property Reason, or, from a thread of the core, becomes an "error" event.
 #ifndef BRENIXCORE_PLUGIN_PLUGIN_HPP
 #define BRENIXCORE_PLUGIN_PLUGIN_HPP
 
@@ -33,8 +33,8 @@ constexpr std::uint32_t abiVersion = 1;
 class BRENIXCORE_PLUGIN_SHARED DeviceHost
 {
 public:
-    /// Raises an event. `name` is "error", "warning" or "trace". An event without an identifier has
-    /// brenix:Device:failed. On the thread that is inside an operation of the channel, an error throws,
+    /// Raises an event. `name` is "error", "warning" or "trace"; the last two are seen only where the
+    /// environment's BRENIX_TRACE says. An event without an identifier has brenix:Device:failed. On the thread that is inside an operation of the channel, an error throws,
     /// and the exception must pass through the device.
     virtual void raise(const char* name, const char* identifier, const char* message) = 0;
 
@@ -67,12 +67,18 @@ public:
     /// As pull(), but returns nothing when there is nothing at once.
     virtual std::optional<Packet> tryPull() = 0;
 
-    /// Whether the channel is closing: run() must return once tryPull() returns nothing.
+    /// Whether the channel is closing: run() must return once tryPull() returns nothing and no answer to
+    /// the output is to be expected.
     virtual bool isClosing() const = 0;
 
     /// Says that the device takes no more output than what is queued, while it may go on with its
-    /// input: further writes are refused, and one that waits ends.
+    /// input: further writes are refused, and one that waits ends. What run() then leaves in the output
+    /// stream is discarded at close, and told.
     virtual void refuseOutput() = 0;
+
+    /// Says that the device pushes nothing more, while it may go on with its output: its reader is told
+    /// that the device is done, and one that waits ends.
+    virtual void endInput() = 0;
 
 protected:
     ~DeviceStreams() = default;
