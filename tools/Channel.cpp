@@ -37,14 +37,12 @@ std::string placeOf(const std::string& kind)
                                  : "filters are given with -f";
 }
 
-/// A plug-in and the kind that it must have.
-using Wanted = std::pair<std::string, const char*>;
-
-/// Adds to an error without a message which plug-in did not load, and why.
-Failure explained(const Failure& failure, const std::vector<Wanted>& plugins)
+/// Adds to the error of a channel that could not be made, and so tells no reason, which plug-in did not load,
+/// and why.
+Failure explained(const std::string& id, std::string message, const ChannelSettings& settings)
 {
-    std::string message = failure.what();
-    for (const auto& [name, kind] : plugins) {
+    for (const auto& [name, kind] :
+         {std::pair(settings.converter, "Converter"), std::pair(settings.device, "Device")}) {
         if (!message.empty()) {
             break;
         }
@@ -57,7 +55,7 @@ Failure explained(const Failure& failure, const std::vector<Wanted>& plugins)
             message += "; " + placeOf(report.kind);
         }
     }
-    return {failure.getId(), message};
+    return {id, message};
 }
 
 void requireFixedNumber(const Field& field, std::size_t rows)
@@ -87,8 +85,7 @@ Channel::Channel(const ChannelSettings& settings, Use use)
     handle = coderChannelCreate(settings.device.c_str(), settings.converter.c_str(), id.data(),
                                 message.data(), settings.inputLimit, settings.outputLimit);
     if (handle == nullptr) {
-        throw explained({id.data(), message.data()},
-                        {{settings.converter, "Converter"}, {settings.device, "Device"}});
+        throw explained(id.data(), message.data(), settings);
     }
     try {
         initialise(settings, use);
@@ -112,12 +109,9 @@ void Channel::initialise(const ChannelSettings& settings, Use use)
     }
     for (const std::string& text : settings.filters) {
         const FilterSettings filter = parseFilter(text);
-        const int added = callWithOptions(filter.options, [&](auto... list) {
+        check(callWithOptions(filter.options, [&](auto... list) {
             return coderStreamAddFilter(used, filter.name.c_str(), list...);
-        });
-        if (added == 0) {
-            throw explained(lastError(), {{filter.name, "Filter"}});
-        }
+        }));
     }
 }
 
