@@ -282,12 +282,17 @@ done
 printf '\xEF\xBB\xBF1,2\n' >marked.csv
 printf '\xEF\xBB\xBF\na,info\n1,2\n' >names.csv
 for file in marked.csv names.csv; do ./program $file || fail "the program of $file"; done
-brenix read "$plugins/probe.so" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
-sed -i 's/{2, 3, 4}/{2, 3, -4}/' program.c
-compile
-if ./program broken.csv 2>errors || ! cmp broken.csv kept.csv; then
-    fail "the program of a device that fails: $(cat errors)"
-fi
+while read -r converter last message; do
+    brenix read "$plugins/probe.so" -c "$converter" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
+    sed -i "s/{2, 3, 4}/{2, 3, $last}/" program.c
+    compile
+    if ./program broken.csv 2>errors || ! cmp broken.csv kept.csv || ! grep -q "$message" errors; then
+        fail "the program with a packet $last: $(cat errors)"
+    fi
+done <<END
+identity -4 brenix:Device:failed: Field none
+$plugins/pickyConverter.so 9 couldNotConvertInputData: 13 is refused
+END
 
 # Samples arrive as they were: a file of each format, through pipes.
 brenix read "${signal[@]}" -n 3000 --format raw -q >samples.raw
