@@ -29,6 +29,7 @@ printf '1\nx\n' >letters.csv
 printf '1.5,2\n3,4\n' >fraction.csv
 printf '1e400\n1\n' >range.csv
 printf 'a,b\n1\n' >header.csv
+printf '1\n\e[31m\xc2\x9b\xc3\xa4\xff\n' >escapes.csv
 seq 50000 >many.csv
 mkdir folder
 
@@ -37,7 +38,7 @@ while IFS='|' read -r code text arguments; do
     eval "set -- $arguments"
     got=0
     timeout -k 5 20 brenix "$@" >out 2>&1 </dev/null || got=$?
-    if [[ $got -ne $code ]] || ! grep -qF -- "$text" out; then
+    if [[ $got -ne $code ]] || ! grep -qF -- "$text" out || grep -q 'brenix: brenix:' out; then
         fail "brenix $arguments: exit code $got, wanted $code with: $text"
         cat out >&2
     fi
@@ -56,7 +57,7 @@ done <<END
 1|"problem": "abiVersion"|check --json signal $plugins/otherAbiVersion.so
 0|does not describe its options|plugins $plugins/probe.so
 1|couldNotLoadDevice: $build/lib/brenix-plugins/none.so: No such file|info none
-1|couldNotLoadFilter: it needs a library|info signal -f ./needs.so
+1|couldNotLoadFilter: Could not load ./needs.so: libgone.so: cannot open|info signal -f ./needs.so
 1|{"error":{"id":"brenix:Channel:unexpectedException","message":"Option Foo: is not known."}}|info signal -o Foo=1 --json
 2|not a value of type int8: 300|info signal -o Foo:int8=300
 2|an option is Name=value|info signal -o Foo
@@ -66,6 +67,8 @@ done <<END
 2|{"error":{"id":"","message":"The following argument was not expected: --nonsense|info signal --json --nonsense
 1|{"error":{"id":"brenix:Device:failed","message":"Field none|scope $plugins/probe.so -o Packets:int32=2,-4 --json
 0|wrote 2 counts|write loopback -i samples.csv -t int16
+0|{"counts":2,"seconds":|write loopback -i samples.csv --json
+0|"counts": 10,|scope signal -n 10 --json
 1|uneven.csv: line 2: 1 values instead of 2|write loopback -i uneven.csv
 1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
 1|range.csv: line 1: not a number of type double: 1e400|write loopback -i range.csv
@@ -73,8 +76,26 @@ done <<END
 1|header.csv: line 2: 1 values instead of 2|write loopback -i header.csv
 1|folder: cannot be read|write loopback -i folder
 1|folder: cannot be read|write loopback -i folder --format raw
-1|notSupported|write signal -i samples.csv
-1|brenix:Device:failed: failed in run; also: brenix:Stream:dataLost: The device ended and did not take|write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
+1|signal has no output stream with these options: it cannot be written to|write signal -i samples.csv
+1|audiofile has no input stream with these options: it cannot be read|read audiofile -o Mode=write -o FileName=a.wav
+1|couldNotCreateDevice: scale: it is a filter and no device; filters are given with -f|read scale
+1|couldNotCreateConverter: scale: it is a filter and no converter|info signal -c scale
+1|identity.so: it is a converter and no filter|info signal -f identity
+1|has an ending that names no sound file format: 123.|read audiofile -o FileName=123 -o Mode=write
+0|Frequency: 0.0047 Hz|info signal -o Frequency=4.7m -o BlockSize=4Ki
+1|Frequency: must be one number|info signal -o Frequency=1k,2
+2|brenix: option Frequency: not a number: 1x|info signal -o Frequency=1x
+2|option Gain: not a number: nothing|read signal -f 'scale Gain='
+2|option Timeout: not a number: long|read signal --open-option Timeout=long
+0|read 1200 counts|read signal -o Pace=fast -n 1.2k -r 1M --limit 4Ki -w kilo.csv
+2|--block: 2Mi is not a whole number from 1 to 1048576|write loopback -b 2Mi
+2|foo is no command: there are plugins, check, info, read, write, scope|foo
+2|a command is missing: there are plugins|''
+2|--nonsense; see brenix read --help|read signal --nonsense
+0|Usage: brenix write|help write
+1|line 2: not a number of type double: \x1b[31m\xc2\x9bä\xff|write loopback -i escapes.csv
+1|brenix:Device:failed: failed in run; also: |write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
+1|brenix:InputStream:couldNotConvertInputData: 13 is refused|read $plugins/probe.so -c $plugins/pickyConverter.so -o Packets:int32=5,15 -w refused.csv
 1|Field none has no elements|read $plugins/probe.so -o Packets:int32=2,3,-4 -w kept.csv
 2|--counts: 1.5 is not a whole number of at least 1|read signal -n 1.5
 2|--limit: 0.5 is not a whole number of at least 1|read signal -n 1 --limit 0.5
@@ -102,6 +123,28 @@ if [[ $got -ne 1 ]] || ! grep -q 'is it installed' out; then
     fail "scope without gnuplot: exit code $got"
 fi
 file picture.png | grep -q 'PNG image data' || fail "picture.png is no picture"
+
+# A picture of few samples has a part of the trace in each of its 79 columns, and some more at its steps.
+brenix scope signal -o Waveform=ramp -o SampleRate=8 -o Frequency=1 -o BlockSize=8 -o Pace=fast -n 8 >picture
+[[ $(LC_ALL=C.UTF-8 grep -o '[█▀▄]' picture | wc -l) -eq 89 ]] || fail "scope of few samples: $(cat picture)"
+
+# On a terminal a picture fits the screen, keys are not echoed, and the terminal is left as it was.
+while IFS='|' read -r columns keys shown arguments; do
+    rm -f terminal
+    got=0
+    {
+        while ! grep -qs $'\e\[J' terminal; do sleep 0.1; done
+        printf '%b' "$keys"
+    } | timeout -k 5 20 script -qefc "stty rows 24 cols $columns; stty -g >before
+        brenix scope signal $arguments && stty -g | cmp before -" terminal >/dev/null || got=$?
+    if [[ $got -ne 0 ]] || ! grep -qF "$shown" terminal || grep -qE 'xy|\^C' terminal ||
+        ! awk 'BEGIN { RS = "\033\\[J" } lines > 24 { exit 1 } { lines = gsub("\n", "") }' terminal; then
+        fail "scope on $columns columns, keys $keys: exit code $got: $(cat -v terminal)"
+    fi
+done <<'END'
+80|xyq|11 of 12 channels|-o Channels=12
+1|\003|RMS|-o Channels=2
+END
 
 # What an interrupted read has read is complete.
 got=0
@@ -209,17 +252,14 @@ done
 
 # Floating-point WAV has the levels of integers, from the command and from its program.
 printf '0.5\n-0.25\n1.5\n' | "${write[@]}" -o FileName=loud.wav
-write=(brenix write udp -o Host=127.0.0.1 -o Port=27111 -o ElementType=int16 -t int16 -i loud.wav -q)
-"${write[@]}" --emit-c program.c
+timeout 20 brenix read udp -o ElementType=int16 -n 6 -w levels.csv 2>told &
+while kill -0 $! && ! grep -qs LocalPort told; do sleep 0.02; done
+brenix write udp -o Host=127.0.0.1 -o "Port=$(sed -n 's/^udp: LocalPort //p' told)" -o ElementType=int16 -t int16 \
+    -i loud.wav -q --emit-c program.c
 compile
-for sender in "${write[*]}" ./program; do
-    timeout 20 brenix read udp -o LocalPort=27111 -o ElementType=int16 -n 3 -q -w levels.csv &
-    while kill -0 $! 2>/dev/null; do
-        $sender
-        sleep 0.02
-    done
-    [[ $(tr '\n' ' ' <levels.csv) == 'data 16384 -8192 32767 ' ]] || fail "levels of: $sender: $(cat levels.csv)"
-done
+./program
+wait $! || true
+[[ $(tr '\n' ' ' <levels.csv) == 'data 16384 -8192 32767 16384 -8192 32767 ' ]] || fail "levels: $(cat told levels.csv)"
 
 # They tell what is wrong in their input, and keep what came before an error of the device.
 brenix write loopback -q -t int8 -i samples.csv --emit-c program.c
@@ -242,12 +282,17 @@ done
 printf '\xEF\xBB\xBF1,2\n' >marked.csv
 printf '\xEF\xBB\xBF\na,info\n1,2\n' >names.csv
 for file in marked.csv names.csv; do ./program $file || fail "the program of $file"; done
-brenix read "$plugins/probe.so" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
-sed -i 's/{2, 3, 4}/{2, 3, -4}/' program.c
-compile
-if ./program broken.csv 2>errors || ! cmp broken.csv kept.csv; then
-    fail "the program of a device that fails: $(cat errors)"
-fi
+while read -r converter last message; do
+    brenix read "$plugins/probe.so" -c "$converter" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
+    sed -i "s/{2, 3, 4}/{2, 3, $last}/" program.c
+    compile
+    if ./program broken.csv 2>errors || ! cmp broken.csv kept.csv || ! grep -q "$message" errors; then
+        fail "the program with a packet $last: $(cat errors)"
+    fi
+done <<END
+identity -4 brenix:Device:failed: Field none
+$plugins/pickyConverter.so 9 couldNotConvertInputData: 13 is refused
+END
 
 # Samples arrive as they were: a file of each format, through pipes.
 brenix read "${signal[@]}" -n 3000 --format raw -q >samples.raw

@@ -2,7 +2,7 @@
 #ifndef BRENIX_TOOLS_CHANNEL_HPP
 #define BRENIX_TOOLS_CHANNEL_HPP
 
-#include "Values.hpp"
+#include "Options.hpp"
 
 #include <cstddef>
 #include <functional>
@@ -14,9 +14,6 @@
 
 namespace brenix
 {
-
-/// What an option list of a command line can have at most.
-constexpr std::size_t maxOptions = 16;
 
 /// A failed call of the library, an error of the device, or what else ends a command with exit code 1.
 class Failure : public std::runtime_error
@@ -46,19 +43,15 @@ std::optional<Failure> caught(const std::function<void()>& work);
 struct ChannelSettings {
     std::string device;
     std::string converter = "identity";
-    std::vector<std::string> options;     ///< of init, as parseOption() takes them
+    std::vector<std::string> options;     ///< of init, as parseOptions() takes them
     std::vector<std::string> openOptions; ///< of open
     std::vector<std::string> filters;     ///< each a plug-in and its options, with spaces
     double inputLimit = 65536;
     double outputLimit = 65536;
 };
 
-struct FilterSettings {
-    std::string name;
-    std::vector<Option> options;
-};
-FilterSettings parseFilter(const std::string& text);
-std::vector<Option> parseOptions(const std::vector<std::string>& texts);
+/// What a command does with a channel.
+enum class Use { Look, Read, Write };
 
 /// One field of the buffers of an input stream.
 struct Field {
@@ -71,8 +64,9 @@ struct Field {
 class Channel
 {
 public:
-    /// Creates and initialises a channel. The filters go to its input or its output stream.
-    Channel(const ChannelSettings& settings, bool filterOutput);
+    /// Creates and initialises a channel, with the filters for the stream that is used: the input, but
+    /// when writing. Throws when there is no stream to read or to write.
+    Channel(const ChannelSettings& settings, Use use);
     Channel(const Channel&) = delete;
     Channel& operator=(const Channel&) = delete;
     ~Channel();
@@ -113,6 +107,7 @@ public:
     void readField(Field& field, double counts);
 
 private:
+    void initialise(const ChannelSettings& settings, Use use);
     void release() noexcept;
 
     using Copy = std::function<int(std::size_t capacity, void* destination)>;
