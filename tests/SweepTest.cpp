@@ -35,9 +35,9 @@ bool isOutOfMemory(const std::string& error)
         "brenix:OutputStream:couldNotConvertOutputData|",
         "brenix:Device:failed|std::bad_alloc",
         "brenix:Stream:filterFailed|std::bad_alloc",
-        "brenix:Stream:dataLost|The device ended and did not take 8 counts: std::bad_alloc",
     };
-    return std::find(std::begin(errors), std::end(errors), error) != std::end(errors);
+    return std::find(std::begin(errors), std::end(errors), error) != std::end(errors) ||
+           error.rfind("brenix:Stream:dataLost|", 0) == 0; // of a device that failed so
 }
 
 /// Like allocations::sweep(), of points that leave no memory behind.

@@ -6,6 +6,7 @@
 
 #include <exception>
 #include <stdexcept>
+#include <string_view>
 #include <utility>
 
 namespace brenixcore
@@ -16,20 +17,22 @@ using brenixplugin::PropertyMap;
 namespace
 {
 
-/// The core's own property: why the last operation that failed did so.
-constexpr const char* reasonName = "Reason";
+// The core's own properties.
+constexpr const char* reasonName = "Reason";   ///< why the last operation that failed did so
+constexpr const char* lostName = "LostCounts"; ///< of the input stream, since open
 
-/// The core's own option: how long reads and writes wait, in seconds. The device gets the others.
-std::optional<double> takeTimeout(PropertyMap& optionMap)
+Overflow overflowOf(const std::string& policy)
 {
-    constexpr const char* name = "Timeout";
-    plugin::Options options(optionMap);
-    const std::optional<double> seconds = options.number(name);
-    if (seconds && *seconds < 0) {
-        plugin::Options::fail(name, "must be 0 or more seconds");
+    constexpr std::pair<std::string_view, Overflow> policies[] = {
+        {"wait", Overflow::Wait},
+        {"dropOldest", Overflow::DropOldest},
+        {"dropNewest", Overflow::DropNewest}};
+    for (const auto& [name, overflow] : policies) {
+        if (policy == name) {
+            return overflow;
+        }
     }
-    optionMap.erase(name);
-    return seconds;
+    plugin::Options::fail("Overflow", "must be wait, dropOldest or dropNewest, not " + policy);
 }
 
 const char* nameOf(State state)
@@ -50,6 +53,22 @@ const char* nameOf(State state)
 }
 
 } // namespace
+
+CoreOptions::CoreOptions(PropertyMap& optionMap)
+{
+    plugin::Options options(optionMap);
+    timeout = options.number("Timeout");
+    if (timeout && *timeout < 0) {
+        plugin::Options::fail("Timeout", "must be 0 or more seconds");
+    }
+    if (const auto policy = options.text("Overflow")) {
+        overflow = overflowOf(*policy);
+    }
+    stamps = options.logical("Stamps");
+    for (const char* const name : {"Timeout", "Overflow", "Stamps"}) {
+        optionMap.erase(name);
+    }
+}
 
 // --- The device's life ---
 
@@ -74,7 +93,8 @@ void Channel::Impl::init(const PropertyMap& options, PropertyMap& properties)
 {
     require(state != State::Open, "init");
     PropertyMap deviceOptions = options;
-    const double timeout = takeTimeout(deviceOptions).value_or(10);
+    CoreOptions coreOptions(deviceOptions);
+    coreOptions.timeout = coreOptions.timeout.value_or(10);
     if (state == State::Initialised || state == State::Closed) {
         terminateDevice();
     }
@@ -88,12 +108,16 @@ void Channel::Impl::init(const PropertyMap& options, PropertyMap& properties)
     const plugin::DeviceInfo info = device.object->init(deviceOptions, delivered.map, *this);
     try {
         auto newInput = makeStream<InputStream>(info.input, inputLimit);
-        auto newOutput = makeStream<OutputStream>(info.output, outputLimit);
+        auto newOutput = makeStream<OwningOutputStream>(info.output, outputLimit);
         for (const auto& property : delivered.map) {
             names.insert(property.first);
         }
-        if (!names.contains(reasonName)) { // or else it is one of the device's own
+        // The core's, where they are none of the device's own.
+        if (!names.contains(reasonName)) {
             plugin::publish(delivered.map, reasonName, std::string());
+        }
+        if (info.input && !names.contains(lostName)) {
+            plugin::publish(delivered.map, lostName, std::uint64_t{0});
         }
         input = std::move(newInput);
         output = std::move(newOutput);
@@ -101,9 +125,10 @@ void Channel::Impl::init(const PropertyMap& options, PropertyMap& properties)
         terminateDevice();
         throw;
     }
-    forEachStream([&](Stream::Impl& stream) { stream.queue.setTimeout(timeout); });
+    useOptions(coreOptions);
     state = State::Initialised;
     keepsReason = !names.contains(reasonName);
+    keepsLost = input && !names.contains(lostName);
 
     // From here on nothing fails. What takes the place of an earlier property goes into the
     // caller's map, and the earlier one out with the rest.
@@ -115,19 +140,29 @@ void Channel::Impl::init(const PropertyMap& options, PropertyMap& properties)
     propertyNames.swap(names); // updates may come
 }
 
+void Channel::Impl::useOptions(const CoreOptions& options)
+{
+    forEachStream([&](Stream::Impl& stream) {
+        if (options.timeout) {
+            stream.queue.setTimeout(*options.timeout);
+        }
+        if (options.overflow) {
+            stream.queue.setOverflow(*options.overflow);
+        }
+        stream.stamps = options.stamps.value_or(stream.stamps);
+    });
+}
+
 void Channel::Impl::open(const PropertyMap& options)
 {
     require(state == State::Initialised || state == State::Closed, "open");
     PropertyMap deviceOptions = options;
-    const std::optional<double> timeout = takeTimeout(deviceOptions);
+    const CoreOptions coreOptions(deviceOptions);
     device.object->open(deviceOptions);
-    forEachStream([&](Stream::Impl& stream) {
-        stream.queue.setPhase(Phase::Open);
-        if (timeout) {
-            stream.queue.setTimeout(*timeout);
-        }
-    });
+    useOptions(coreOptions);
+    forEachStream([](Stream::Impl& stream) { stream.queue.setPhase(Phase::Open); });
     try {
+        updateLostCounts();
         worker = std::thread([this] { runDevice(); });
     } catch (...) {
         forEachStream([](Stream::Impl& stream) { stream.queue.setPhase(Phase::Closed); });
@@ -178,6 +213,17 @@ Channel::Impl::~Impl()
             terminateDevice();
         }
     } catch (...) { // nor of this
+    }
+}
+
+void Channel::Impl::updateLostCounts()
+{
+    const std::lock_guard lock(handlerMutex);
+    if (handler != nullptr &&
+        keepsLost) { // the sum under the lock, or an older one could come later
+        auto property = plugin::makeScalar(lostName, input->impl->queue.getLost());
+        handler->onPropertyUpdate(property.get());
+        property.release();
     }
 }
 

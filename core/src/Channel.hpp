@@ -4,7 +4,7 @@
 #include "brenixcore/Channel.hpp"
 
 #include "Plugin.hpp"
-#include "Reason.hpp"
+#include "Reporter.hpp"
 #include "Stream.hpp"
 #include "Trace.hpp"
 
@@ -22,11 +22,19 @@
 namespace brenixcore
 {
 
+/// The core's own options; what is not given is nothing.
+struct CoreOptions {
+    /// Takes them out of the map.
+    explicit CoreOptions(brenixplugin::PropertyMap& optionMap);
+
+    std::optional<double> timeout; ///< of the caller's waits, in seconds
+    std::optional<Overflow> overflow;
+    std::optional<bool> stamps;
+};
+
 enum class State { Created, Initialised, Open, Closed, Terminated };
 
-struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost,
-                                                 plugin::DeviceStreams,
-                                                 ReasonKeeper {
+struct BRENIXCORE_INTERNAL Channel::Impl final : Reporter, plugin::DeviceStreams {
     Impl(const std::string& devicePath, plugin::Converter& channelConverter,
          IEventHandler& eventHandler, unsigned long firstLimit, unsigned long secondLimit)
         : converter(channelConverter), inputLimit(firstLimit), outputLimit(secondLimit),
@@ -47,13 +55,16 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost,
     bool isClosing() const override;
     void refuseOutput() override;
     void endInput() override;
+    void tellLost(std::uint64_t counts, const char* reason) override;
+    std::uint64_t takenCounts() const override;
 
     bool enter(plugin::Packet& packet, bool waits);
     std::optional<plugin::Packet> leave(bool waits);
 
     /// What the device's thread does.
     void runDevice() noexcept;
-    void tellWhatIsLeft(const std::string& failure);
+    template <typename Tell>
+    void tellLoss(const Tell& tell) noexcept;
 
     /// Refuses an operation in a state in which it has no meaning.
     void require(bool allowed, const char* operation) const;
@@ -73,9 +84,11 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost,
     template <typename Direction>
     std::unique_ptr<Direction> makeStream(const std::optional<plugin::StreamInfo>& info,
                                           std::uint64_t limit);
+    void useOptions(const CoreOptions& options);
     void stopDevice(Phase phase);
     void terminateDevice();
 
+    void updateLostCounts() override;
     void keepReason(const std::string& reason) noexcept override;
 
     // The libraries outlive everything that their code made.
@@ -91,6 +104,7 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost,
     std::set<std::string, std::less<>> propertyNames; ///< that init delivered
 
     // Used on the caller's thread.
+    bool keepsLost = false;    ///< once init has delivered the property, as below
     bool keepsReason = false;  ///< once init has delivered the property
     std::exception_ptr raised; ///< by which the device's error leaves the operation that runs
     State state = State::Created;

@@ -91,7 +91,7 @@ bool Channel::Impl::enter(plugin::Packet& packet, bool waits)
         throw std::invalid_argument("The device pushed a packet without counts.");
     }
     requireWhole(packet);
-    return input->impl->push(packet, waits, *this);
+    return input->impl->push(packet, waits);
 }
 
 std::optional<plugin::Packet> Channel::Impl::pull()
@@ -135,6 +135,20 @@ void Channel::Impl::endInput()
     }
 }
 
+void Channel::Impl::tellLost(std::uint64_t counts, const char* reason)
+{
+    if (input && counts > 0) {
+        const bool isNamed = reason != nullptr && *reason != '\0';
+        input->impl->queue.lose(counts, isNamed ? reason : "the device lost them");
+        updateLostCounts();
+    }
+}
+
+std::uint64_t Channel::Impl::takenCounts() const
+{
+    return input ? input->impl->queue.takenCounts() : 0;
+}
+
 // --- The device's thread ---
 
 void Channel::Impl::runDevice() noexcept
@@ -149,21 +163,34 @@ void Channel::Impl::runDevice() noexcept
         }
     } catch (...) { // the handler threw on a thread where it must not, or memory is out
     }
+    tellLoss([&] {
+        if (input) {
+            input->impl->tellLosses(true);
+        }
+    });
     forEachStream([](Stream::Impl& stream) { stream.queue.setDeviceDone(); });
-    try {
-        tellWhatIsLeft(failure);
-    } catch (...) { // as above
+    const std::uint64_t left = output ? output->impl->queue.discardRest() : 0;
+    if (left > 0) {
+        tellLoss([&] {
+            const std::string message = "The device ended and did not take " +
+                                        std::to_string(left) + " counts" +
+                                        (failure.empty() ? "." : ": " + failure);
+            raise("error", "brenix:Stream:dataLost", message.c_str());
+        });
     }
 }
 
-void Channel::Impl::tellWhatIsLeft(const std::string& failure)
+template <typename Tell>
+void Channel::Impl::tellLoss(const Tell& tell) noexcept
 {
-    const std::uint64_t left = output ? output->impl->queue.discardRest() : 0;
-    if (left > 0) {
-        raise("error", "brenix:Stream:dataLost",
-              ("The device ended and did not take " + std::to_string(left) + " counts" +
-               (failure.empty() ? "." : ": " + failure))
-                  .c_str());
+    try {
+        try {
+            tell();
+        } catch (const std::bad_alloc&) {
+            raise("error", "brenix:Stream:dataLost",
+                  "Counts were lost, and there is no memory to tell how many.");
+        }
+    } catch (...) { // the handler threw
     }
 }
 

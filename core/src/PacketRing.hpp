@@ -1,10 +1,11 @@
 #ifndef BRENIXCORE_SRC_PACKETRING_HPP
 #define BRENIXCORE_SRC_PACKETRING_HPP
 
-#include "brenixcore/plugin/Packet.hpp"
+#include "Packets.hpp"
 
 #include <algorithm>
 #include <bit>
+#include <cmath>
 #include <cstddef>
 #include <cstdint>
 #include <optional>
@@ -20,9 +21,26 @@ struct QueuedPacket {
 
     plugin::Packet packet;
     std::uint64_t taken = 0;
+    std::uint64_t index = 0;   ///< of the packet's first count, from open on
+    double period = 0;         ///< nanoseconds of a count; 0: not known
+    std::uint32_t opening = 0; ///< from which it is
     bool converted = false;
 
     std::uint64_t counts() const { return packet.counts - taken; }
+
+    /// The next `length` counts, copied.
+    QueuedPacket part(std::uint64_t length) const
+    {
+        QueuedPacket result(slice(packet, taken, length));
+        if (packet.time != 0) {
+            result.packet.time = packet.time + std::llround(period * static_cast<double>(taken));
+        }
+        result.index = index + taken;
+        result.opening = opening;
+        result.period = period;
+        result.converted = converted;
+        return result;
+    }
 };
 
 /// Packets in a row, in one piece of memory, which is quick to walk. Only reserve() can fail.
@@ -32,6 +50,10 @@ public:
     bool empty() const { return length == 0; }
     std::size_t size() const { return length; }
     QueuedPacket& operator[](std::size_t i) { return *slot(i); }
+    const QueuedPacket& operator[](std::size_t i) const
+    {
+        return *slots[(first + i) & (slots.size() - 1)];
+    }
 
     /// Makes room for so many more packets. Gives memory back of which little is needed.
     void reserve(std::size_t more)

@@ -17,6 +17,9 @@ void Queue::setPhase(Phase newPhase)
     phase = newPhase;
     if (phase == Phase::Open) {
         deviceDone = false;
+        ++opening;
+        numbered = 0;
+        losses.clear();
     }
     changed.notify_all();
 }
@@ -93,23 +96,143 @@ const char* Queue::reason() const
 
 bool Queue::awaitTurn(Lock& lock, bool waits)
 {
+    const auto isFree = [&] { return !pending || overflow != Overflow::Wait; };
     if (waits) {
-        waitUntil(lock, [&] { return !pending || phase != Phase::Open; });
+        waitUntil(lock, [&] { return isFree() || phase != Phase::Open; });
     }
-    return !pending && takesPart();
+    return isFree() && takesPart();
 }
 
-void Queue::bring(Lock& lock, plugin::Packet&& packet)
+bool Queue::bring(Lock& lock, plugin::Packet&& packet, double period)
 {
+    if (losses.isFrontPassed()) {
+        losses.endAtFront();
+    }
+    if (const std::uint64_t lost = std::exchange(packet.lost, 0); lost > 0) {
+        losses.addAtEnd(lost, "the device lost them");
+        numbered += lost;
+    }
     if (packet.counts > 0) {
-        pending.emplace(std::move(packet));
-        refill();
+        QueuedPacket queued(std::move(packet));
+        queued.index = numbered;
+        queued.opening = opening;
+        queued.period = period;
+        numbered += queued.counts();
+        if (overflow == Overflow::Wait) {
+            losses.endAtEnd();
+            pending = std::move(queued);
+            refill();
+        } else {
+            if (pending) { // since an opening that waited
+                dropFor(*std::exchange(pending, std::nullopt));
+            }
+            dropFor(std::move(queued));
+        }
     }
     const bool ends = wanted > 0 && getCounts() >= wanted; // the wait of a read
+    const bool isNews = losses.hasNews();
     lock.unlock();
     if (ends) {
         changed.notify_all();
     }
+    return isNews;
+}
+
+void Queue::dropFor(QueuedPacket&& packet)
+{
+    constexpr const char* reason = "the input stream was full";
+    packets.reserve(1 + held);
+    const std::uint64_t present = getCounts();
+    const std::uint64_t brought = packet.counts();
+    if (overflow == Overflow::DropOldest) {
+        const std::uint64_t beyond = brought > limit ? brought - limit : 0; // of this packet
+        if (!fits(brought)) {
+            dropOldest(std::min(present, present + (brought - beyond) - limit));
+        }
+        if (beyond > 0) {
+            losses.addAtFront(beyond, reason);
+            packet.taken += beyond;
+        }
+    } else if (!fits(brought)) {
+        // A part has room where the whole never would: beyond the limit, or for a read that waits.
+        const std::uint64_t room = limit - std::min(limit, present);
+        const bool divides = room > 0 && (brought > limit || wanted > present);
+        if (divides) {
+            losses.endAtEnd();
+            packets.pushBack(packet.part(room));
+            change(room);
+        }
+        losses.addAtEnd(brought - (divides ? room : 0), reason);
+        return;
+    }
+    losses.endAtEnd();
+    if (packet.counts() > 0) {
+        change(packet.counts());
+        packets.pushBack(std::move(packet));
+    }
+}
+
+void Queue::dropOldest(std::uint64_t count)
+{
+    losses.addAtFront(count, "the input stream was full");
+    change(-count);
+    while (count > 0) {
+        QueuedPacket& front = packets[0];
+        const std::uint64_t part = std::min(count, front.counts());
+        front.taken += part;
+        if (front.counts() == 0) {
+            packets.popFront();
+        }
+        count -= part;
+    }
+}
+
+std::uint64_t Queue::takenCounts() const
+{
+    const std::lock_guard guard(mutex);
+    if (inHand != none) {
+        return inHand;
+    }
+    const QueuedPacket* const next = !packets.empty() ? &packets[0] : pending ? &*pending : nullptr;
+    return next == nullptr ? numbered : positionOf(*next);
+}
+
+std::uint64_t Queue::positionOf(const QueuedPacket& packet) const
+{
+    return packet.opening == opening ? packet.index + packet.taken : 0;
+}
+
+void Queue::lose(std::uint64_t count, const char* reason)
+{
+    const std::lock_guard guard(mutex);
+    if (reason == nullptr) {
+        losses.addTold(count);
+    } else {
+        losses.addAtEnd(count, reason);
+    }
+    numbered += count;
+}
+
+void Queue::loseTaken(std::uint64_t count)
+{
+    const std::lock_guard guard(mutex);
+    losses.addTold(count);
+}
+
+std::uint64_t Queue::getLost() const
+{
+    const std::lock_guard guard(mutex);
+    return losses.getSum();
+}
+
+std::optional<std::vector<Gap>> Queue::takeNews(bool atEnd)
+{
+    const std::lock_guard guard(mutex);
+    if (atEnd) {
+        losses.endAtFront();
+        losses.endAtEnd();
+    }
+    return losses.hasNews() ? std::optional(losses.takeNews()) : std::nullopt;
 }
 
 void Queue::refill()
@@ -130,7 +253,7 @@ void Queue::refill()
             packets.pushBack(*std::move(pending));
             pending.reset();
         } else {
-            packets.pushBack(QueuedPacket(slice(pending->packet, pending->taken, part)));
+            packets.pushBack(pending->part(part));
             pending->taken += part;
             if (pending->counts() == 0) {
                 pending.reset();
@@ -201,8 +324,21 @@ Queue::Packets Queue::take(std::uint64_t count)
         notifyDevice(lock);
         throw;
     }
-    notifyDevice(lock);
+    if (!taken.empty()) {
+        inHand = positionOf(taken[0]);
+        losses.passFront();
+    }
+    lock.unlock();
+    changed.notify_all(); // settle() wakes the device
     return taken;
+}
+
+void Queue::settle() noexcept
+{
+    inHand = none;
+    if (phase != Phase::Closed) { // which this thread alone changes
+        device.wake();
+    }
 }
 
 Queue::Packets Queue::takeAvailable(std::uint64_t count)
@@ -220,8 +356,7 @@ Queue::Packets Queue::takeAvailable(std::uint64_t count)
             QueuedPacket& front = packets[0];
             const std::uint64_t part = std::min(missing, front.counts());
             if (part < front.packet.counts) {
-                result.emplace_back(slice(front.packet, front.taken, part)).converted =
-                    front.converted;
+                result.push_back(front.part(part));
                 front.taken += part;
                 if (front.counts() == 0) {
                     packets.popFront();
@@ -322,6 +457,7 @@ void Queue::flush()
     last.swap(pending);
     held = 0;
     counts = 0;
+    losses.passFront();
     notifyDevice(lock);
 }
 

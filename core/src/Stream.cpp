@@ -1,36 +1,64 @@
 #include "Stream.hpp"
 
 #include "Packets.hpp"
+#include "brenixcore/plugin/Make.hpp"
 
 #include <algorithm>
 #include <chrono>
 #include <stdexcept>
 #include <string>
 #include <utility>
+#include <vector>
 
 namespace brenixcore
 {
 
 using brenixplugin::PropertyMap;
 
-bool Stream::Impl::push(plugin::Packet& packet, bool waits, plugin::DeviceHost& host)
+bool Stream::Impl::push(plugin::Packet& packet, bool waits)
 {
     Queue::Lock lock = queue.lock();
     if (!queue.awaitTurn(lock, waits)) {
         return false;
     }
+    const std::uint64_t brought = packet.counts;
     if (!filters.empty()) {
         lock.unlock();
         try {
             filters.apply(packet);
-        } catch (...) {
-            host.raise("error", "brenix:Stream:filterFailed", currentExceptionText().c_str());
-            return true; // without this packet
+        } catch (...) { // without this packet
+            const std::string reason = currentExceptionText();
+            queue.lose(packet.lost + brought, nullptr);
+            tellLosses(false);
+            reporter.raise("error", "brenix:Stream:filterFailed", reason.c_str());
+            return true;
         }
         lock.lock();
     }
-    queue.bring(lock, std::move(packet));
+    double period = 0;
+    if (info.rate > 0 && packet.counts > 0) { // filters change the number of counts, not their time
+        period =
+            1e9 / info.rate * static_cast<double>(brought) / static_cast<double>(packet.counts);
+    }
+    if (queue.bring(lock, std::move(packet), period)) {
+        tellLosses(false);
+    }
     return true;
+}
+
+void Stream::Impl::tellLosses(bool atEnd)
+{
+    const auto gaps = queue.takeNews(atEnd);
+    if (!gaps) {
+        return;
+    }
+    reporter.updateLostCounts();
+    for (const Gap& gap : *gaps) {
+        const std::string message = std::to_string(gap.counts) +
+                                    " counts were lost: " + gap.reason + "; " +
+                                    std::to_string(gap.sum) + " since open.";
+        reporter.raise("error", "brenix:Stream:dataLost", message.c_str());
+    }
 }
 
 void Stream::Impl::convert(plugin::Packet& packet,
@@ -44,7 +72,7 @@ void Stream::Impl::convert(plugin::Packet& packet,
     requireWhole(packet);
 }
 
-void Stream::Impl::convertAndFilter(Queue::Packets& outgoing)
+void Stream::Impl::send(Queue::Packets& outgoing, std::chrono::steady_clock::time_point begin)
 {
     try {
         std::uint64_t filtered = 0;
@@ -63,6 +91,7 @@ void Stream::Impl::convertAndFilter(Queue::Packets& outgoing)
     outgoing.erase(std::remove_if(outgoing.begin(), outgoing.end(),
                                   [](const QueuedPacket& queued) { return queued.counts() == 0; }),
                    outgoing.end());
+    queue.add(outgoing, begin);
 }
 
 // --- Both directions ---
@@ -79,7 +108,7 @@ bool Stream::isInput() const
 void Stream::addFilter(const std::string& filterName, const PropertyMap& options)
 {
     const OwnedOptions owned(options);
-    impl->reasons.explain([&] {
+    impl->reporter.explain([&] {
         if (isOpen()) {
             throw CannotAddFilterWhileOpen("Cannot add filter " + filterName +
                                            " while the channel is open.");
@@ -91,7 +120,7 @@ void Stream::addFilter(const std::string& filterName, const PropertyMap& options
 void Stream::tuneFilters(const PropertyMap& options)
 {
     const OwnedOptions owned(options);
-    impl->reasons.explain([&] { impl->filters.tune(options); });
+    impl->reporter.explain([&] { impl->filters.tune(options); });
 }
 
 void Stream::flush()
@@ -144,7 +173,7 @@ unsigned long InputStream::getCountDimension() const
 void InputStream::peekCounts(unsigned long limit, unsigned long& total,
                              std::vector<unsigned long>& counts)
 {
-    impl->reasons.explain([&] { impl->queue.list(limit, total, counts); });
+    impl->reporter.explain([&] { impl->queue.list(limit, total, counts); });
 }
 
 void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigned long& countRead)
@@ -157,11 +186,12 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
             if (!packets.empty()) {
                 queue.putBack(packets);
             }
+            queue.settle();
         }
         Queue& queue;
         Queue::Packets packets;
     };
-    stream.reasons.explain([&] {
+    stream.reporter.explain([&] {
         Taken taken{stream.queue, stream.queue.take(count)};
         buffers.reserve(taken.packets.size());
         for (auto current = taken.packets.begin(); current != taken.packets.end(); ++current) {
@@ -172,8 +202,17 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
                 stream.convert(current->packet, &plugin::Converter::convertInput);
                 current->converted = true;
             } catch (...) {
+                const std::string reason = currentExceptionText();
+                stream.queue.loseTaken(current->counts());
                 taken.packets.erase(current);
-                throw CouldNotConvertInputData(currentExceptionText());
+                stream.reporter.updateLostCounts();
+                throw CouldNotConvertInputData(reason);
+            }
+        }
+        if (stream.stamps) {
+            for (QueuedPacket& queued : taken.packets) {
+                plugin::setField(queued.packet, plugin::makeScalar("Index", queued.index));
+                plugin::setField(queued.packet, plugin::makeScalar("Time", queued.packet.time));
             }
         }
         for (QueuedPacket& queued : taken.packets) {
@@ -207,10 +246,8 @@ unsigned long OutputStream::getCountDimension() const
 
 unsigned long OutputStream::write(const std::vector<void*>& dataList)
 {
-    Impl& stream = *impl;
-    return stream.reasons.explain([&] {
-        const auto begin = stream.filters.empty() ? std::chrono::steady_clock::time_point()
-                                                  : std::chrono::steady_clock::now();
+    return impl->reporter.explain([&] {
+        const auto begin = std::chrono::steady_clock::now();
         Queue::Packets outgoing;
         outgoing.reserve(dataList.size());
         std::uint64_t written = 0; // counts as the caller wrote them
@@ -219,9 +256,31 @@ unsigned long OutputStream::write(const std::vector<void*>& dataList)
             written += outgoing.back().counts();
         }
         // First, so that neither the converter nor a filter sees twice what is refused and written again.
-        stream.queue.awaitRoom(written);
-        stream.convertAndFilter(outgoing);
-        stream.queue.add(outgoing, begin);
+        impl->queue.awaitRoom(written);
+        impl->send(outgoing, begin);
+        return written;
+    });
+}
+
+unsigned long OwningOutputStream::takeBuffers(std::vector<void*>& dataList)
+{
+    return impl->reporter.explain([&] {
+        const auto begin = std::chrono::steady_clock::now();
+        Queue::Packets outgoing;
+        outgoing.reserve(dataList.size());
+        std::uint64_t written = 0;
+        for (const void* buffer : dataList) {
+            written += countsOf(*static_cast<const PropertyMap*>(buffer));
+        }
+        impl->queue.awaitRoom(written); // the buffers are the caller's until here
+        for (void*& buffer : dataList) {
+            plugin::Packet packet{plugin::Fields(brenixplugin::OwnedDataBuffer(
+                static_cast<PropertyMap*>(std::exchange(buffer, nullptr))))};
+            packet.counts = countsOf(*packet.fields);
+            packet.fields.setChecked(true);
+            outgoing.emplace_back(std::move(packet));
+        }
+        impl->send(outgoing, begin);
         return written;
     });
 }

@@ -4,12 +4,15 @@
 #include "FilterChain.hpp"
 #include "Plugin.hpp"
 #include "Queue.hpp"
-#include "Reason.hpp"
+#include "Reporter.hpp"
 #include "brenixcore/Stream.hpp"
+#include "brenixplugin/BufferTaker.hpp"
 
+#include <chrono>
 #include <cstdint>
 #include <list>
 #include <optional>
+#include <vector>
 
 namespace brenixcore
 {
@@ -27,27 +30,42 @@ struct OwnedOptions {
 /// What both streams are: a queue, and what changes the packets on their way.
 struct BRENIXCORE_INTERNAL Stream::Impl {
     Impl(plugin::Device& device, plugin::Converter& streamConverter,
-         std::list<PluginLibrary>& libraries, ReasonKeeper& reasonKeeper, std::uint64_t limit,
+         std::list<PluginLibrary>& libraries, Reporter& channelReporter, std::uint64_t limit,
          plugin::StreamInfo streamInfo)
-        : converter(streamConverter), reasons(reasonKeeper), info(streamInfo), queue(device, limit),
-          filters(libraries)
+        : converter(streamConverter), reporter(channelReporter), info(streamInfo),
+          queue(device, limit), filters(libraries)
     {
     }
 
     /// For the device's thread; see plugin::DeviceStreams.
-    bool push(plugin::Packet& packet, bool waits, plugin::DeviceHost& host);
+    bool push(plugin::Packet& packet, bool waits);
+
+    /// On the device's thread: tells the gaps that ended, by events, and the sum of what was lost. At the end
+    /// of the device, all gaps.
+    void tellLosses(bool atEnd);
 
     /// Runs an operation of the converter. Throws when it does, or leaves the packet as it must not.
     void convert(plugin::Packet& packet, void (plugin::Converter::*operation)(plugin::Packet&));
 
-    /// Prepares what a write brings for the device. Throws CouldNotConvertOutputData.
-    void convertAndFilter(Queue::Packets& outgoing);
+    /// Converts, filters and queues what a write brings, which has room. Throws CouldNotConvertOutputData.
+    void send(Queue::Packets& outgoing, std::chrono::steady_clock::time_point begin);
 
     plugin::Converter& converter;
-    ReasonKeeper& reasons;
+    Reporter& reporter;
     const plugin::StreamInfo info;
+    bool stamps =
+        false; ///< whether what is read has the fields Index and Time; the caller's thread's
     Queue queue;
     FilterChain filters;
+};
+
+/// The output stream of a channel, which takes buffers over from those who know that it does.
+class BRENIXCORE_INTERNAL OwningOutputStream final : public OutputStream,
+                                                     public brenixplugin::interfaces::IBufferTaker
+{
+public:
+    using OutputStream::OutputStream;
+    unsigned long takeBuffers(std::vector<void*>& dataList) override;
 };
 
 } // namespace brenixcore

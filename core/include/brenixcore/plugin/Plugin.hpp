@@ -27,7 +27,7 @@ namespace brenixcore::plugin
 {
 
 /// The version of everything in this file. A plug-in made for another version is not loaded.
-constexpr std::uint32_t abiVersion = 1;
+constexpr std::uint32_t abiVersion = 2;
 
 /// How a device reports to its channel, from any thread, from its init() to its term().
 class BRENIXCORE_PLUGIN_SHARED DeviceHost
@@ -50,9 +50,10 @@ protected:
 class BRENIXCORE_PLUGIN_SHARED DeviceStreams
 {
 public:
-    /// Puts a packet of at least one count into the input stream, waiting while there is no room.
-    /// Its fields must be property objects of the classes of Visit.hpp. Returns false when the channel
-    /// is closing and the packet was dropped: there is no room, or no output left that it could answer.
+    /// Puts a packet of at least one count into the input stream, waiting while there is no room, unless the
+    /// option Overflow says that counts are then lost. Its fields must be property objects of the classes of
+    /// Visit.hpp. Returns false when the channel is closing and the packet was dropped: there is no room, or
+    /// no output left that it could answer.
     virtual bool push(Packet packet) = 0;
 
     /// Takes the next packet from the output stream, waiting for one. Returns nothing when the
@@ -80,6 +81,15 @@ public:
     /// that the device is done, and one that waits ends.
     virtual void endInput() = 0;
 
+    /// Says that the device lost counts behind those that it pushed last, and why, in a few words: where no
+    /// packet follows that could tell by its `lost`, or to give the reason.
+    virtual void tellLost(std::uint64_t counts, const char* reason) = 0;
+
+    /// How far the caller has come with the input stream: all counts before this number, from open and lost
+    /// ones included, were read, flushed or lost. wake() tells when it changes. For a device that keeps
+    /// its place elsewhere.
+    virtual std::uint64_t takenCounts() const = 0;
+
 protected:
     ~DeviceStreams() = default;
 };
@@ -87,6 +97,7 @@ protected:
 /// What a device has in one direction.
 struct StreamInfo {
     std::uint64_t countDimension = 1; ///< the dimension of the data along which it counts
+    double rate = 0;                  ///< counts a second of an input stream; 0: not known
 };
 
 /// The streams that a device has.

@@ -1,15 +1,16 @@
-#ifndef BRENIXCORE_SRC_REASON_HPP
-#define BRENIXCORE_SRC_REASON_HPP
+#ifndef BRENIXCORE_SRC_REPORTER_HPP
+#define BRENIXCORE_SRC_REPORTER_HPP
 
 #include "Plugin.hpp"
+#include "brenixcore/plugin/Plugin.hpp"
 
 #include <string>
 
 namespace brenixcore
 {
 
-/// Keeps why the last operation failed, where the caller finds it.
-class ReasonKeeper
+/// By which the streams and the device's side report to the caller: events, and the core's own properties.
+class Reporter : public plugin::DeviceHost
 {
 public:
     /// Runs an operation of the channel or of a stream, and keeps the text of what it throws.
@@ -24,8 +25,11 @@ public:
         }
     }
 
+    /// Gives the property of lost counts its value.
+    virtual void updateLostCounts() = 0;
+
 protected:
-    ~ReasonKeeper() = default;
+    ~Reporter() = default;
 
 private:
     virtual void keepReason(const std::string& reason) noexcept = 0;
