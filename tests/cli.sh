@@ -49,7 +49,7 @@ done <<END
 1|wrongFileType: ./text.so|check ./text.so
 1|missingDependency: it needs a library that does not load: libgone.so: cannot open|check ./needs.so
 1|notAPlugin|check ./other.so
-1|abiVersion: it has plug-in ABI version 999, needed is 1|check $plugins/otherAbiVersion.so
+1|abiVersion: it has plug-in ABI version 999, needed is |check $plugins/otherAbiVersion.so
 1|noFactory|check $plugins/noFactory.so
 1|factoryFailed: thrown by the factory|check $plugins/throwingFactory.so
 1|factoryFailed: the factory returned nothing|check $plugins/nullFactory.so
@@ -104,6 +104,7 @@ done <<END
 2|--rate: 0 is not a number above 0|read signal -n 1 -r 0
 1|a WAV file needs a whole number as sample rate|read signal -n 1 -r 44100.5 -w rate.wav
 1|does not load|plugins nosuch
+0|command set: from the next block on|plugins signal
 1|brenix: nosuch: notFound|plugins --names signal nosuch
 0|  Stamp  double in s: one for each packet|plugins $plugins/pickyConverter.so
 0|  Stamp  double in s: one for each packet|info $plugins/probe.so -c $plugins/pickyConverter.so
@@ -169,6 +170,8 @@ done
 # Completion offers what fits.
 # shellcheck source=/dev/null
 source "$source/tools/brenix.bash"
+# shellcheck disable=SC2317 # the completion calls it
+compopt() { :; }
 while IFS='|' read -r words offered; do
     eval "COMP_WORDS=(brenix $words)"
     COMP_CWORD=$((${#COMP_WORDS[@]} - 1))
@@ -178,6 +181,9 @@ done <<'END'
 read s|serial signal
 read signal -c ''|columns identity
 read signal -f ''|decimate scale
+read signal -o F|Frequency= Frames=
+read loopback -o ''|
+read loopback --field ''|data
 write loopback -t u|uint8 uint16 uint32 uint64
 check co|columns
 END

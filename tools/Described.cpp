@@ -81,7 +81,7 @@ std::string printed(const std::string& indent, const std::string& title,
     for (const DescribedValue& value : values) {
         const std::string option = optionOfType(value.type);
         text += indent + "  " + value.name + std::string(width + 2 - value.name.size(), ' ') +
-                (value.type.empty() ? "as before"
+                (value.type.empty() ? "type of the data"
                  : option.empty()   ? value.type
                                     : "as " + option + " says") +
                 (value.unit.empty() ? "" : " in " + value.unit);
