@@ -10,6 +10,7 @@
 #include <fstream>
 #include <limits>
 #include <map>
+#include <sstream>
 #include <string_view>
 
 namespace brenix
@@ -552,7 +553,8 @@ void save(const Settings& settings, std::string_view program, Values values)
 
 } // namespace
 
-void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties)
+void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties,
+              const std::string& fields)
 {
     Values values = commonValues(settings, settings.open, false);
     for (const PropertyValue& property : properties) {
@@ -578,6 +580,10 @@ void emitInfo(const Settings& settings, const std::vector<PropertyValue>& proper
     }
     if (properties.empty()) {
         values["PROPERTIES"] = "    (void)channel; /* it describes none */\n";
+    }
+    std::istringstream lines(fields);
+    for (std::string line; std::getline(lines, line);) {
+        values["PROPERTIES"] += "    puts(" + quote(line) + ");\n";
     }
     save(settings, infoProgram, values);
 }
@@ -622,6 +628,14 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
                 (frame.empty() ? "" : ", ") + row + (i == 0 ? "" : " + " + std::to_string(i)) + "]";
         }
     }
+    std::string repeat; // what is there once for a buffer
+    for (std::size_t f = 0; f < fields.size(); ++f) {
+        const std::string array = "field" + std::to_string(f + 1);
+        if (fields[f].isRepeated) {
+            repeat += "    for (int row = 1; row < counts; ++row) {\n        " + array +
+                      "[row] = " + array + "[0];\n    }\n";
+        }
+    }
     if (csv) {
         values["WRITE"] = "    for (int row = 0; row < counts; ++row) {\n" + printRow +
                           "        putc('\\n', file);\n    }\n    return !ferror(file);\n";
@@ -647,6 +661,7 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
     if (csv) {
         values["START"] += "    fputs(" + quote(csvHeader(fields)) + " \"\\n\", file);\n";
     }
+    values["WRITE"].insert(0, repeat);
     values["FIELDS"] += "\n";
     save(settings, std::string(readProgram).append(fileMain), values);
 }
