@@ -34,9 +34,10 @@ public:
                                          Base::flow_control::hardware};
         flowControl =
             controls.at(readChoice<3>(options, "FlowControl", {"none", "software", "hardware"}));
-        readFormat(options);
+        readOptions(options);
         options.requireAllKnown();
         host = &deviceHost;
+        source = peer;
         return {StreamInfo{}, StreamInfo{}};
     }
 

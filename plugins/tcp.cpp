@@ -32,10 +32,10 @@ public:
         }
         timeout = std::chrono::duration_cast<std::chrono::steady_clock::duration>(
             std::chrono::duration<double>(seconds));
-        readFormat(options);
+        readOptions(options);
         options.requireAllKnown();
         host = &deviceHost;
-        peer = hostName + ":" + portNumber;
+        source = peer = hostName + ":" + portNumber;
         return {StreamInfo{}, StreamInfo{}};
     }
 

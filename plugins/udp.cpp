@@ -55,12 +55,11 @@ public:
         if (peerHost.has_value() != peerPort.has_value()) {
             Options::fail(peerHost ? "Port" : "Host", "is missing: a peer has a host and a port");
         }
-        readFormat(options);
+        readOptions(options);
         options.requireAllKnown();
 
         host = &deviceHost;
         sends = peerHost.has_value();
-        peer = localHost + ":" + std::to_string(localPort);
         if (sends) {
             peer = *peerHost + ":" + std::to_string(*peerPort);
             const auto found = udp::resolver(context).resolve(local.protocol(), *peerHost,
@@ -71,6 +70,8 @@ public:
             port.peer = *found.begin();
         }
         bind(local);
+        source =
+            "datagrams to " + localHost + ":" + std::to_string(port.socket.local_endpoint().port());
         publish(properties, "LocalPort", port.socket.local_endpoint().port());
         return {StreamInfo{}, sends ? std::optional(StreamInfo{}) : std::nullopt};
     }

@@ -14,6 +14,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
+#include <sstream>
 #include <tuple>
 
 using namespace driver;
@@ -142,8 +143,7 @@ TEST(TcpTest, APeerThatClosesEndsTheDevice)
     Channel::waitUntil([&] { return channel.open(0.5) == 1; });
     channel.waitForEnd();
     EXPECT_EQ(channel.read(1, 1), Numbers{-1});
-    EXPECT_EQ(channel.asyncError(),
-              lost + "The last 3 bytes of the data from " + peer + " are no whole double.");
+    EXPECT_EQ(channel.asyncError(), lost + "3 bytes from " + peer + " are no whole double.");
     Channel::waitUntil([] { return readFile() == "\xC0\0\0\0\0\0\0\0"s; }); // only one side ended
 }
 
@@ -155,8 +155,9 @@ TEST(TcpTest, ClosingSendsWhatIsLeft)
     ASSERT_EQ(init(channel, "uint8"), 1);
     Channel::waitUntil([&] { return channel.open(0.5) == 1; });
     ASSERT_EQ(channel.write({1}), 1);
-    EXPECT_EQ(channel.asyncError(),
-              "brenix:Device:wrongType|Data to send must be uint8, but is double.");
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:wrongType|Data to send must be uint8, but is "
+                                    "double. 1 elements of another type were not sent to " +
+                                        peer + ".");
     const std::string data(8 << 20, 'x');
     ASSERT_EQ(writeBytes(channel, data), 1);
     EXPECT_EQ(channel.close(), 1);
@@ -184,34 +185,69 @@ TEST(TcpTest, NothingIsLostUnseenWhenThePeerEnds)
     }
 }
 
-TEST(TcpTest, AResetEndsEveryWait)
+TEST(TcpTest, AResetEndsEveryWaitAndTellsWhatIsLost)
 {
     Acceptor acceptor(context, any);
+    const int number = acceptor.local_endpoint().port();
+    const std::string name = host + ":" + std::to_string(number);
     for (const bool closes : {false, true}) {
         Channel channel("tcp", 10);
-        ASSERT_EQ(init(channel, "uint8", acceptor.local_endpoint().port()), 1);
+        ASSERT_EQ(init(channel, "uint8", number), 1);
         ASSERT_EQ(channel.open(infinity), 1);
         auto socket = acceptor.accept();
         asio::write(socket, asio::buffer(std::string(200, 'x'))); // fills the input
-        if (closes) {
-            EXPECT_EQ(writeBytes(channel, "x"), 1);
-        }
+        Channel::waitUntil(
+            [&] { return channel.ask(coderStreamGetDataAvailable, channel.input) == 10; });
+        const std::string block(closes ? 1 : 1 << 20, 'x');
+        std::size_t written = writeBytes(channel, block) == 1 ? block.size() : 0;
+        std::size_t taken = 0;
         std::thread reset([&] {
             std::this_thread::sleep_for(std::chrono::milliseconds(300));
+            taken = socket.available();
             socket.set_option(asio::socket_base::linger(true, 0));
             socket.close();
         });
+        double unpulled = 0;
         if (closes) {
             EXPECT_EQ(channel.close(), 1);
         } else {
-            while (writeBytes(channel, std::string(1 << 20, 'x')) == 1) {
+            for (; writeBytes(channel, block) == 1; written += block.size()) {
             }
             EXPECT_EQ(channel.error(), "brenix:OutputStream:synchronousOutputNotPossible|");
+            unpulled = channel.ask(coderStreamGetDataAvailable, channel.output);
             std::ignore = coderStreamFlush(channel.input); // the device waits for room no longer
         }
         reset.join();
-        EXPECT_NE(channel.asyncError().find(": Connection reset by peer"), npos);
+        std::ostringstream error;
+        error << "brenix:Device:failed|Transfer with " << name
+              << " failed: Connection reset by peer.";
+        if (const double unsent = double(written - taken) - unpulled; unsent > 0) {
+            error << ' ' << std::size_t(unsent) << " bytes were not sent to " << name << '.';
+        }
+        EXPECT_EQ(channel.asyncError(), error.str());
     }
+}
+
+TEST(TcpTest, ClosingTellsWhatFindsNoRoom)
+{
+    Acceptor acceptor(context, any);
+    const int number = acceptor.local_endpoint().port();
+    const std::string name = host + ":" + std::to_string(number);
+    Channel channel("tcp", 10);
+    ASSERT_EQ(channel.init({{"Host", host}, {"Port", number}, {"BlockSize", 10}}), 1);
+    ASSERT_EQ(channel.open(), 1);
+    auto socket = acceptor.accept();
+    std::string bytes(250, '\0');
+    std::iota(bytes.begin(), bytes.end(), '\0');
+    asio::write(socket, asio::buffer(bytes));
+    socket.shutdown(socket.shutdown_send);
+    ASSERT_EQ(writeBytes(channel, "x"), 1);
+    ASSERT_EQ(channel.close(), 1); // waits for the end of the input
+    double next = 0;
+    while (readOn(channel, next)) {
+    }
+    EXPECT_EQ(channel.asyncError(), lost + std::to_string(250 - int(next)) + " elements from " +
+                                        name + " found no room while the channel closed.");
 }
 
 TEST(TcpTest, TheExampleStreams)
@@ -254,7 +290,8 @@ TEST(UdpTest, DatagramsArePackets)
     }
     ASSERT_EQ(sender.open(), 1);
     EXPECT_EQ(receiver.read(3, 2), (Numbers{0, 0, 0}));
-    EXPECT_EQ(receiver.asyncError(), lost + "The last 3 bytes of a datagram are no whole double.");
+    EXPECT_EQ(receiver.asyncError(), lost + "6 bytes from datagrams to " + host + ":" +
+                                         std::to_string(local) + " are no whole double.");
     EXPECT_NE(sender.asyncError().find(lost + "70000 bytes were not sent to " + host + ":"), npos);
 }
 
