@@ -74,6 +74,16 @@ protected:
 private:
     friend class Transfer<ByteDevice>;
 
+    /// Calls the handler once the other side refuses output, where a port can tell without sending.
+    template <typename Handler>
+    void awaitRefusal(const Handler& handler)
+    {
+        if constexpr (requires { Port::wait_error; }) {
+            port.async_wait(Port::wait_error,
+                            [handler](const asio::error_code& /*error*/) { handler(); });
+        }
+    }
+
     /// Bytes sent that the other side, or the line, has not taken yet. Datagrams may stay behind.
     std::size_t queuedBySystem()
     {

@@ -63,6 +63,7 @@ private:
         const bool inputDone = inputEnded && !device.waiting;
         if (inputDone && !std::exchange(inputDoneTold, true)) {
             streams.endInput();
+            device.awaitRefusal([this] { lookForFailure(); });
         }
         const bool ends = inputDone && (failure || device.endsWithInput);
         if (device.sends && (failure || ends)) {
@@ -178,6 +179,14 @@ private:
         }
     }
 
+    void lookForFailure()
+    {
+        if (!over) {
+            fail(device.takeError());
+            advance();
+        }
+    }
+
     void tellLosses()
     {
         losses.before = device.lostBefore();
@@ -213,11 +222,7 @@ private:
         if (failure || isOver || patience.isOver(sent - queued)) {
             device.context.stop();
         } else {
-            endTicker.start(std::chrono::milliseconds(5), [this] {
-                if (!over) {
-                    advance();
-                }
-            });
+            endTicker.start(std::chrono::milliseconds(5), [this] { lookForFailure(); });
         }
     }
 

@@ -32,6 +32,7 @@ public:
         }
         timeout = std::chrono::duration_cast<std::chrono::steady_clock::duration>(
             std::chrono::duration<double>(seconds));
+        endsWithInput = readChoice<2>(options, "HalfClose", {"keep", "end"}) == 1;
         readOptions(options);
         options.requireAllKnown();
         host = &deviceHost;
@@ -103,6 +104,9 @@ constexpr OptionInfo optionTable[] = {
     elementTypeOption,
     byteOrderOption,
     blockSizeOption,
+    {"HalfClose", "text", "", "keep",
+     "when the other side ends its output: keep sends on until it refuses, end sends what is "
+     "queued and is done"},
     {"ConnectTimeout", "number", "seconds", "10",
      "for the connection, up to 86400; the system's look-up of the name is apart"},
     {},

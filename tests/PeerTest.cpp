@@ -169,19 +169,45 @@ TEST(TcpTest, NothingIsLostUnseenWhenThePeerEnds)
     Acceptor acceptor(context, any);
     for (int round = 0; round < 40; ++round) {
         Channel channel("tcp");
-        ASSERT_EQ(init(channel, "uint8", acceptor.local_endpoint().port()), 1);
-        ASSERT_EQ(channel.open(), 1);
+        channel.start(
+            {{"Host", host}, {"Port", acceptor.local_endpoint().port()}, {"HalfClose", "end"}});
         auto socket = acceptor.accept();
         socket.shutdown(socket.shutdown_send);
         std::size_t accepted = 0;
         while (writeBytes(channel, "x") == 1) { // until the device is done
-            ++accepted;
+            ASSERT_LT(++accepted, 100000);
         }
         EXPECT_EQ(channel.close(), 1);
         std::string got;
         asio::error_code end;
         asio::read(socket, asio::dynamic_buffer(got), end);
         ASSERT_EQ(got.size(), accepted);
+    }
+}
+
+TEST(TcpTest, OutputGoesOnWhenThePeerHasEndedItsOwn)
+{
+    Acceptor acceptor(context, any);
+    for (const bool refuses : {false, true}) {
+        Channel channel("tcp");
+        channel.start({{"Host", host}, {"Port", acceptor.local_endpoint().port()}});
+        auto socket = acceptor.accept();
+        socket.shutdown(socket.shutdown_send);
+        channel.waitForEnd();
+        uint8_t done = 0;
+        const std::string data(refuses ? 2 : 8 << 20, 'x');
+        std::string got(data.size() - refuses, '\0');
+        ASSERT_EQ(writeBytes(channel, data), 1);
+        asio::read(socket, asio::buffer(got));
+        if (refuses) {
+            socket.close();
+            Channel::waitUntil(
+                [&] { return coderStreamIsDeviceDone(channel.output, &done) == 1 && done == 1; });
+            EXPECT_EQ(channel.asyncError().find("brenix:Device:failed|Transfer with " + host), 0);
+        }
+        EXPECT_EQ(got, data.substr(refuses));
+        EXPECT_EQ(channel.close(), 1);
+        EXPECT_EQ(channel.error(coderChannelGetLastAsyncError), "|");
     }
 }
 
