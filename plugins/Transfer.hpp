@@ -37,7 +37,6 @@ public:
     void run()
     {
         device.context.restart();
-        tellLosses();
         awaitWakeUp();
         advance();
         device.context.run();

@@ -10,6 +10,7 @@
 #include <termios.h>
 #include <unistd.h>
 
+#include <array>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
@@ -319,6 +320,113 @@ TEST(UdpTest, DatagramsArePackets)
     EXPECT_EQ(receiver.asyncError(), lost + "6 bytes from datagrams to " + host + ":" +
                                          std::to_string(local) + " are no whole double.");
     EXPECT_NE(sender.asyncError().find(lost + "70000 bytes were not sent to " + host + ":"), npos);
+}
+
+TEST(UdpTest, ReadAndLostAreAllThatWereSent)
+{
+    Channel receiver("udp", 10);
+    ASSERT_EQ(receiver.init({{"LocalHost", host}, {"ReceiveBuffer", 4096}}), 1);
+    EXPECT_EQ(receiver.property<uint32_t>("ReceiveBuffer", "uint32"), 4096);
+    const auto local = receiver.property<uint16_t>("LocalPort", "uint16");
+    const auto countLost = [&] { return receiver.property<uint64_t>("LostDatagrams", "uint64"); };
+    asio::ip::udp::socket socket(context, {asio::ip::make_address(host), 0});
+    double sent = 0;
+    double read = 0;
+    const auto send = [&](int count) {
+        for (sent += count; count > 0; --count) {
+            socket.send_to(asio::buffer("x", 1), {asio::ip::make_address(host), local});
+        }
+    };
+    const auto readAll = [&] {
+        for (Numbers counts = receiver.peek(); !counts.empty(); counts = receiver.peek()) {
+            const double total = std::accumulate(counts.begin(), counts.end(), 0.0);
+            ASSERT_EQ(coderInputStreamReadBuffers(receiver.input, total, double(counts.size())), 1);
+            read += total;
+        }
+    };
+    uint64_t lostEarlier = 0;
+    const auto expectError = [&] {
+        const std::string error = receiver.asyncError(); // before the property is asked for
+        EXPECT_EQ(error, lost + std::to_string(countLost() - lostEarlier) + " datagrams to " +
+                             host + ":" + std::to_string(local) + " found no room.");
+    };
+
+    send(1000); // most find no room before the channel is open
+    ASSERT_EQ(receiver.open(), 1);
+    expectError();
+    Channel::waitUntil([&] {
+        readAll();
+        return read + double(countLost()) == sent;
+    });
+    EXPECT_GT(read, 0);
+
+    EXPECT_EQ(receiver.close(), 1);
+    ASSERT_EQ(receiver.open(), 1);
+    lostEarlier = countLost();
+    Channel::waitUntil([&] { // and now while it is
+        send(1);
+        return receiver.ask(coderStreamGetSpaceAvailable, receiver.input) == 0;
+    });
+    send(1000);
+    EXPECT_EQ(receiver.close(), 1);
+    expectError();
+    readAll();
+    EXPECT_EQ(receiver.term(), 1);
+    EXPECT_EQ(read + double(countLost()), sent);
+}
+
+TEST(UdpTest, OutputLeavesFromWhereItsPeerCanAnswer)
+{
+    const bool hasIpv6 = std::ifstream("/proc/net/if_inet6").peek() != EOF;
+    const std::string group = "239" + host.substr(host.find('.'));
+    const Option none{"ElementType", "double"};
+    const Option loopback{"Interface", "lo"};
+    const struct {
+        const char* name;
+        Option local, more, host;
+    } rows[] = {
+        {"nothing said", none, none, {"Host", "localhost"}},
+        {"broadcast", {"LocalHost", "0.0.0.0"}, none, {"Host", "127.255.255.255"}},
+        {"IPv6", {"LocalHost", "::1"}, none, {"Host", "::1"}},
+        {"multicast", {"Group", group}, loopback, {"Host", group}},
+    };
+    for (const auto& [name, local, more, peerHost] : rows) {
+        if (name == "IPv6"s && !hasIpv6) {
+            continue;
+        }
+        SCOPED_TRACE(name);
+        Channel receiver("udp");
+        receiver.start({none, local, more});
+        const int number = receiver.property<uint16_t>("LocalPort", "uint16");
+        Channel sender("udp");
+        sender.start({none, more, peerHost, {"Port", number}});
+        EXPECT_EQ(sender.write({7}), 1);
+        EXPECT_EQ(receiver.read(1, 1), Numbers{7});
+    }
+
+    // One that sees where output comes from, and one that receives on one interface only.
+    using asio::ip::udp, asio::ip::make_address_v4;
+    udp::socket outward(context, udp::v4());
+    asio::error_code isAlone; // nothing is sent
+    outward.connect({make_address_v4("192.0.2.1"), 9}, isAlone);
+    const std::string own = isAlone ? "127.0.0.1" : outward.local_endpoint().address().to_string();
+    udp::socket socket(context, udp::endpoint(udp::v4(), 0));
+    socket.non_blocking(true);
+    socket.set_option(
+        asio::ip::multicast::join_group(make_address_v4(group), make_address_v4("127.0.0.1")));
+    for (const bool multicasts : {false, true}) {
+        Channel sender("udp");
+        sender.start({none,
+                      multicasts ? loopback : none,
+                      {"Host", multicasts ? group : own},
+                      {"Port", socket.local_endpoint().port()}});
+        EXPECT_EQ(sender.write({7}), 1);
+        Channel::waitUntil([&] { return socket.available() > 0; });
+        std::array<char, 8> bytes{};
+        udp::endpoint from;
+        socket.receive_from(asio::buffer(bytes), from);
+        EXPECT_TRUE(multicasts || from.address().to_string() == own) << from.address();
+    }
 }
 
 TEST(UdpTest, APeerAnswers)
