@@ -66,6 +66,7 @@ protected:
     std::string peer;   ///< where output goes, for messages
     std::string source; ///< where input comes from, for messages
     bool sends = true;
+    bool losesUnseen = false;  ///< also while nothing arrives
     bool endsWithInput = true; ///< or else output goes on when the other side has ended its own
 
     /// For room in the input stream. A datagram waits for the next run, if there is none.

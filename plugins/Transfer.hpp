@@ -38,6 +38,7 @@ public:
     {
         device.context.restart();
         awaitWakeUp();
+        tellLossesSoon();
         advance();
         device.context.run();
         stop();
@@ -192,13 +193,13 @@ private:
         losses.tell();
     }
 
-    /// Waits a little, so that many are told as one.
+    /// Waits a little, so that many are told as one; and again while more may come unseen.
     void tellLossesSoon()
     {
         lossTicker.start(std::chrono::milliseconds(100), [this] {
             if (!over) {
                 tellLosses();
-                if (device.waiting) { // there may be more before anything is received
+                if (device.waiting || device.losesUnseen) {
                     tellLossesSoon();
                 }
             }

@@ -6,12 +6,17 @@
 #include <asio.hpp>
 
 #include <fcntl.h>
+#include <linux/serial.h>
+#include <sys/ioctl.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <termios.h>
 #include <unistd.h>
 
 #include <array>
+#include <atomic>
 #include <cmath>
+#include <cstdarg>
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
@@ -22,6 +27,8 @@ using namespace driver;
 
 namespace
 {
+
+std::atomic<int> framingErrors = -1; ///< that lines have had; less than 0 where nobody counts
 
 constexpr std::size_t npos = std::string::npos;
 asio::io_context context;
@@ -103,6 +110,22 @@ Numbers soxSamples(const std::string& soundFile)
 }
 
 } // namespace
+
+/// The system's, also for plug-ins, but that it counts for pseudo-terminals, too.
+extern "C" __attribute__((visibility("default"))) int ioctl(int handle, unsigned long request,
+                                                            ...) noexcept
+{
+    va_list rest;
+    va_start(rest, request);
+    void* const argument = va_arg(rest, void*);
+    va_end(rest);
+    if (request != TIOCGICOUNT || framingErrors < 0) {
+        return static_cast<int>(syscall(SYS_ioctl, handle, request, argument));
+    }
+    *static_cast<serial_icounter_struct*>(argument) = {};
+    static_cast<serial_icounter_struct*>(argument)->frame = framingErrors;
+    return 0;
+}
 
 TEST(TcpTest, SixtyFourMiBComeBackAndThenThePeerIsKilled)
 {
@@ -474,6 +497,22 @@ TEST(SerialTest, TwoPortsTalk)
         EXPECT_EQ(end->peek(), Numbers{});
     }
     std::remove(other.c_str());
+}
+
+TEST(SerialTest, ErrorsOfTheLineAreCounted)
+{
+    const Program line("socat PTY,link=" + file + " PTY");
+    framingErrors = 7; // before
+    Channel channel("serial");
+    ASSERT_EQ(channel.init({{"Port", file}}), 1);
+    Channel::waitUntil([&] { return channel.open() == 1; });
+    for (const unsigned int errors : {1U, 2U}) {
+        ++framingErrors;
+        EXPECT_EQ(channel.asyncError(),
+                  lost + "Line " + file + " had " + std::to_string(errors) + " framing errors.");
+        EXPECT_EQ(channel.property<uint64_t>("FramingErrors", "uint64"), errors);
+    }
+    framingErrors = -1;
 }
 
 TEST(AudioFileTest, WhatIsWrittenIsWhatSoxReads)
