@@ -69,6 +69,10 @@ constexpr OptionInfo elementTypeOption = {"ElementType", "text", "", "uint8",
 constexpr OptionInfo byteOrderOption = {"ByteOrder", "text", "", "little",
                                         "little or big: of the elements on their way"};
 
+/// What arrives and what is written.
+constexpr FieldInfo elementFields[] = {{dataField, "(ElementType)", "", "a count is an element"},
+                                       {}};
+
 /// What a property holds that is not what it should be.
 inline std::string describe(IPropertyInfo* property)
 {

@@ -175,3 +175,4 @@ constexpr PropertyInfo propertyTable[] = {
 BRENIXCORE_EXPORT_DEVICE(Serial)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
+BRENIXCORE_DESCRIBE_FIELDS(elementFields, elementFields)

@@ -116,3 +116,4 @@ constexpr OptionInfo optionTable[] = {
 
 BRENIXCORE_EXPORT_DEVICE(Tcp)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
+BRENIXCORE_DESCRIBE_FIELDS(elementFields, elementFields)
