@@ -12,6 +12,7 @@
 #include <algorithm>
 #include <array>
 #include <bit>
+#include <chrono>
 #include <cstdint>
 #include <cstring>
 #include <memory>
@@ -19,7 +20,6 @@
 #include <string>
 #include <string_view>
 #include <utility>
-#include <vector>
 
 namespace bytes
 {
@@ -34,25 +34,29 @@ using brenixplugin::kit::device::TScalarProperty;
 struct ElementType {
     std::string_view name;
     std::size_t size; ///< in bytes
-    OwnedProperty (*make)(const unsigned char* data, std::size_t count);
+    /// An array of so many elements, which are not set.
+    OwnedProperty (*make)(std::size_t count);
     /// The elements of an array of this type; nothing for any other property.
     std::optional<asio::mutable_buffer> (*find)(IPropertyInfo* property);
+    /// Leaves the first elements of an array of this type.
+    void (*shorten)(IPropertyInfo* property, std::size_t count);
 };
 
 template <typename T>
 constexpr ElementType elementType(std::string_view name)
 {
     return {name, sizeof(T),
-            [](const unsigned char* data, std::size_t count) {
-                std::unique_ptr<T[]> elements(new T[count]);
-                std::memcpy(elements.get(), data, count * sizeof(T));
-                return makeArray(dataField, std::move(elements), count);
+            [](std::size_t count) {
+                return makeArray(dataField, std::unique_ptr<T[]>(new T[count]), count);
             },
             [](IPropertyInfo* property) {
                 auto* const array = dynamic_cast<TPointerProperty<T>*>(property);
                 return array == nullptr ? std::nullopt
                                         : std::optional(asio::mutable_buffer(
                                               array->data, array->count * sizeof(T)));
+            },
+            [](IPropertyInfo* property, std::size_t count) {
+                static_cast<TPointerProperty<T>*>(property)->count = count;
             }};
 }
 
@@ -144,32 +148,50 @@ inline Format readFormat(Options& options)
     return {found, isBig != (std::endian::native == std::endian::big)};
 }
 
-/// Makes packets of whole elements from bytes that arrive in pieces.
+/// Makes packets of whole elements from bytes that arrive in pieces. They arrive in the array that is delivered,
+/// unless that would be mostly empty.
 class Assembler
 {
 public:
-    Assembler(Format elementFormat, std::size_t most) : format(elementFormat), buffer(most) {}
+    Assembler(Format elementFormat, std::size_t most)
+        : format(elementFormat), size(format.type->size), capacity(most / size)
+    {
+        renew();
+    }
 
     /// Where the next bytes go.
-    asio::mutable_buffer space() { return asio::buffer(buffer) + held; }
+    asio::mutable_buffer space() const { return buffer + held; }
 
     /// The elements that are whole with so many more bytes, if any; the rest waits for its other bytes.
     std::optional<Packet> take(std::size_t length)
     {
-        const std::size_t size = format.type->size;
         const std::size_t all = held + length;
-        held = all % size;
-        const std::size_t whole = all - held;
-        std::optional<Packet> packet;
-        if (whole > 0) {
-            if (format.reverses) {
-                reverseEach(buffer.data(), whole, size);
-            }
-            packet.emplace();
-            packet->counts = whole / size;
-            setField(*packet, format.type->make(buffer.data(), packet->counts));
-            std::copy_n(buffer.data() + whole, held, buffer.data());
+        const std::size_t counts = all / size;
+        if (counts == 0) {
+            held = all;
+            return std::nullopt;
         }
+        auto* const bytes = static_cast<unsigned char*>(buffer.data());
+        if (format.reverses) {
+            reverseEach(bytes, counts * size, size);
+        }
+        OwnedProperty delivered;
+        if (counts < capacity / 2) {
+            delivered = format.type->make(counts);
+            std::memcpy(format.type->find(delivered.get())->data(), bytes, counts * size);
+        } else {
+            delivered = std::move(array);
+            renew();
+        }
+        held = all - counts * size;
+        std::memmove(buffer.data(), bytes + counts * size, held);
+        format.type->shorten(delivered.get(), counts);
+        Packet packet;
+        packet.counts = counts;
+        packet.time = std::chrono::duration_cast<std::chrono::nanoseconds>(
+                          std::chrono::system_clock::now().time_since_epoch())
+                          .count();
+        setField(packet, std::move(delivered));
         return packet;
     }
 
@@ -177,9 +199,18 @@ public:
     std::size_t dropRest() { return std::exchange(held, 0); }
 
 private:
+    void renew()
+    {
+        array = format.type->make(capacity);
+        buffer = *format.type->find(array.get());
+    }
+
     const Format format;
-    std::vector<unsigned char> buffer;
-    std::size_t held = 0; ///< bytes at its beginning, of an element without its end
+    const std::size_t size; ///< of an element
+    const std::size_t capacity;
+    OwnedProperty array;
+    asio::mutable_buffer buffer; ///< its elements
+    std::size_t held = 0;        ///< bytes at its beginning, of an element without its end
 };
 
 } // namespace bytes

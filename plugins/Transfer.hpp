@@ -117,6 +117,7 @@ private:
         } else if (closing && !isDatagrams) {
             // Nobody makes room now, but the other side may have to send in order to receive.
             losses.noRoom += counts;
+            streams.tellLost(counts, nullptr);
             device.waiting.reset();
         }
     }

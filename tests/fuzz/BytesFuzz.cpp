@@ -140,7 +140,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
         Packet packet;
         const std::size_t elements = text.size() / other.size;
         packet.counts = elements;
-        setField(packet, other.make(reinterpret_cast<const unsigned char*>(text.data()), elements));
+        auto array = other.make(elements);
+        std::memcpy(other.find(array.get())->data(), text.data(), elements * other.size);
+        setField(packet, std::move(array));
         bench.output.insert(bench.output.begin(), std::move(packet));
         if (&other == &type) {
             toSend += whole(text, type.size, isBig);

@@ -82,7 +82,8 @@ public:
     virtual void endInput() = 0;
 
     /// Says that the device lost counts behind those that it pushed last, and why, in a few words: where no
-    /// packet follows that could tell by its `lost`, or to give the reason.
+    /// packet follows that could tell by its `lost`, or to give the reason. With a null reason they are only
+    /// counted, since an error of the device's own tells of them.
     virtual void tellLost(std::uint64_t counts, const char* reason) = 0;
 
     /// How far the caller has come with the input stream: all counts before this number, from open and lost
