@@ -4,7 +4,9 @@
 #include "brenixcore/plugin/Inspect.hpp"
 
 #include <array>
+#include <cstddef>
 #include <cstring>
+#include <numeric>
 #include <sstream>
 #include <string_view>
 #include <tuple>
@@ -199,7 +201,8 @@ double Channel::inputAvailable()
 {
     double available = 0;
     check(coderStreamGetDataAvailable(input, &available));
-    return available;
+    return std::accumulate(bufferCounts.begin() + static_cast<std::ptrdiff_t>(buffer),
+                           bufferCounts.end(), available);
 }
 
 bool Channel::isSupported(void* stream)
@@ -218,15 +221,20 @@ bool Channel::isDone(void* stream)
 
 double Channel::nextBuffer(double most)
 {
-    double total = 0;
-    double counts = 0;
-    double buffers = 1;
-    check(coderInputStreamPeek(input, &total, &counts, &buffers, most));
-    if (buffers == 0) {
-        return 0;
+    if (buffer == bufferCounts.size()) {
+        double total = 0;
+        double buffers = 256;
+        bufferCounts.resize(256);
+        buffer = 0;
+        const int peeked = coderInputStreamPeek(input, &total, bufferCounts.data(), &buffers, most);
+        bufferCounts.resize(peeked == 0 ? 0 : static_cast<std::size_t>(buffers));
+        check(peeked);
+        if (bufferCounts.empty()) {
+            return 0;
+        }
+        check(coderInputStreamReadBuffers(input, total, buffers));
     }
-    check(coderInputStreamReadBuffers(input, counts, 1));
-    return counts;
+    return bufferCounts[buffer++];
 }
 
 /// Copies a value of which nobody tells how many elements it has: they are as many as the smallest
@@ -273,7 +281,8 @@ std::optional<double> Channel::number(const std::string& name, const char* type)
 Channel::Copy Channel::fieldCopier(const Field& field) const
 {
     return [this, &field](std::size_t capacity, void* destination) {
-        return coderInputStreamReadBufferData(input, 1, 0, field.name.c_str(), field.type->name,
+        return coderInputStreamReadBufferData(input, static_cast<int>(buffer), 0,
+                                              field.name.c_str(), field.type->name,
                                               static_cast<int>(capacity), destination);
     };
 }

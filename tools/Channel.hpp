@@ -100,9 +100,10 @@ public:
     bool isSupported(void* stream);
     bool isDone(void* stream);
 
-    double inputAvailable(); ///< counts that the input stream has
+    double inputAvailable(); ///< counts that are there to be taken
 
     /// Takes the next buffer, or as much of it as `most` counts, if one is there. Returns its counts.
+    /// Buffers come from the stream many at once.
     double nextBuffer(double most);
 
     /// The fields of the buffer that was taken: those of the names given, or else Data1, Data2..., or
@@ -126,6 +127,8 @@ private:
     void* input = nullptr;
     void* output = nullptr;
     bool initialised = false;
+    std::vector<double> bufferCounts; ///< of the buffers that came from the stream at once
+    std::size_t buffer = 0;           ///< that was taken of them, from 1
 };
 
 } // namespace brenix

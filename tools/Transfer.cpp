@@ -2,9 +2,11 @@
 
 #include "Commands.hpp"
 #include "brenixcoder/coder.h"
+#include "brenixcore/plugin/Inspect.hpp"
 
 #include <algorithm>
 #include <cmath>
+#include <cstdint>
 #include <cstdio>
 #include <iostream>
 #include <thread>
@@ -15,6 +17,9 @@ namespace brenix
 
 namespace
 {
+
+/// Of a buffer, which has them in one piece.
+constexpr std::size_t mostBlockElements = 1 << 27;
 
 /// What of the two limits is there: counts if the rate tells how many, or else time.
 std::pair<double, double> extent(const Settings& settings, double rate)
@@ -29,12 +34,77 @@ std::pair<double, double> extent(const Settings& settings, double rate)
 void summarise(const Settings& settings, const char* verb, double counts, double seconds)
 {
     if (settings.json) {
-        printJson(std::cerr,
-                  {{"counts", counts}, {"seconds", seconds}, {"interrupted", isInterrupted()}});
+        printJson(std::cerr, {{"counts", static_cast<std::int64_t>(counts)},
+                              {"seconds", seconds},
+                              {"interrupted", isInterrupted()}});
     } else if (!settings.quiet) {
         std::fprintf(stderr, "%s %.0f counts in %.3g s%s\n", verb, counts, seconds,
                      isInterrupted() ? ", interrupted" : "");
     }
+}
+
+using brenixcore::plugin::DescribedValue;
+using brenixcore::plugin::inspectPlugin;
+
+/// The type of the field "data" of a plug-in that describes it; empty when it tells none.
+std::string typeOfData(const std::vector<DescribedValue>& fields,
+                       const std::vector<DescribedValue>& options, const Settings& settings)
+{
+    const auto data = std::find_if(fields.begin(), fields.end(), [](const DescribedValue& field) {
+        return field.name == "data";
+    });
+    if (data == fields.end() || data->type.substr(0, 1) != "(") {
+        return data == fields.end() ? "" : data->type;
+    }
+    const std::string name =
+        data->type.substr(1, data->type.size() - 2); // of the option that says it
+    std::string type;
+    for (const DescribedValue& option : options) {
+        type = option.name == name ? option.defaultValue : type;
+    }
+    for (const Option& option : parseOptions(settings.channel.options)) {
+        type = option.name == name ? printElements(*option.type, option.elements) : type;
+    }
+    return type;
+}
+
+/// The element type that is asked for or that the plug-ins take; null when nobody tells.
+const ElementType* typeToWrite(const Settings& settings)
+{
+    std::string type = settings.type;
+    for (const std::string& name : {settings.channel.converter, settings.channel.device}) {
+        if (type.empty()) {
+            const auto plugin = inspectPlugin(name);
+            type = typeOfData(plugin.outputFields, plugin.options, settings);
+        }
+    }
+    return type.empty() ? nullptr : &elementType(type);
+}
+
+/// The fields of a device that was done before it delivered any, as far as it tells.
+std::vector<Field> describedFields(Channel& channel, const Settings& settings)
+{
+    const auto device = inspectPlugin(settings.channel.device);
+    const auto fields = inspectPlugin(settings.channel.converter).inputFields;
+    const std::string type = typeOfData(device.inputFields, device.options, settings);
+    auto channels = static_cast<std::size_t>(channel.number("Channels", "uint32").value_or(1));
+    std::vector<std::string> names = settings.fields;
+    if (names.empty() && !fields.empty() && fields[0].name == "Data#") {
+        for (std::size_t i = 1; i <= channels; ++i) {
+            names.push_back("Data" + std::to_string(i));
+        }
+    }
+    if (names.empty()) {
+        names.emplace_back("data");
+    } else {
+        channels = 1;
+    }
+    std::vector<Field> described;
+    described.reserve(names.size());
+    for (const std::string& name : names) {
+        described.push_back({name, &elementType(type.empty() ? "double" : type), channels, {}});
+    }
+    return described;
 }
 
 } // namespace
@@ -89,14 +159,19 @@ ExitCode readSamples(const Settings& given)
     Progress progress(std::min(most, channel.number("Frames", "int64").value_or(INFINITY)),
                       settings.quiet);
     std::unique_ptr<SampleWriter> writer;
+    double written = 0;
     const auto failure = caught([&] {
         while (!reading.isOver()) {
             if (const std::size_t counts = reading.next(); counts > 0) {
                 if (!writer) {
                     writer = openWriter(settings.file, reading.getFields());
                 }
+                if (!writer) {
+                    break; // an interruption, before somebody read the FIFO
+                }
                 writer->write(reading.getFields(), counts);
-                progress.update(reading.getCounts());
+                written = reading.getCounts();
+                progress.update(written);
             }
             if (channel.hasDeviceError()) { // finish() throws it
                 reading.endWithAvailable();
@@ -105,19 +180,21 @@ ExitCode readSamples(const Settings& given)
     });
     progress.finish();
     const double seconds = reading.getSeconds();
+    std::vector<Field> fields = reading.getFields();
     const auto unwritten = caught([&] {
+        if (!writer && !failure && !isInterrupted() && !channel.hasDeviceError()) {
+            fields = describedFields(channel, settings);
+            writer = openWriter(settings.file, fields); // it is empty, and a file
+        }
         if (writer) {
             writer->finish(); // what came before a failure is kept
         }
     });
     channel.finish(failure ? failure : unwritten);
-    if (!writer && !isInterrupted()) {
-        throw Failure("", "the device delivered nothing");
-    }
     if (writer && !settings.emitC.empty()) {
-        emitRead(settings, reading.getFields(), most, reading.getMostSeconds());
+        emitRead(settings, fields, most, reading.getMostSeconds());
     }
-    summarise(settings, "read", reading.getCounts(), seconds);
+    summarise(settings, "read", written, seconds);
     return isInterrupted() ? Interrupted : Success;
 }
 
@@ -125,9 +202,14 @@ ExitCode writeSamples(const Settings& given)
 {
     Settings settings = given;
     settleFormat(settings.file);
-    const ElementType& type = elementType(settings.type);
-    const auto reader = openReader(settings.file, type);
+    const auto reader = openReader(settings.file, typeToWrite(settings));
+    const ElementType& type = reader->getType();
     const std::size_t columns = reader->getColumns();
+    if (settings.block * columns > mostBlockElements) {
+        throw std::invalid_argument("--block: " + std::to_string(settings.block) + " counts of " +
+                                    std::to_string(columns) + " columns are more than " +
+                                    std::to_string(mostBlockElements) + " elements");
+    }
     // What the device delivers is thrown away: it must not wait for room.
     settings.channel.inputLimit = INFINITY;
     settings.channel.outputLimit =
