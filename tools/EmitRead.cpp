@@ -12,7 +12,7 @@ namespace
 
 constexpr std::string_view readProgram = R"(
 static const char* name; /* of the file */
-@INFO@enum { MOST = @MOST@, BUFFERS = 256 }; /* counts, and buffers, that are read at once */
+@INFO@enum { MOST = @MOST@, BUFFERS = 4096 }; /* counts, and buffers, that are read at once */
 @FIELDS@@DISK@@PRINT@@ITEM@
 static int writeCounts(@FILE@* file, int counts)
 {
@@ -27,7 +27,7 @@ static int transfer(void* channel, @FILE@* file)
 @START@    while (left > 0.0@TIME@) {
         uint8_t done = 0;
         double total = 0.0;
-        double counts[BUFFERS];
+        static double counts[BUFFERS];
         double buffers = BUFFERS;
         /* Asked before the peek: a device that is done adds nothing to what the peek then sees. */
         if (!check(channel, "coderStreamIsDeviceDone", coderStreamIsDeviceDone(input, &done)) ||
