@@ -4,6 +4,8 @@
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
+#include <cstdint>
+#include <string>
 #include <utility>
 
 namespace
@@ -29,11 +31,18 @@ public:
 
     void run(DeviceStreams& streams) override
     {
+        std::uint64_t lost = 0;
         while (auto packet = streams.pull()) {
+            const std::uint64_t counts = packet->counts;
             if (!streams.push(std::move(*packet))) {
-                deviceHost->raise("error", "brenix:Device:dataLost",
-                                  "The channel closes and its input stream is full.");
+                lost += counts;
             }
+        }
+        if (lost > 0) {
+            const std::string message = std::to_string(lost) +
+                                        " counts were lost: the channel closed and its input "
+                                        "stream was full.";
+            deviceHost->raise("error", "brenix:Device:dataLost", message.c_str());
         }
     }
 
@@ -41,7 +50,13 @@ private:
     DeviceHost* deviceHost = nullptr;
 };
 
+constexpr FieldInfo fields[] = {
+    {dataField, "", "", "the elements of a written buffer"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Loopback)
 BRENIXCORE_DESCRIBE_OPTIONS(brenixcore::plugin::noOptions)
+BRENIXCORE_DESCRIBE_FIELDS(fields, fields)

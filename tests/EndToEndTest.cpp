@@ -213,6 +213,18 @@ TEST(StreamTest, DevicesMayLackStreams)
     EXPECT_EQ(channel.error(), "brenix:OutputStream:notSupported|");
 }
 
+TEST(StreamTest, LoopbackCountsWhatItLoses)
+{
+    Channel channel("loopback", 2);
+    channel.start();
+    for (int i = 0; i < 4; ++i) { // one has room and one waits for it
+        ASSERT_EQ(channel.write({1, 2}), 2);
+    }
+    EXPECT_EQ(channel.close(), 1);
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:dataLost|4 counts were lost: the channel closed "
+                                    "and its input stream was full.");
+}
+
 TEST(EventTest, AFailureOfTheDevicesThreadIsAnError)
 {
     const struct {
