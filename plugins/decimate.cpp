@@ -6,6 +6,7 @@
 #include "brenixcore/plugin/Visit.hpp"
 
 #include <algorithm>
+#include <cstddef>
 #include <cstdint>
 
 namespace
@@ -13,6 +14,8 @@ namespace
 
 using namespace brenixcore::plugin;
 using brenixplugin::kit::coderconverter::TPointerProperty;
+using brenixplugin::kit::device::TScalarProperty;
+using brenixplugin::kit::device::TVectorProperty;
 
 class Decimate : public Filter
 {
@@ -39,7 +42,7 @@ public:
     }
 
 private:
-    /// Moves the elements of the counts that stay to the front of an array.
+    /// Leaves of an array the elements of the counts that stay.
     struct Keep {
         std::uint64_t counts;
         std::uint64_t first;
@@ -49,23 +52,38 @@ private:
         template <typename T>
         void operator()(TPointerProperty<T>& array) const
         {
-            const std::uint64_t size = array.count / counts; // of a count
-            if (size * counts != array.count) {
-                return; // describes the packet
-            }
-            for (std::uint64_t i = 0; i < kept; ++i) {
-                T* const from = array.data + (first + i * step) * size;
-                T* const to = array.data + i * size;
-                if (from != to) {
-                    std::move(from, from + size, to);
-                }
-            }
-            array.count = kept * size;
+            array.count = moveForward(array.data, array.count);
         }
 
-        template <typename Other>
-        void operator()(Other& /*describes the packet*/) const
+        template <typename T>
+        void operator()(TVectorProperty<T>& vector) const
         {
+            vector.values.resize(moveForward(vector.values.begin(), vector.values.size()));
+        }
+
+        template <typename T>
+        void operator()(TScalarProperty<T>& /*describes the packet*/) const
+        {
+        }
+
+        /// Moves the elements that stay to the front. Returns how many they are.
+        template <typename Iterator>
+        std::uint64_t moveForward(Iterator begin, std::uint64_t elements) const
+        {
+            const std::uint64_t size = elements / counts; // of a count
+            if (size * counts != elements) {
+                return elements; // they describe the packet
+            }
+            const auto at = [&](std::uint64_t count) {
+                return begin + static_cast<std::ptrdiff_t>(count * size);
+            };
+            for (std::uint64_t i = 0; i < kept; ++i) {
+                const std::uint64_t from = first + i * step;
+                if (from != i) {
+                    std::move(at(from), at(from + 1), at(i));
+                }
+            }
+            return kept * size;
         }
     };
 

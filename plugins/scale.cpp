@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdint>
 #include <limits>
 #include <type_traits>
 
@@ -15,6 +16,8 @@ namespace
 
 using namespace brenixcore::plugin;
 using brenixplugin::kit::coderconverter::TPointerProperty;
+using brenixplugin::kit::device::TScalarProperty;
+using brenixplugin::kit::device::TVectorProperty;
 
 /// The nearest value of T; beyond its range the last one, and 0 for what is no number.
 template <typename T>
@@ -58,17 +61,29 @@ public:
     template <typename T>
     void operator()(TPointerProperty<T>& array) const
     {
-        std::transform(array.data, array.data + array.count, array.data, [&](T value) {
-            return nearest<T>(static_cast<double>(value) * gain + offset);
-        });
+        scale(array.data, array.count);
     }
 
-    template <typename Other>
-    void operator()(Other& /*describes the packet*/) const
+    template <typename T>
+    void operator()(TVectorProperty<T>& vector) const
+    {
+        scale(vector.values.data(), vector.values.size());
+    }
+
+    template <typename T>
+    void operator()(TScalarProperty<T>& /*describes the packet*/) const
     {
     }
 
 private:
+    template <typename T>
+    void scale(T* values, std::uint64_t count) const
+    {
+        std::transform(values, values + count, values, [&](T value) {
+            return nearest<T>(static_cast<double>(value) * gain + offset);
+        });
+    }
+
     double gain = 1;
     double offset = 0;
 };

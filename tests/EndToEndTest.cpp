@@ -410,6 +410,19 @@ TEST(FilterTest, ScaleAndDecimate)
     EXPECT_EQ(std::vector<int>(back, back + 3), (std::vector<int>{-128, 127, 0}));
 }
 
+TEST(FilterTest, VectorsAreArrays)
+{
+    Channel channel(probe, infinity, infinity, "columns");
+    ASSERT_EQ(channel.init({{"Packets", "4 3"}, {"Vectors", 1}}), 1);
+    ASSERT_EQ(Channel::addFilter(channel.input, "decimate", {{"Factor", 3}}), 1);
+    ASSERT_EQ(Channel::addFilter(channel.input, "scale", {{"Gain", 10.0}}), 1);
+    ASSERT_EQ(channel.open(), 1);
+    EXPECT_EQ(channel.read(3, 2, "Data1"), (Numbers{0, 30, 60}));
+    uint8_t even[2] = {};
+    EXPECT_EQ(coderInputStreamReadBufferData(channel.input, 1, 0, "Even", "logical", 2, even), 1);
+    EXPECT_EQ(even[0] * 2 + even[1], 2);
+}
+
 TEST(FilterTest, FiltersOfOneStreamSeeWhatIsWrittenOnce)
 {
     Channel channel("loopback", infinity, 2);

@@ -5,6 +5,8 @@
 #include <brenixcore/plugin/Plugin.hpp>
 #include <brenixcore/plugin/Visit.hpp>
 
+#include <algorithm>
+#include <cstdint>
 #include <limits>
 
 namespace
@@ -28,24 +30,36 @@ public:
         }
     }
 
-    // Called for each class that a field can have: arrays are clipped...
+    // Called for each class that a field can have: an array in one of two forms is clipped...
     template <typename T>
     void operator()(brenixplugin::kit::coderconverter::TPointerProperty<T>& array) const
     {
-        for (T* element = array.data; element != array.data + array.count; ++element) {
-            if (static_cast<double>(*element) > highest) {
-                *element = static_cast<T>(highest);
-            }
-        }
+        clip(array.data, array.count);
+    }
+    template <typename T>
+    void operator()(brenixplugin::kit::device::TVectorProperty<T>& vector) const
+    {
+        clip(vector.values.data(), vector.values.size());
     }
 
-    // ... and everything else stays.
-    template <typename Other>
-    void operator()(Other& /*other*/) const
+    // ... and one number stays.
+    template <typename T>
+    void operator()(brenixplugin::kit::device::TScalarProperty<T>& /*scalar*/) const
     {
     }
 
 private:
+    template <typename T>
+    void clip(T* elements, std::uint64_t count) const
+    {
+        constexpr auto lowest = static_cast<double>(std::numeric_limits<T>::lowest());
+        for (T* element = elements; element != elements + count; ++element) {
+            if (static_cast<double>(*element) > highest) {
+                *element = static_cast<T>(std::max(highest, lowest));
+            }
+        }
+    }
+
     double highest = std::numeric_limits<double>::infinity();
 };
 

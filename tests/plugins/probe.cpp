@@ -37,7 +37,7 @@ struct UnknownProperty : interfaces::IPropertyInfo {
 /// Options: Packets (counts of the packets to push, as a text or as int32; of those below 0 each is a mistake of
 /// its own), Streams ("i", "o", "io", ""), FailIn and RaiseIn (an operation: init, open, run, execute,
 /// close, term), FailAs (what is thrown: "", "int", "own", "silent", "long"; or "slow"), Threads (how
-/// many report things from init to term).
+/// many report things from init to term), Vectors (1: packets of vectors).
 class Probe : public Device
 {
 public:
@@ -71,6 +71,7 @@ public:
         }
         hasOutput = info.output.has_value();
         ending = false;
+        pushesVectors = options.wholeNumber("Vectors", 0, 1) == 1;
         for (long left = options.wholeNumber("Threads", 0, 9).value_or(0); left > 0; --left) {
             threads.emplace_back([this] { report(); });
         }
@@ -98,6 +99,10 @@ public:
                 continue;
             }
             const auto size = static_cast<std::uint64_t>(counts);
+            if (pushesVectors) {
+                pushVectors(size, next);
+                continue;
+            }
             std::unique_ptr<double[]> values(new double[size]);
             for (std::uint64_t i = 0; i < size; ++i) {
                 values[i] = next++;
@@ -219,6 +224,22 @@ private:
         }
     }
 
+    /// Of running numbers in "data", and whether they are even in "Even".
+    void pushVectors(std::uint64_t size, double& next)
+    {
+        auto data = std::make_unique<device::TVectorProperty<double>>(dataField, size);
+        auto even = std::make_unique<device::TVectorProperty<bool>>("Even", size);
+        for (std::uint64_t i = 0; i < size; ++i) {
+            even->values[i] = static_cast<int>(next) % 2 == 0;
+            data->values[i] = next++;
+        }
+        Packet packet;
+        packet.counts = size;
+        setField(packet, OwnedProperty(data.release()));
+        setField(packet, OwnedProperty(even.release()));
+        lastStreams->push(std::move(packet));
+    }
+
     void pushMistake(int mistake)
     {
         Packet packet;
@@ -242,6 +263,7 @@ private:
     std::string raiseIn;
     std::vector<int> packets;
     bool hasOutput = false;
+    bool pushesVectors = false;
     bool isInitialised = false;
     bool isOpen = false;
     std::atomic<bool> ending = false;
