@@ -72,7 +72,7 @@ public:
         if (!(sampleRate > 0 && std::isfinite(sampleRate))) {
             Options::fail("SampleRate", "must be more than 0 Hz");
         }
-        frequency = 440;
+        frequency = std::min(440.0, sampleRate / 4);
         amplitude = 1;
         readTunable(options);
 
@@ -190,7 +190,8 @@ private:
 
 constexpr OptionInfo optionTable[] = {
     {"Waveform", "text", "", "sine", "sine, square, ramp (-1 to 1) or noise (evenly from -1 to 1)"},
-    {"Frequency", "number", "Hz", "440", "0 to half the sample rate"},
+    {"Frequency", "number", "Hz", "440",
+     "0 to half the sample rate; the default is a quarter of it where that is less than 440"},
     {"Amplitude", "number", "", "1", "of the highest and the lowest value"},
     {"Channels", "whole number", "", "1", ""},
     {"SampleRate", "number", "Hz", "48000", ""},
@@ -198,6 +199,22 @@ constexpr OptionInfo optionTable[] = {
     {"Frames", "whole number", "frames", "endless", "after which the device is done"},
     {"Pace", "text", "", "realtime",
      "realtime delivers a block when its last frame is due, fast as soon as there is room"},
+    {},
+};
+
+constexpr OptionInfo setOptions[] = {
+    {"Frequency", "number", "Hz", "unchanged", "0 to half the sample rate"},
+    {"Amplitude", "number", "", "unchanged", "of the highest and the lowest value"},
+    {},
+};
+
+constexpr CommandInfo commandTable[] = {
+    {"set", setOptions, "from the next block on; the properties follow"},
+    {},
+};
+
+constexpr FieldInfo inputFields[] = {
+    {dataField, "double", "", "a sample of each channel for each frame"},
     {},
 };
 
@@ -214,3 +231,5 @@ constexpr PropertyInfo propertyTable[] = {
 BRENIXCORE_EXPORT_DEVICE(Signal)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
+BRENIXCORE_DESCRIBE_FIELDS(inputFields, noFields)
+BRENIXCORE_DESCRIBE_COMMANDS(commandTable)

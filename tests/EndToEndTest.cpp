@@ -20,6 +20,8 @@ const std::string noOutput = "brenix:OutputStream:synchronousOutputNotPossible|"
 const std::string noInputConversion = "brenix:InputStream:couldNotConvertInputData|";
 const std::string noOutputConversion = "brenix:OutputStream:couldNotConvertOutputData|";
 
+const std::string soundFile = testing::TempDir() + std::to_string(getpid());
+
 const struct Operation {
     std::string name;
     int (*run)(Channel& channel);
@@ -480,11 +482,14 @@ TEST(SignalTest, WaveformsChannelsAndCommands)
     EXPECT_EQ(channel.execute("set", {{"Frequency", 4.5}}), 0);
     EXPECT_EQ(channel.error(),
               unexpected + "Option Frequency: must be from 0 Hz to half the sample rate.");
+    channel.close();
+    ASSERT_EQ(channel.init({{"SampleRate", 100}}), 1);
+    EXPECT_EQ(channel.property<double>("Frequency", "double"), 25);
 }
 
 TEST(AudioFileTest, WhatIsWrittenIsReadBack)
 {
-    const std::string file = testing::TempDir() + std::to_string(getpid()) + "t\xC3\xB6ne.wav";
+    const std::string file = soundFile + "t\xC3\xB6ne.wav";
     const Numbers samples = {0.5, -0.25, 0.125, -1, 0.75, 0.1};
     {
         Channel writer("audiofile");
