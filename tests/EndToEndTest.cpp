@@ -1,10 +1,15 @@
 // The built libraries with plug-ins: what the embedded core promises, seen through the C functions.
 
 #include "Driver.hpp"
+#include "brenixcore/plugin/Inspect.hpp"
 
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <cmath>
+#include <csignal>
+#include <filesystem>
+#include <fstream>
 #include <map>
 
 using namespace driver;
@@ -45,6 +50,14 @@ TEST(LoadTest, AConverterIsLoadedFirst)
     EXPECT_EQ(create(channel, "no such device", "identity"), "brenix:Channel:couldNotLoadDevice|");
     EXPECT_EQ(create(channel, "identity", "identity"), "brenix:Channel:couldNotCreateDevice|");
     EXPECT_EQ(channel, nullptr);
+}
+
+TEST(LoadTest, FieldsAndCommandsAreDescribed)
+{
+    const auto report = brenixcore::plugin::inspectPlugin("signal");
+    ASSERT_EQ(report.inputFields.size() + report.commands.size(), 2);
+    EXPECT_EQ(report.inputFields[0].name, "data");
+    EXPECT_EQ(report.commands[0].options.size(), 2);
 }
 
 TEST(StateTest, OperationsOutOfOrderNameOperationAndState)

@@ -1,6 +1,6 @@
 // A device that counts: it pushes running numbers as "uint32" in the field "data".
 //
-// Its option and its property are described at the end. Command: restart.
+// Its option, property, field and command are described at the end.
 
 #include <brenixcore/plugin/Describe.hpp>
 #include <brenixcore/plugin/Make.hpp>
@@ -75,8 +75,20 @@ constexpr PropertyInfo propertyTable[] = {
     {},
 };
 
+constexpr FieldInfo fieldTable[] = {
+    {dataField, "uint32", "", "running numbers"},
+    {},
+};
+
+constexpr CommandInfo commandTable[] = {
+    {"restart", noOptions, "counts from 0 again"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Counter)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
+BRENIXCORE_DESCRIBE_FIELDS(fieldTable, noFields)
+BRENIXCORE_DESCRIBE_COMMANDS(commandTable)
