@@ -2,88 +2,34 @@
 // stream. A count is a frame: one sample of each channel, interleaved in the field "data" as
 // double, full scale from -1 to 1.
 
+#include "SoundFile.hpp"
+#include "SoundFormat.hpp"
+#include "SoundSamples.hpp"
 #include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
+#include "brenixcore/plugin/Visit.hpp"
 
 #include <sndfile.h>
 
-#include <algorithm>
-#include <array>
-#include <cctype>
-#include <cmath>
-#include <iterator>
+#include <cstdint>
+#include <cstdio>
+#include <filesystem>
 #include <memory>
+#include <optional>
 #include <stdexcept>
 #include <string>
-#include <string_view>
+#include <system_error>
 #include <utility>
 #include <vector>
 
 namespace
 {
 
+using namespace brenix;
 using namespace brenixcore::plugin;
 using brenixplugin::PropertyMap;
-using brenixplugin::kit::coderconverter::TPointerProperty;
-
-struct SampleFormat {
-    std::string_view name;
-    int subtype;
-};
-
-#define SAMPLE_FORMAT(name)                                                                        \
-    SampleFormat                                                                                   \
-    {                                                                                              \
-#name, SF_FORMAT_##name                                                                    \
-    }
-constexpr std::array sampleFormats = {
-    SAMPLE_FORMAT(PCM_S8),       SAMPLE_FORMAT(PCM_16),        SAMPLE_FORMAT(PCM_24),
-    SAMPLE_FORMAT(PCM_32),       SAMPLE_FORMAT(PCM_U8),        SAMPLE_FORMAT(FLOAT),
-    SAMPLE_FORMAT(DOUBLE),       SAMPLE_FORMAT(ULAW),          SAMPLE_FORMAT(ALAW),
-    SAMPLE_FORMAT(IMA_ADPCM),    SAMPLE_FORMAT(MS_ADPCM),      SAMPLE_FORMAT(GSM610),
-    SAMPLE_FORMAT(VOX_ADPCM),    SAMPLE_FORMAT(NMS_ADPCM_16),  SAMPLE_FORMAT(NMS_ADPCM_24),
-    SAMPLE_FORMAT(NMS_ADPCM_32), SAMPLE_FORMAT(G721_32),       SAMPLE_FORMAT(G723_24),
-    SAMPLE_FORMAT(G723_40),      SAMPLE_FORMAT(DWVW_12),       SAMPLE_FORMAT(DWVW_16),
-    SAMPLE_FORMAT(DWVW_24),      SAMPLE_FORMAT(DPCM_8),        SAMPLE_FORMAT(DPCM_16),
-    SAMPLE_FORMAT(VORBIS),       SAMPLE_FORMAT(OPUS),          SAMPLE_FORMAT(ALAC_16),
-    SAMPLE_FORMAT(ALAC_20),      SAMPLE_FORMAT(ALAC_24),       SAMPLE_FORMAT(ALAC_32),
-    SAMPLE_FORMAT(MPEG_LAYER_I), SAMPLE_FORMAT(MPEG_LAYER_II), SAMPLE_FORMAT(MPEG_LAYER_III),
-};
-#undef SAMPLE_FORMAT
-
-/// The container format of a file name's ending; 0 when there is none for it.
-int containerOf(const std::string& fileName)
-{
-    const std::size_t dot = fileName.rfind('.');
-    if (dot == std::string::npos) {
-        return 0;
-    }
-    std::string ending = fileName.substr(dot + 1);
-    std::transform(ending.begin(), ending.end(), ending.begin(),
-                   [](unsigned char letter) { return static_cast<char>(std::tolower(letter)); });
-    // libsndfile lists one ending for each format.
-    constexpr std::string_view others[][2] = {{"ogg", "oga"},   {"opus", "oga"}, {"aif", "aiff"},
-                                              {"aifc", "aiff"}, {"snd", "au"},   {"mp3", "m1a"},
-                                              {"mp2", "m1a"}};
-    for (const auto& [other, listed] : others) {
-        if (ending == other) {
-            ending = listed;
-        }
-    }
-    int formats = 0;
-    sf_command(nullptr, SFC_GET_FORMAT_MAJOR_COUNT, &formats, sizeof formats);
-    for (int i = 0; i < formats; ++i) {
-        SF_FORMAT_INFO info{};
-        info.format = i;
-        sf_command(nullptr, SFC_GET_FORMAT_MAJOR, &info, sizeof info);
-        if (info.extension != nullptr && ending == info.extension) {
-            return info.format & SF_FORMAT_TYPEMASK;
-        }
-    }
-    return 0;
-}
 
 class AudioFile : public Device
 {
@@ -101,16 +47,25 @@ public:
             Options::fail("Mode", "must be read or write, not " + mode);
         }
         writes = mode == "write";
-        if (writes) {
-            readWriteOptions(options);
-        } else {
+        if (!writes) {
             blockSize = options.wholeNumber("BlockSize", 1, 1L << 24).value_or(1024);
+        }
+        format = {};
+        if (writes || containerOf(fileName) == SF_FORMAT_RAW) {
+            format = formatOptions(options, fileName, writes);
+        } else {
+            refuseFormatOptions(optionMap, fileName);
         }
         options.requireAllKnown();
 
         deviceHost = &host;
         if (!writes) {
-            openFile(); // tells what is in it, and whether it can be read
+            openInput(); // tells what is in it, and whether it can be read
+            std::vector<double> frame(static_cast<std::size_t>(format.channels));
+            if (format.frames == SF_COUNT_MAX && // it does not tell
+                sf_readf_double(input.get(), frame.data(), 1) == 0) {
+                format.frames = 0;
+            }
         }
         publish(properties, "SampleRate", static_cast<double>(format.samplerate));
         publish(properties, "Channels", static_cast<unsigned int>(format.channels));
@@ -122,7 +77,11 @@ public:
     void open(const PropertyMap& options) override
     {
         Options(options).requireAllKnown();
-        openFile();
+        if (writes) {
+            openOutput();
+        } else {
+            openInput();
+        }
     }
 
     void run(DeviceStreams& streams) override
@@ -136,96 +95,133 @@ public:
 
     void close() override
     {
-        if (const int error = sf_close(file.release()); error != SF_ERR_NO_ERROR) {
-            throw std::runtime_error("Could not close " + fileName + ": " + sf_error_number(error));
+        input.reset();
+        if (!output) {
+            return;
+        }
+        if (framesWritten == 0 && (isIn(SF_FORMAT_FLAC) || isIn(SF_FORMAT_MPEG))) {
+            sf_command(output->get(), SFC_UPDATE_HEADER_NOW, nullptr, 0); // or the file stays empty
+        }
+        const std::string error = output->close();
+        output.reset();
+        if (!error.empty()) {
+            throw std::runtime_error("Could not write " + fileName + ": " + error +
+                                     ". The file is not complete.");
+        }
+        if (framesWritten == 0 && isEncodedAs(SF_FORMAT_OPUS)) {
+            throw std::runtime_error("No frames were written to " + fileName +
+                                     ": an Opus file without any cannot be read.");
         }
     }
 
-    void term() override { file.reset(); }
+    void term() override { input.reset(); } // which init opened
 
 private:
-    void readWriteOptions(Options& options)
+    bool isIn(int container) const { return (format.format & SF_FORMAT_TYPEMASK) == container; }
+    bool isEncodedAs(int subtype) const { return (format.format & SF_FORMAT_SUBMASK) == subtype; }
+
+    void openInput()
     {
-        format = {};
-        format.samplerate =
-            static_cast<int>(options.wholeNumber("SampleRate", 1, 655350).value_or(48000));
-        format.channels = static_cast<int>(options.wholeNumber("Channels", 1, 1024).value_or(1));
-        const std::string name = options.text("SampleFormat").value_or("PCM_16");
-        const auto* const found =
-            std::find_if(sampleFormats.begin(), sampleFormats.end(),
-                         [&](const SampleFormat& candidate) { return candidate.name == name; });
-        if (found == sampleFormats.end()) {
-            Options::fail("SampleFormat", "is not known: " + name);
+        if (!isIn(SF_FORMAT_RAW)) {
+            format = {}; // which sf_open fills in
         }
-        const int container = containerOf(fileName);
-        if (container == 0) {
-            Options::fail("FileName", "has an ending that names no sound file format: " + fileName);
-        }
-        format.format = container | found->subtype;
-        if (sf_format_check(&format) == 0) {
-            Options::fail("SampleFormat", name + " with this number of channels and this sample " +
-                                              "rate is not possible in " + fileName);
+        input.reset(sf_open(fileName.c_str(), SFM_READ, &format));
+        if (!input) {
+            throw std::runtime_error("Could not open " + fileName + ": " + sf_strerror(nullptr));
         }
     }
 
-    void openFile()
+    void openOutput()
     {
-        if (!writes) {
-            format = {};
+        framesWritten = 0;
+        output.emplace(std::fopen(fileName.c_str(), "wbe"), format);
+        if (output->get() == nullptr) {
+            const std::string error = output->error();
+            output.reset();
+            throw std::runtime_error("Could not open " + fileName + ": " + error);
         }
-        file.reset(sf_open(fileName.c_str(), writes ? SFM_WRITE : SFM_READ, &format));
-        if (!file) {
-            throw std::runtime_error("Could not open " + fileName + ": " + sf_strerror(nullptr));
-        }
-        sf_command(file.get(), SFC_SET_CLIPPING, nullptr, SF_TRUE); // the scale of PCM is 2^n
+        sf_command(output->get(), SFC_SET_CLIPPING, nullptr, SF_TRUE); // the scale of PCM is 2^n
     }
 
     void read(DeviceStreams& streams)
     {
         const auto channels = static_cast<std::uint64_t>(format.channels);
+        sf_count_t delivered = 0;
         for (;;) {
             std::unique_ptr<double[]> samples(
                 new double[static_cast<std::uint64_t>(blockSize) * channels]);
-            const sf_count_t frames = sf_readf_double(file.get(), samples.get(), blockSize);
-            if (const int error = sf_error(file.get()); error != SF_ERR_NO_ERROR) {
+            const sf_count_t frames = sf_readf_double(input.get(), samples.get(), blockSize);
+            const int error = sf_error(input.get());
+            if (frames > 0) { // also before an error
+                delivered += frames;
+                Packet packet;
+                packet.counts = static_cast<std::uint64_t>(frames);
+                setField(packet,
+                         makeArray(dataField, std::move(samples), packet.counts * channels));
+                if (!streams.push(std::move(packet))) {
+                    return;
+                }
+            }
+            if (error != SF_ERR_NO_ERROR) {
                 throw std::runtime_error("Could not read " + fileName + ": " +
                                          sf_error_number(error));
             }
             if (frames <= 0) {
+                requireEnd(delivered);
                 return;
             }
-            Packet packet;
-            packet.counts = static_cast<std::uint64_t>(frames);
-            setField(packet, makeArray(dataField, std::move(samples), packet.counts * channels));
-            if (!streams.push(std::move(packet))) {
-                return;
+        }
+    }
+
+    /// Throws when a file that ends after so many frames should have had more.
+    void requireEnd(sf_count_t delivered) const
+    {
+        if (delivered < format.frames && format.frames != SF_COUNT_MAX) {
+            throw std::runtime_error(fileName + " ends after " + std::to_string(delivered) +
+                                     " of its " + std::to_string(format.frames) + " frames.");
+        }
+        const std::uint64_t size =
+            sampleSize(format.format) * static_cast<std::uint64_t>(format.channels);
+        if (isIn(SF_FORMAT_RAW) && size > 0) { // libsndfile leaves out part of a frame
+            if (const auto torn = std::filesystem::file_size(fileName) % size; torn > 0) {
+                throw std::runtime_error("The last frame of " + fileName + " has " +
+                                         std::to_string(torn) + " of " + std::to_string(size) +
+                                         " bytes.");
             }
         }
     }
 
     void write(DeviceStreams& streams)
     {
+        const bool clips = !isEncodedAs(SF_FORMAT_FLOAT) && !isEncodedAs(SF_FORMAT_DOUBLE);
         const auto channels = static_cast<std::uint64_t>(format.channels);
         std::vector<double> samples; // a frame may be spread over packets
+        std::uint64_t refused = 0;
         while (auto packet = streams.pull()) {
             const auto data = takeField(*packet, dataField);
-            const auto* const array = dynamic_cast<const TPointerProperty<double>*>(data.get());
-            if (array == nullptr) {
-                deviceHost->raise("error", "brenix:Device:wrongType",
-                                  "Samples to write must be double.");
+            AppendSamples append{samples, clips};
+            visitNumbers(data.get(), append);
+            if (!append.known) {
+                refused += packet->counts;
+                const std::string message =
+                    std::to_string(refused) + " counts were not written to " + fileName +
+                    ": samples must be double, float, int8, int16 or int32.";
+                deviceHost->raise("error", "brenix:Device:wrongType", message.c_str());
                 continue;
             }
-            std::transform(array->data, array->data + array->count, std::back_inserter(samples),
-                           [this](double sample) { return encodable(sample); });
-            const std::uint64_t frames = samples.size() / channels;
-            const auto written =
-                sf_writef_double(file.get(), samples.data(), static_cast<sf_count_t>(frames));
-            if (written != static_cast<sf_count_t>(frames)) {
-                throw std::runtime_error("Could not write " + fileName + ": " +
-                                         sf_strerror(file.get()));
+            const auto frames = static_cast<sf_count_t>(samples.size() / channels);
+            if (!encoderHasRoom(samples.size())) {
+                failToWrite(streams, "no space left for the encoder's temporary file",
+                            samples.size());
             }
+            const sf_count_t written = sf_writef_double(output->get(), samples.data(), frames);
+            framesWritten += written;
             samples.erase(samples.begin(),
-                          samples.begin() + static_cast<std::ptrdiff_t>(frames * channels));
+                          samples.begin() + static_cast<std::ptrdiff_t>(written) *
+                                                static_cast<std::ptrdiff_t>(channels));
+            if (const std::string error = output->error(); written != frames || !error.empty()) {
+                failToWrite(streams, error, samples.size());
+            }
         }
         if (!samples.empty()) {
             throw std::runtime_error("The last frame for " + fileName + " has " +
@@ -234,15 +230,31 @@ private:
         }
     }
 
-    /// Full scale for what is beyond it, and 0 for what is no number: libsndfile sees to that for PCM
-    /// only, and looks up other encodings in tables without a check.
-    double encodable(double sample) const
+    /// libsndfile encodes ALAC into a temporary file, and ends the process when that has no room.
+    bool encoderHasRoom(std::uint64_t samples) const
     {
         const int subtype = format.format & SF_FORMAT_SUBMASK;
-        if (subtype == SF_FORMAT_FLOAT || subtype == SF_FORMAT_DOUBLE) {
-            return sample;
+        if (subtype < SF_FORMAT_ALAC_16 || subtype > SF_FORMAT_ALAC_32) {
+            return true;
         }
-        return std::isnan(sample) ? 0 : std::clamp(sample, -1.0, 1.0);
+        std::error_code unknown; // the space is then unlimited
+        const auto space =
+            std::filesystem::space(std::filesystem::temp_directory_path(unknown), unknown);
+        constexpr std::uint64_t reserve = 1U << 20U; // for what the encoder has not written
+        return space.available >= reserve + samples * sizeof(std::int32_t);
+    }
+
+    /// Takes what is left of the output and tells how much it was, with so many samples before it.
+    [[noreturn]] void failToWrite(DeviceStreams& streams, const std::string& error,
+                                  std::uint64_t lost) const
+    {
+        streams.refuseOutput();
+        while (const auto packet = streams.tryPull()) {
+            lost += packet->counts;
+        }
+        throw std::runtime_error(
+            "Could not write " + fileName + (error.empty() ? "." : ": " + error + ".") +
+            (lost > 0 ? " " + std::to_string(lost) + " samples were not taken." : ""));
     }
 
     struct CloseFile {
@@ -253,7 +265,9 @@ private:
     bool writes = false;
     sf_count_t blockSize = 0;
     SF_INFO format{};
-    std::unique_ptr<SNDFILE, CloseFile> file;
+    std::unique_ptr<SNDFILE, CloseFile> input;
+    std::optional<SoundFile> output;
+    sf_count_t framesWritten = 0;
     DeviceHost* deviceHost = nullptr;
 };
 
@@ -261,18 +275,30 @@ constexpr OptionInfo optionTable[] = {
     {"FileName", "text", "", "(required)", "the file; when writing, its ending names the format"},
     {"Mode", "text", "", "read", "read or write"},
     {"BlockSize", "whole number", "frames", "1024", "reading: frames of one packet"},
-    {"SampleRate", "whole number", "Hz", "48000", "writing"},
-    {"Channels", "whole number", "", "1", "writing"},
+    {"SampleRate", "whole number", "Hz", "48000", "writing; reading .raw, where it is required"},
+    {"Channels", "whole number", "", "1", "writing; reading .raw, where it is required"},
     {"SampleFormat", "text", "", "PCM_16",
-     "writing: libsndfile's name of an encoding, such as PCM_24, FLOAT, DOUBLE, ULAW, VORBIS, "
-     "ALAC_16; which ones a file format has is its own matter, and refused otherwise"},
+     "writing; reading .raw, where it is required: libsndfile's name of an encoding, such as "
+     "PCM_24, FLOAT, DOUBLE, ULAW, VORBIS, ALAC_16; which ones a file format has is its own "
+     "matter, and refused otherwise"},
     {},
 };
 
 constexpr PropertyInfo propertyTable[] = {
     {"SampleRate", "double", "Hz", ""},
     {"Channels", "uint32", "", ""},
-    {"Frames", "int64", "frames", "of the file as it was at init"},
+    {"Frames", "int64", "frames",
+     "of the file as it was at init; the largest number where it does not tell"},
+    {},
+};
+
+constexpr FieldInfo inputFields[] = {
+    {dataField, "double", "", "a sample of each channel for each frame, full scale from -1 to 1"},
+    {},
+};
+
+constexpr FieldInfo outputFields[] = {
+    {dataField, "double", "", "the same; also float, int8, int16 or int32 at their full scale"},
     {},
 };
 
@@ -281,3 +307,4 @@ constexpr PropertyInfo propertyTable[] = {
 BRENIXCORE_EXPORT_DEVICE(AudioFile)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
+BRENIXCORE_DESCRIBE_FIELDS(inputFields, outputFields)

@@ -537,18 +537,119 @@ TEST(AudioFileTest, WhatIsWrittenIsReadBack)
         EXPECT_EQ(reader.close(), 1);
     }
     std::remove(file.c_str());
+}
 
-    Channel loud("audiofile"); // an encoding that goes through a table
-    loud.start({{"FileName", file}, {"Mode", "write"}, {"Channels", 1}, {"SampleFormat", "ULAW"}});
-    EXPECT_EQ(loud.write({1e6, -1e6, std::nan("")}), 3);
-    EXPECT_EQ(loud.close(), 1);
-    ASSERT_EQ(reader.init({{"FileName", file}}), 1) << reader.error();
-    ASSERT_EQ(reader.open(), 1);
-    const Numbers read = reader.read(3, 1, "Data1");
-    ASSERT_EQ(read.size(), 3);
-    EXPECT_GT(read[0], 0.95);
-    EXPECT_LT(read[1], -0.95);
-    EXPECT_NEAR(read[2], 0, 0.001);
+TEST(AudioFileTest, AFileWithoutFramesIsReadBack)
+{
+    for (const auto& [ending, format] : {std::pair(".wav", "PCM_16"),
+                                         {".flac", "PCM_16"},
+                                         {".ogg", "VORBIS"},
+                                         {".mp3", "MPEG_LAYER_III"},
+                                         {".opus", "OPUS"}}) {
+        SCOPED_TRACE(format);
+        const std::string file = soundFile + ending;
+        Channel channel("audiofile");
+        channel.start(
+            {{"FileName", file}, {"Mode", "write"}, {"Channels", 2}, {"SampleFormat", format}});
+        if (channel.close() == 0) {
+            EXPECT_EQ(channel.error(), unexpected + "No frames were written to " + soundFile +
+                                           ".opus: an Opus file without any cannot be read.");
+        } else {
+            channel.start({{"FileName", file}});
+            EXPECT_EQ(channel.property<double>("SampleRate", "double"), 48000);
+            EXPECT_EQ(channel.property<int64_t>("Frames", "int64"), 0);
+            channel.waitForEnd();
+            EXPECT_EQ(channel.peek(), Numbers{});
+            EXPECT_EQ(channel.error(coderChannelGetLastAsyncError), "|");
+        }
+        std::remove(file.c_str());
+    }
+}
+
+TEST(AudioFileTest, SamplesOfManyTypesInAFileWithoutHeader)
+{
+    const std::string file = soundFile + ".raw";
+    Channel channel("audiofile");
+    channel.start( // an encoding that goes through a table
+        {{"FileName", file}, {"Mode", "write"}, {"Channels", 2}, {"SampleFormat", "ULAW"}});
+    const auto write = [&](const char* type, const auto& values) {
+        double written = 0;
+        coderOutputStreamWriteTypedDataOld(channel.output, &written, 1, type,
+                                           CODER_BUFFER(values.size(), values.data()));
+        EXPECT_EQ(written, values.size());
+    };
+    write("int64", std::vector<int64_t>{1, 2, 3});
+    write("int16", std::vector<int16_t>{-32768, 16384});
+    write("int64", std::vector<int64_t>{1});
+    write("float", std::vector{0.25F});
+    EXPECT_EQ(channel.write({1e6, -1e6, std::nan("")}), 3);
+    EXPECT_EQ(channel.close(), 1);
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:wrongType|4 counts were not written to " + file +
+                                        ": samples must be double, float, int8, int16 or int32.");
+    std::ofstream(file, std::ios::app) << "e";
+    channel.start(
+        {{"FileName", file}, {"SampleRate", 8000}, {"Channels", 2}, {"SampleFormat", "ULAW"}});
+    EXPECT_EQ(channel.asyncError(),
+              "brenix:Device:failed|The last frame of " + file + " has 1 of 2 bytes.");
+    Numbers samples = channel.read(3, 1);
+    for (double& sample : samples) {
+        sample = std::round(sample * 20) / 20;
+    }
+    EXPECT_EQ(samples, (Numbers{-1, 0.5, 0.25, 1, -1, 0}));
+    std::remove(file.c_str());
+}
+
+TEST(AudioFileTest, LostSamplesAreTold)
+{
+    Numbers noise(4000);
+    for (std::size_t i = 1; i < noise.size(); ++i) {
+        noise[i] = std::fmod(noise[i - 1] * 16807 + 0.123, 1);
+    }
+    rlimit before{};
+    getrlimit(RLIMIT_FSIZE, &before);
+    const rlimit full{4096, before.rlim_max}; // bytes that a file has room for
+    std::signal(SIGXFSZ, SIG_IGN);
+    const struct {
+        const char *ending, *format;
+        const char* lost; ///< on a full disk: samples that were not taken; null: all were
+        const char* cut;  ///< or reading a file that was cut: the error
+    } rows[] = {{".wav", "PCM_16", " 5974 samples were not taken.", nullptr},
+                {".flac", "PCM_16", " 4000 samples were not taken.", nullptr},
+                {".ogg", "VORBIS", nullptr, nullptr},
+                {".mp3", "MPEG_LAYER_III", nullptr, " of its 8000 frames."},
+                {".flac", "PCM_16", nullptr, "Error : flac decoder lost sync."}};
+    for (const auto& [ending, format, lost, cut] : rows) {
+        SCOPED_TRACE(ending);
+        const std::string file = soundFile + ending;
+        const std::string error = "Could not write " + file + ": File too large.";
+        Channel channel("audiofile");
+        channel.init({{"FileName", file}, {"Mode", "write"}, {"SampleFormat", format}});
+        EXPECT_EQ(channel.write(noise) + channel.write(noise), 8000);
+        setrlimit(RLIMIT_FSIZE, cut == nullptr ? &full : &before);
+        channel.open();
+        channel.close();
+        setrlimit(RLIMIT_FSIZE, &before);
+        EXPECT_EQ(channel.error(),
+                  cut != nullptr ? "|" : unexpected + error + " The file is not complete.");
+        EXPECT_EQ(channel.error(coderChannelGetLastAsyncError),
+                  lost == nullptr ? "|" : "brenix:Device:failed|" + error + lost);
+        if (cut != nullptr) {
+            std::filesystem::resize_file(file, std::filesystem::file_size(file) * 2 / 3);
+            channel.start({{"FileName", file}, {"BlockSize", 3000}});
+            EXPECT_NE(channel.asyncError().find(cut), std::string::npos);
+            const double arrived = channel.ask(coderStreamGetDataAvailable, channel.input);
+            EXPECT_TRUE(arrived > 3000 && arrived != 6000) << arrived; // all that could be read
+        }
+        std::remove(file.c_str());
+    }
+
+    const std::string file = soundFile + ".caf"; // which is encoded into a temporary file
+    Channel channel("audiofile");
+    channel.start({{"FileName", file}, {"Mode", "write"}, {"SampleFormat", "ALAC_16"}});
+    setenv("TMPDIR", "/proc", 1); // where there is no room
+    EXPECT_EQ(channel.write(noise), 4000);
+    EXPECT_NE(channel.asyncError().find("temporary file. 4000 samples"), std::string::npos);
+    unsetenv("TMPDIR");
     std::remove(file.c_str());
 }
 
@@ -571,7 +672,10 @@ TEST(OptionsTest, BadOnesAreNamed)
         {"audiofile",
          {"Mode", "write"},
          "FileName: has an ending that names no sound file format: a.x."},
-        {"audiofile", {"SampleFormat", "PCM_16"}, "SampleFormat: is not known."},
+        {"audiofile",
+         {"SampleFormat", "PCM_16"},
+         "SampleFormat: cannot be given: a.x tells it itself."},
+        {"audiofile", {"FileName", "a.raw"}, "SampleRate: must be given: a.raw does not tell it."},
         {"audiofile", {"BlokSize", 1}, "BlokSize: is not known."},
         {"audiofile", {"BlockSize", 0}, "BlockSize: must be a whole number from 1 to 16777216."},
         {"audiofile", {"BlockSize", "1"}, "BlockSize: must be one number."},
