@@ -59,21 +59,27 @@ constexpr std::string_view checkSound = R"(    if (info.channels != COLUMNS) {
 )";
 
 constexpr std::string_view hasAll =
-    R"(/* At the end: libsndfile says nothing of what the header of a WAV file tells and is not there. */
+    R"(/* At the end: whether it is that of the last frame. A huge length stands for one that is not known. */
 static int hasAll(SNDFILE* file, sf_count_t frames)
 {
-    static const int sizes[] = {0, 1, 2, 3, 4, 1, 4, 8}; /* of a sample in its encodings, from 1 on */
-    SF_CHUNK_INFO data = {"data", 4, 0, NULL};
-    SF_CHUNK_ITERATOR* const chunk = sf_get_chunk_iterator(file, &data);
+    static const int sizes[] = {0, 1, 2, 3, 4, 1, 4, 8}; /* of a sample in the encodings from 1 on */
     const int container = info.format & SF_FORMAT_TYPEMASK;
     const int encoding = info.format & SF_FORMAT_SUBMASK;
-    if ((container != SF_FORMAT_WAV && container != SF_FORMAT_WAVEX) || encoding > SF_FORMAT_DOUBLE ||
-        chunk == NULL || sf_get_chunk_size(chunk, &data) != SF_ERR_NO_ERROR ||
-        data.datalen >= 0x7FFFF000 || frames * COLUMNS * sizes[encoding] >= data.datalen) {
-        return 1; /* a length near the end of the range stands for one that is not known */
+    int isComplete = frames >= info.frames || info.frames >= (sf_count_t)1 << 40 ||
+                     container == SF_FORMAT_AIFF; /* an empty one has some frames for libsndfile */
+    if (container == SF_FORMAT_WAV || container == SF_FORMAT_WAVEX) {
+        /* Of a file that was cut, libsndfile counts what is there. */
+        SF_CHUNK_INFO data = {"data", 4, 0, NULL};
+        SF_CHUNK_ITERATOR* const chunk = sf_get_chunk_iterator(file, &data);
+        isComplete = encoding > SF_FORMAT_DOUBLE || chunk == NULL ||
+                     sf_get_chunk_size(chunk, &data) != SF_ERR_NO_ERROR ||
+                     data.datalen >= 0x7FFFF000 ||
+                     frames * COLUMNS * sizes[encoding] >= data.datalen;
     }
-    fprintf(stderr, "%s: the last frame is not complete\n", name);
-    return 0;
+    if (!isComplete) {
+        fprintf(stderr, "%s: it ends after %ld frames and should have more\n", name, (long)frames);
+    }
+    return isComplete;
 }
 
 )";

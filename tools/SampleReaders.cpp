@@ -2,6 +2,7 @@
 
 #include "Commands.hpp"
 #include "Samples.hpp"
+#include "plugins/SoundFormat.hpp"
 
 #include <fcntl.h>
 #include <poll.h>
@@ -9,6 +10,7 @@
 
 #include <array>
 #include <cstddef>
+#include <cstdio>
 #include <filesystem>
 #include <iostream>
 #include <system_error>
@@ -38,6 +40,28 @@ void openInput(const SampleFile& file)
     if (isInterrupted()) {
         endInput();
     }
+}
+
+/// Puts a file in the place of a pipe, once it has all that comes.
+void holdInput(const std::string& name)
+{
+    const OwnedFile file(std::tmpfile());
+    if (!file) {
+        failAsErrno("a temporary file");
+    }
+    std::array<char, 65536> block{};
+    ssize_t size = 0;
+    while ((size = ::read(STDIN_FILENO, block.data(), block.size())) > 0) {
+        std::fwrite(block.data(), 1, static_cast<std::size_t>(size), file.get());
+    }
+    if (size < 0) {
+        failAsErrno(name);
+    }
+    if (std::fflush(file.get()) != 0 || std::ferror(file.get()) != 0) {
+        failAsErrno("a temporary file");
+    }
+    std::rewind(file.get());
+    ::dup2(::fileno(file.get()), STDIN_FILENO);
 }
 
 /// At the end of the input: whether it was its end.
@@ -157,16 +181,6 @@ public:
     }
 };
 
-/// Bytes of a sample in a WAV file; 0 when they are not all alike, or in another file.
-int wavSampleSize(const SF_INFO& info)
-{
-    constexpr std::array sizes = {0, 1, 2, 3, 4, 1, 4, 8}; // in the encodings from 1 on
-    const int container = info.format & SF_FORMAT_TYPEMASK;
-    const auto encoding = static_cast<std::size_t>(info.format & SF_FORMAT_SUBMASK);
-    const bool isWav = container == SF_FORMAT_WAV || container == SF_FORMAT_WAVEX;
-    return isWav && encoding < sizes.size() ? sizes.at(encoding) : 0;
-}
-
 class SoundReader : public SampleReader
 {
 public:
@@ -208,22 +222,30 @@ public:
     }
 
 private:
-    /// At the end: libsndfile says nothing of what the header of a WAV file tells and is not there.
+    /// At the end: whether it is that of the last frame. A huge length stands for one that is not known.
     void requireAll()
     {
-        const sf_count_t frameSize = sf_count_t{info.channels} * wavSampleSize(info);
-        SF_CHUNK_INFO data{"data", 4, 0, nullptr};
-        SF_CHUNK_ITERATOR* const chunk = sf_get_chunk_iterator(sound.get(), &data);
-        if (frameSize == 0 || chunk == nullptr ||
-            sf_get_chunk_size(chunk, &data) != SF_ERR_NO_ERROR || data.datalen >= 0x7FFFF000) {
-            return; // a length near the end of the range stands for one that is not known
+        const int container = info.format & SF_FORMAT_TYPEMASK;
+        sf_count_t all = info.frames;
+        if (container == SF_FORMAT_WAV || container == SF_FORMAT_WAVEX) {
+            // Of a file that was cut, libsndfile counts what is there.
+            const auto frameSize = static_cast<sf_count_t>(sampleSize(info.format) * columns);
+            SF_CHUNK_INFO data{"data", 4, 0, nullptr};
+            SF_CHUNK_ITERATOR* const chunk = sf_get_chunk_iterator(sound.get(), &data);
+            if (frameSize == 0 || chunk == nullptr ||
+                sf_get_chunk_size(chunk, &data) != SF_ERR_NO_ERROR || data.datalen >= 0x7FFFF000) {
+                return;
+            }
+            all = data.datalen / frameSize;
+            if (const sf_count_t torn = data.datalen % frameSize; torn > 0 && frames == all) {
+                fail(name, "the last frame has " + std::to_string(torn) + " of " +
+                               std::to_string(frameSize) + " bytes");
+            }
         }
-        const sf_count_t rest = data.datalen - frames * frameSize;
-        if (rest > 0) {
-            fail(name, rest < frameSize ? "the last frame has " + std::to_string(rest) + " of " +
-                                              std::to_string(frameSize) + " bytes"
-                                        : "it ends after " + std::to_string(frames) + " of " +
-                                              std::to_string(data.datalen / frameSize) + " frames");
+        // An empty AIFF file has some frames for libsndfile.
+        if (frames < all && all < 1L << 40 && container != SF_FORMAT_AIFF) {
+            fail(name, "it ends after " + std::to_string(frames) + " of " + std::to_string(all) +
+                           " frames");
         }
     }
 
@@ -240,7 +262,10 @@ std::unique_ptr<SampleReader> openReader(const SampleFile& file, const ElementTy
         throw Failure("", "samples are numbers, not char");
     }
     openInput(file);
-    if (findSoundFormat(file.format) != nullptr) {
+    if (const SoundFormat* const format = findSoundFormat(file.format)) {
+        if (!format->isStream && ::lseek(STDIN_FILENO, 0, SEEK_CUR) == -1) {
+            holdInput(file.inputName());
+        }
         return std::make_unique<SoundReader>(file, type);
     }
     const ElementType& elements = type != nullptr ? *type : elementType("double");

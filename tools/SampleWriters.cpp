@@ -2,6 +2,7 @@
 
 #include "Commands.hpp"
 #include "Samples.hpp"
+#include "plugins/SoundFile.hpp"
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -13,8 +14,8 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
+#include <optional>
 #include <string_view>
-#include <system_error>
 #include <thread>
 #include <utility>
 
@@ -135,36 +136,6 @@ private:
     std::string text;
 };
 
-/// The file under a sound file. libsndfile does not tell of a write that fails while it closes a file: the
-/// first error is kept here.
-struct SoundDisk {
-    OwnedFile file;
-    int error = 0;
-
-    static std::FILE* fileOf(void* user) { return static_cast<SoundDisk*>(user)->file.get(); }
-    static sf_count_t tell(void* user) { return ::ftello(fileOf(user)); }
-    static sf_count_t seek(sf_count_t offset, int whence, void* user)
-    {
-        return ::fseeko(fileOf(user), offset, whence) == 0 ? tell(user) : -1;
-    }
-    static sf_count_t length(void* user)
-    {
-        const sf_count_t position = tell(user);
-        const sf_count_t end = seek(0, SEEK_END, user);
-        seek(position, SEEK_SET, user);
-        return end;
-    }
-    static sf_count_t read(void* /*data*/, sf_count_t /*size*/, void* /*user*/) { return 0; }
-    static sf_count_t write(const void* data, sf_count_t size, void* user)
-    {
-        auto& disk = *static_cast<SoundDisk*>(user);
-        const auto written = static_cast<sf_count_t>(
-            std::fwrite(data, 1, static_cast<std::size_t>(size), disk.file.get()));
-        disk.error = written == size || disk.error != 0 ? disk.error : errno;
-        return written;
-    }
-};
-
 class SoundWriter : public SampleWriter
 {
 public:
@@ -176,27 +147,26 @@ public:
         // The length stands at the front: a pipe gets the file when it is complete.
         if (sampleFile.isPipe() || ::lseek(::fileno(output.get()), 0, SEEK_CUR) == -1) {
             pipe = std::move(output);
-            output.reset(std::tmpfile());
-            if (!output) {
+            whole.reset(std::tmpfile());
+            if (!whole) {
                 failAsErrno("a temporary file");
             }
+            output.reset(::fdopen(::dup(::fileno(whole.get())), "wb"));
         }
-        disk.file = std::move(output);
-        std::setvbuf(disk.file.get(), nullptr, _IONBF, 0);
-        SF_VIRTUAL_IO calls = {SoundDisk::length, SoundDisk::seek, SoundDisk::read,
-                               SoundDisk::write, SoundDisk::tell};
-        sound.reset(sf_open_virtual(&calls, SFM_WRITE, &info, &disk));
-        if (!sound) {
-            fail(name, sf_strerror(nullptr));
+        disk = output.get();
+        sound.emplace(output.release(), info);
+        if (sound->get() == nullptr) {
+            fail(name, sound->error());
         }
-        sf_command(sound.get(), SFC_SET_CLIPPING, nullptr, SF_TRUE); // the scale of PCM is 2^n
-        sf_command(sound.get(), SFC_SET_ADD_PEAK_CHUNK, nullptr, SF_FALSE); // it has the time in it
+        sf_command(sound->get(), SFC_SET_CLIPPING, nullptr, SF_TRUE); // the scale of PCM is 2^n
+        sf_command(sound->get(), SFC_SET_ADD_PEAK_CHUNK, nullptr,
+                   SF_FALSE);           // it has the time in it
         if (startsWithHeader(format)) { // then a file of no frames is one, too
-            sf_command(sound.get(), SFC_UPDATE_HEADER_NOW, nullptr, 0);
+            sf_command(sound->get(), SFC_UPDATE_HEADER_NOW, nullptr, 0);
         }
         if (format.encoding.value == 0 && format.container.value != SF_FORMAT_FLAC) {
             // Whenever the command is killed, the file is one.
-            sf_command(sound.get(), SFC_SET_UPDATE_HEADER_AUTO, nullptr, SF_TRUE);
+            sf_command(sound->get(), SFC_SET_UPDATE_HEADER_AUTO, nullptr, SF_TRUE);
         }
     }
 
@@ -208,38 +178,24 @@ public:
         } else if (clips && type.name == std::string_view("float")) {
             clip<float>(rows);
         }
-        if (static_cast<double>(SoundDisk::tell(&disk)) >
+        if (static_cast<double>(::ftello(disk)) >
             mostBytes(format, static_cast<double>(rows.size()))) {
             fail(name, "a file of format " + std::string(format.name) + " ends at 4 GiB");
         }
         const auto items = static_cast<sf_count_t>(rows.size() / type.size);
-        if (soundOf.write(sound.get(), rows.data(), items) != items || disk.error != 0) {
-            failAsTold(sf_error(sound.get()));
+        const sf_count_t written = soundOf.write(sound->get(), rows.data(), items);
+        if (const std::string error = sound->error(); written != items || !error.empty()) {
+            fail(name, error);
         }
     }
 
     void finish() override
     {
-        const int error = sf_close(sound.release());
-        if (error != SF_ERR_NO_ERROR || disk.error != 0) {
-            failAsTold(error);
+        if (const std::string error = sound->close(); !error.empty()) {
+            fail(name, error);
         }
         if (pipe) {
-            std::rewind(disk.file.get());
-            std::array<char, 65536> block{};
-            while (const std::size_t part =
-                       std::fread(block.data(), 1, block.size(), disk.file.get())) {
-                if (std::fwrite(block.data(), 1, part, pipe.get()) != part) {
-                    failAsErrno(name);
-                }
-            }
-            if (std::ferror(disk.file.get()) != 0) {
-                fail(name, "the temporary file cannot be read");
-            }
-            disk.file = std::move(pipe);
-        }
-        if (std::fclose(disk.file.release()) != 0) {
-            failAsErrno(name);
+            copyToPipe();
         }
         if (clipped > 0) {
             fail(name, std::to_string(clipped) + " samples beyond full scale were cut off");
@@ -247,10 +203,21 @@ public:
     }
 
 private:
-    [[noreturn]] void failAsTold(int error)
+    void copyToPipe()
     {
-        fail(name, disk.error != 0 ? std::generic_category().message(disk.error)
-                                   : sf_error_number(error));
+        std::rewind(whole.get());
+        std::array<char, 65536> block{};
+        while (const std::size_t part = std::fread(block.data(), 1, block.size(), whole.get())) {
+            if (std::fwrite(block.data(), 1, part, pipe.get()) != part) {
+                failAsErrno(name);
+            }
+        }
+        if (std::ferror(whole.get()) != 0) {
+            fail(name, "the temporary file cannot be read");
+        }
+        if (std::fclose(pipe.release()) != 0) {
+            failAsErrno(name);
+        }
     }
 
     template <typename T>
@@ -270,10 +237,11 @@ private:
     const ElementType& type;
     const SoundType& soundOf;
     bool clips;
-    long clipped = 0; ///< samples
-    OwnedFile pipe;   ///< nothing when the sound file can be written in place
-    SoundDisk disk;
-    OwnedSound sound;
+    long clipped = 0;          ///< samples
+    OwnedFile pipe;            ///< nothing when the sound file can be written in place
+    OwnedFile whole;           ///< what then goes to the pipe
+    std::FILE* disk = nullptr; ///< under the sound file
+    std::optional<SoundFile> sound;
 };
 
 } // namespace

@@ -26,6 +26,7 @@ struct SoundFormat {
     SoundConstant container;
     SoundConstant encoding; ///< 0 when it has several: then the elements decide
     bool isLarge;           ///< whether its files may have more than 4 GiB
+    bool isStream;          ///< whether libsndfile reads them from a pipe
 };
 
 /// All that libsndfile writes and that keep the sample rate and the number of frames.
