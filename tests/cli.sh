@@ -226,6 +226,7 @@ loud.flac|[0-9]+ samples beyond full scale
 /dev/stdout|Illegal seek
 END
 emitted b.flac write audiofile -o FileName=b.flac -o Mode=write -o Channels=2 -i a.flac
+grep -q 'static double elements' program.c || fail "the type that audiofile takes is not written"
 emitted b.au write audiofile -o FileName=b.au -o Mode=write -o Channels=2 -o SampleFormat=DOUBLE -i a.wav
 emitted c.wav write audiofile -o FileName=c.wav -o Mode=write -o Channels=2 -i samples.csv -f 'scale Gain=0.1'
 emitted d.wav write audiofile -o FileName=d.wav -o Mode=write -o Channels=2 --format raw -i samples.raw -n 3000

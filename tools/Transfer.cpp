@@ -71,14 +71,19 @@ std::string typeOfData(const std::vector<DescribedValue>& fields,
 /// The element type that is asked for or that the plug-ins take; null when nobody tells.
 const ElementType* typeToWrite(const Settings& settings)
 {
-    std::string type = settings.type;
+    if (!settings.type.empty()) {
+        return &elementType(settings.type);
+    }
     for (const std::string& name : {settings.channel.converter, settings.channel.device}) {
-        if (type.empty()) {
-            const auto plugin = inspectPlugin(name);
-            type = typeOfData(plugin.outputFields, plugin.options, settings);
+        const auto plugin = inspectPlugin(name);
+        const std::string type = typeOfData(plugin.outputFields, plugin.options, settings);
+        for (const ElementType& known : elementTypes()) { // the device refuses others itself
+            if (known.name == type) {
+                return &known;
+            }
         }
     }
-    return type.empty() ? nullptr : &elementType(type);
+    return nullptr;
 }
 
 /// The fields of a device that was done before it delivered any, as far as it tells.
