@@ -7,6 +7,7 @@
 #include "channel/Channel.hpp"
 #include "channel/Exceptions.hpp"
 #include "util/Arguments.hpp"
+#include "util/Handle.hpp"
 
 #include <exception>
 
@@ -29,36 +30,46 @@ int guarded(Body&& body, OnFailure&& onFailure) noexcept
     return 0;
 }
 
-/// Runs the body with the channel and records an exception as its last error. A null channel fails
-/// and nothing else.
+/// Runs the body and records an exception as the channel's last error. A null channel fails and
+/// nothing else.
 template <typename Body>
-int callKeepingLastError(void* handle, Body&& body) noexcept
+int recorded(Channel* channel, Body&& body) noexcept
 {
-    auto* const channel = static_cast<Channel*>(handle);
     if (channel == nullptr) {
         return 0;
     }
-    return guarded([&] { body(*channel); },
+    return guarded(body,
                    [&](const std::exception* exception) { channel->recordLastError(exception); });
 }
 
-/// The call frame: clears the channel's last error first.
+/// The call frame without its first step.
+template <typename Body>
+int callKeepingLastError(void* handle, Body&& body) noexcept
+{
+    auto* const channel = fromHandle<Channel>(handle);
+    return recorded(channel, [&] { body(*channel); });
+}
+
+/// The call frame: clears the channel's last error, then runs the body with the channel.
 template <typename Body>
 int callChannel(void* handle, Body&& body) noexcept
 {
-    if (handle != nullptr) {
-        static_cast<Channel*>(handle)->clearLastError();
-    }
-    return callKeepingLastError(handle, body);
+    return callKeepingLastError(handle, [&](Channel& channel) {
+        channel.clearLastError();
+        body(channel);
+    });
 }
 
 /// The call frame on the channel that owns a stream.
 template <typename Body>
 int callStream(void* handle, Body&& body) noexcept
 {
-    auto* const stream = static_cast<Stream*>(handle);
-    return callChannel(stream == nullptr ? nullptr : &stream->getChannel(),
-                       [&](Channel&) { body(*stream); });
+    auto* const stream = fromHandle<Stream>(handle);
+    auto* const channel = stream == nullptr ? nullptr : &stream->getChannel();
+    return recorded(channel, [&] {
+        channel->clearLastError();
+        body(*stream);
+    });
 }
 
 /// The call frame for a query, whose answer is written only when there is one.

@@ -30,7 +30,7 @@ void* coderChannelCreate(const char* devicePath, const char* converterPath, char
                 copyToBuffer(message.view(), errorMessage, errorBufferSize);
             }
         });
-    return channel;
+    return toHandle(channel);
 }
 
 int coderChannelInit(void* channel, uint64_t optionCount, ...) noexcept
@@ -81,20 +81,20 @@ int coderChannelIsOpen(void* channel, uint8_t* open) noexcept
 
 void coderChannelDestroy(void* channel) noexcept
 {
-    delete static_cast<Channel*>(channel);
+    delete fromHandle<Channel>(channel);
 }
 
 void* coderChannelGetInputStream(void* channel) noexcept
 {
-    Stream* stream = nullptr;
-    callChannel(channel, [&](Channel& c) { stream = c.getInputStream(); });
+    void* stream = nullptr;
+    callChannel(channel, [&](Channel& c) { stream = toHandle(c.getInputStream()); });
     return stream;
 }
 
 void* coderChannelGetOutputStream(void* channel) noexcept
 {
-    Stream* stream = nullptr;
-    callChannel(channel, [&](Channel& c) { stream = c.getOutputStream(); });
+    void* stream = nullptr;
+    callChannel(channel, [&](Channel& c) { stream = toHandle(c.getOutputStream()); });
     return stream;
 }
 

@@ -22,12 +22,13 @@ void copyToBuffers(const ErrorText& id, const ErrorText& message, char* errorId,
 
 int coderChannelGetLastError(void* channel, char* errorId, char* errorMessage) noexcept
 {
-    if (channel == nullptr || errorId == nullptr || errorMessage == nullptr) {
+    auto* const object = fromHandle<Channel>(channel);
+    if (object == nullptr || errorId == nullptr || errorMessage == nullptr) {
         return 0; // recording why would replace the error that is asked for
     }
     ErrorText id;
     ErrorText message;
-    static_cast<Channel*>(channel)->getLastError(id, message);
+    object->getLastError(id, message);
     copyToBuffers(id, message, errorId, errorMessage);
     return 1;
 }

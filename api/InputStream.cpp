@@ -12,8 +12,10 @@ int coderInputStreamPeek(void* stream, double* totalCounts, double* bufferCounts
     }
     return callStream(stream, [&](Stream& s) {
         requireArgument(totalCounts, "totalCounts");
-        requireArgument(bufferCounts, "bufferCounts");
         requireArgument(numBuffers, "numBuffers");
+        if (*numBuffers >= 1) {
+            requireArgument(bufferCounts, "bufferCounts");
+        }
         directed<InputStream>(s).peek(totalCounts, bufferCounts, numBuffers, maxCounts);
     });
 }

@@ -7,7 +7,8 @@ using namespace brenixcoder;
 
 void* coderStreamGetChannel(void* stream) noexcept
 {
-    return stream == nullptr ? nullptr : &static_cast<Stream*>(stream)->getChannel();
+    auto* const object = fromHandle<Stream>(stream);
+    return object == nullptr ? nullptr : toHandle(&object->getChannel());
 }
 
 int coderStreamIsSupported(void* stream, uint8_t* supported) noexcept

@@ -7,7 +7,8 @@ namespace brenixcoder
 
 Channel::Channel(const std::string& devicePath, const std::string& converterPath,
                  uint64_t firstLimit, uint64_t secondLimit)
-    : converter(converterPath), coreChannel(devicePath, converter, *this, firstLimit, secondLimit),
+    : Marked(ownMark), converter(converterPath),
+      coreChannel(devicePath, converter, *this, firstLimit, secondLimit),
       ownerThread(std::this_thread::get_id())
 {
 }
@@ -25,16 +26,20 @@ void Channel::init(uint64_t optionCount, va_list* options)
     buildOptionMap(optionMap, optionCount, options);
     coreChannel.init(optionMap, properties);
 
-    // The core's earlier streams may be gone now: an old wrapper that cannot be replaced below must
-    // not refer to them.
-    if (inputStream) {
-        inputStream->detach();
+    // The core's earlier streams may be gone now, and the old wrappers stay.
+    InputStream* const oldInput = getInputStream();
+    OutputStream* const oldOutput = getOutputStream();
+    if (oldInput != nullptr) {
+        oldInput->detach();
     }
-    if (outputStream) {
-        outputStream->detach();
+    if (oldOutput != nullptr) {
+        oldOutput->detach();
     }
-    inputStream = std::make_unique<InputStream>(coreChannel.getInputStream(), *this);
-    outputStream = std::make_unique<OutputStream>(coreChannel.getOutputStream(), *this);
+    inputStreams.emplace_front(coreChannel.getInputStream(), *this);
+    if (oldInput != nullptr) {
+        oldInput->freeBuffers();
+    }
+    outputStreams.emplace_front(coreChannel.getOutputStream(), *this);
 }
 
 void Channel::open(uint64_t optionCount, va_list* options)

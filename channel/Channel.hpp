@@ -7,11 +7,12 @@
 #include "channel/ErrorText.hpp"
 #include "streams/InputStream.hpp"
 #include "streams/OutputStream.hpp"
+#include "util/Handle.hpp"
 
 #include <cstdarg>
 #include <cstdint>
 #include <exception>
-#include <memory>
+#include <forward_list>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -22,9 +23,11 @@ namespace brenixcoder
 /// The object behind a channel handle: a core channel with its converter, the three error records,
 /// the device's properties and the two stream wrappers. Used on the thread that made it; the core
 /// calls the handler operations on any thread.
-class Channel : public brenixcore::Channel::IEventHandler
+class Channel : public brenixcore::Channel::IEventHandler, public Marked
 {
 public:
+    static constexpr Mark ownMark = Mark::Channel;
+
     Channel(const std::string& devicePath, const std::string& converterPath, uint64_t firstLimit,
             uint64_t secondLimit);
     Channel(const Channel&) = delete;
@@ -54,8 +57,14 @@ public:
     bool isOpen() const { return coreChannel.isOpen(); }
 
     /// Null before the first successful init; replaced by each.
-    InputStream* getInputStream() const noexcept { return inputStream.get(); }
-    OutputStream* getOutputStream() const noexcept { return outputStream.get(); }
+    InputStream* getInputStream() noexcept
+    {
+        return inputStreams.empty() ? nullptr : &inputStreams.front();
+    }
+    OutputStream* getOutputStream() noexcept
+    {
+        return outputStreams.empty() ? nullptr : &outputStreams.front();
+    }
 
     /// Copies a property's value to the destination that is next in `rest`.
     void getPropertyValue(const std::string& name, const std::string& typeName, int capacity,
@@ -95,8 +104,9 @@ private:
     ErrorText asyncErrorMessage;
     std::mutex propertyMutex;
     brenixplugin::PropertyMap properties; ///< owns its objects
-    std::unique_ptr<InputStream> inputStream;
-    std::unique_ptr<OutputStream> outputStream;
+    // Behind the current one those that were replaced, whose handles the caller may still have.
+    std::forward_list<InputStream> inputStreams;
+    std::forward_list<OutputStream> outputStreams;
 };
 
 } // namespace brenixcoder

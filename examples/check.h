@@ -8,7 +8,7 @@
 
 /*
  * Returns the result of a call. When that is 0, prints why: the last error or, when it is empty,
- * the error that a plug-in raised inside the call.
+ * the error that a plug-in raised inside the call; behind an identifier alone, the core's reason.
  */
 static int check(void* channel, const char* call, int result)
 {
@@ -20,6 +20,9 @@ static int check(void* channel, const char* call, int result)
     (void)coderChannelGetLastError(channel, id, message);
     if (id[0] == '\0') {
         (void)coderChannelGetLastSyncError(channel, id, message);
+    }
+    if (message[0] == '\0') { /* stays empty when the core tells no reason */
+        (void)coderChannelGetPropertyValue(channel, "Reason", "char", CODER_ERROR_SIZE, message);
     }
     fprintf(stderr, "%s: %s: %s\n", call, id, message);
     return 0;

@@ -71,7 +71,8 @@ public:
         publish(properties, "Channels", static_cast<unsigned int>(format.channels));
         publish(properties, "Frames", static_cast<long>(format.frames));
         return writes ? DeviceInfo{std::nullopt, StreamInfo{}}
-                      : DeviceInfo{StreamInfo{}, std::nullopt};
+                      : DeviceInfo{StreamInfo{1, static_cast<double>(format.samplerate)},
+                                   std::nullopt};
     }
 
     void open(const PropertyMap& options) override

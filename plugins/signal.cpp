@@ -48,6 +48,22 @@ Waveform waveformOf(const std::string& name)
     return nullptr;
 }
 
+enum class Pace { RealTime, Live, Fast };
+
+Pace paceOf(const std::string& name)
+{
+    if (name == "realtime") {
+        return Pace::RealTime;
+    }
+    if (name == "live") {
+        return Pace::Live;
+    }
+    if (name != "fast") {
+        Options::fail("Pace", "must be realtime, live or fast, not " + name);
+    }
+    return Pace::Fast;
+}
+
 class Signal : public Device
 {
 public:
@@ -60,11 +76,7 @@ public:
         if (waveform == nullptr) {
             Options::fail("Waveform", "must be sine, square, ramp or noise, not " + name);
         }
-        const std::string pace = options.text("Pace").value_or("realtime");
-        if (pace != "realtime" && pace != "fast") {
-            Options::fail("Pace", "must be realtime or fast, not " + pace);
-        }
-        realTime = pace == "realtime";
+        pace = paceOf(options.text("Pace").value_or("realtime"));
         channels = options.wholeNumber("Channels", 1, 1024).value_or(1);
         blockSize = options.wholeNumber("BlockSize", 1, 1L << 20).value_or(1024);
         frames = options.wholeNumber("Frames", 1, 1L << 53).value_or(0);
@@ -81,32 +93,40 @@ public:
         publish(properties, "Channels", static_cast<unsigned int>(channels));
         publish(properties, "Frequency", frequency);
         publish(properties, "Amplitude", amplitude);
-        return {StreamInfo{}, std::nullopt};
+        return {StreamInfo{1, sampleRate}, std::nullopt};
     }
 
     void open(const PropertyMap& options) override { Options(options).requireAllKnown(); }
 
     void run(DeviceStreams& streams) override
     {
+        using std::chrono::system_clock;
         const auto start = std::chrono::steady_clock::now();
+        const auto startTime = system_clock::now();
         double phase = 0;
         std::mt19937_64 random; // NOLINT(cert-msc32-c,cert-msc51-cpp): the same noise each time
         for (long first = 0; frames == 0 || first < frames; first += blockSize) {
             const long count = frames == 0 ? blockSize : std::min(blockSize, frames - first);
-            if (realTime) {
+            Packet packet;
+            if (pace != Pace::Fast) {
                 // A block is there when its last frame is.
-                constexpr double longest =
-                    1e9; // what comes later than a clock can tell never comes
-                const std::chrono::duration<double> due(
-                    std::min(static_cast<double>(first + count) / sampleRate, longest));
                 std::unique_lock lock(mutex);
-                changed.wait_until(
-                    lock,
-                    start + std::chrono::duration_cast<std::chrono::steady_clock::duration>(due),
-                    [&] { return streams.isClosing(); });
+                changed.wait_until(lock, start + durationOf(first + count),
+                                   [&] { return streams.isClosing(); });
+                packet.time = std::chrono::duration_cast<std::chrono::nanoseconds>(
+                                  (startTime + durationOf(first)).time_since_epoch())
+                                  .count();
             }
-            if (!streams.push(block(count, phase, random))) {
-                return;
+            fill(packet, count, phase, random);
+            if (pace != Pace::Live) {
+                if (!streams.push(std::move(packet))) {
+                    return;
+                }
+            } else if (!streams.tryPush(packet)) {
+                if (streams.isClosing()) {
+                    return;
+                }
+                streams.tellLost(static_cast<std::uint64_t>(count), "nobody took them in time");
             }
         }
     }
@@ -146,8 +166,17 @@ private:
         amplitude = newAmplitude;
     }
 
-    /// The next frames. Channel i of k runs ahead by i / k of a period.
-    Packet block(long count, double& phase, std::mt19937_64& random)
+    /// How long so many frames take.
+    std::chrono::nanoseconds durationOf(long count) const
+    {
+        constexpr double longest = 1e9; // what comes later than a clock can tell never comes
+        const std::chrono::duration<double> seconds(
+            std::min(static_cast<double>(count) / sampleRate, longest));
+        return std::chrono::duration_cast<std::chrono::nanoseconds>(seconds);
+    }
+
+    /// Puts the next frames into a packet. Channel i of k runs ahead by i / k of a period.
+    void fill(Packet& packet, long count, double& phase, std::mt19937_64& random)
     {
         double step = 0;
         double factor = 0;
@@ -168,15 +197,13 @@ private:
             phase += step;
             phase -= std::floor(phase);
         }
-        Packet packet;
         packet.counts = static_cast<std::uint64_t>(count);
         setField(packet, makeArray(dataField, std::move(samples), size));
-        return packet;
     }
 
     DeviceHost* host = nullptr;
     Waveform waveform = nullptr;
-    bool realTime = true;
+    Pace pace = Pace::RealTime;
     long channels = 1;
     long blockSize = 1024;
     long frames = 0; ///< 0 is without end
@@ -198,7 +225,9 @@ constexpr OptionInfo optionTable[] = {
     {"BlockSize", "whole number", "frames", "1024", "of one packet"},
     {"Frames", "whole number", "frames", "endless", "after which the device is done"},
     {"Pace", "text", "", "realtime",
-     "realtime delivers a block when its last frame is due, fast as soon as there is room"},
+     "realtime delivers a block when its last frame is due, and what is due meanwhile later; live "
+     "as an instrument does that cannot be held back: what has no room at once is lost; fast as "
+     "soon as there is room"},
     {},
 };
 

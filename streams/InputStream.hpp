@@ -36,6 +36,9 @@ public:
     /// Releases a stored buffer.
     void freeBuffer(int32_t bufferIndex);
 
+    /// Releases all that is stored.
+    void freeBuffers() noexcept { DataList().buffers.swap(dataBuffers.buffers); }
+
 private:
     /// The store's position for a buffer; throws when no buffer is there.
     std::size_t positionOf(int32_t bufferIndex) const;

@@ -30,7 +30,8 @@ double OutputStream::writeTypedData(uint64_t numBuffers, const std::string& type
         dataList.buffers.push_back(buffer.get());
         buffer.release();
     }
-    return static_cast<double>(core.write(dataList.buffers));
+    return static_cast<double>(taker != nullptr ? taker->takeBuffers(dataList.buffers)
+                                                : core.write(dataList.buffers));
 }
 
 } // namespace brenixcoder

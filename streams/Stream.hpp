@@ -2,6 +2,7 @@
 #define BRENIXCODER_STREAMS_STREAM_HPP
 
 #include "brenixcore/Stream.hpp"
+#include "util/Handle.hpp"
 
 #include <cstdarg>
 #include <cstdint>
@@ -20,9 +21,11 @@ enum class StreamDirection : int32_t { Input = 0, Output = 1 };
 /// The object behind a stream handle. It exists also when the channel has no stream of its
 /// direction; then every operation that needs one throws InputStreamNotSupported or
 /// OutputStreamNotSupported.
-class Stream
+class Stream : public Marked
 {
 public:
+    static constexpr Mark ownMark = Mark::Stream;
+
     Stream(const Stream&) = delete;
     Stream& operator=(const Stream&) = delete;
     virtual ~Stream() = default;
@@ -64,7 +67,7 @@ public:
 
 protected:
     Stream(brenixcore::Stream* stream, StreamDirection streamDirection, Channel& owner) noexcept
-        : coreStream(stream), direction(streamDirection), channel(&owner)
+        : Marked(ownMark), coreStream(stream), direction(streamDirection), channel(&owner)
     {
     }
 

@@ -134,6 +134,14 @@ public:
         return id + "|"s + message;
     }
 
+    /// The core's property: why the last operation failed.
+    std::string reason() const
+    {
+        char text[CODER_ERROR_SIZE] = "";
+        coderChannelGetPropertyValue(handle, "Reason", "char", sizeof text, text);
+        return text;
+    }
+
     /// Waits for the asynchronous error.
     std::string asyncError() const
     {

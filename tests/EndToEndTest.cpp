@@ -8,15 +8,18 @@
 
 #include <cmath>
 #include <csignal>
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <map>
+#include <regex>
 
 using namespace driver;
 
 namespace
 {
 
+constexpr std::size_t npos = std::string::npos;
 const std::string plugins = TEST_PLUGINS "/";
 const std::string probe = plugins + "probe.so";
 const std::string pickyFilter = plugins + "pickyFilter.so";
@@ -120,8 +123,12 @@ TEST(StateTest, FailuresAndErrorsOfEachOperationReachTheCaller)
             EXPECT_EQ(channel.error(), error);
             EXPECT_EQ(channel.error(coderChannelGetLastSyncError),
                       raises ? "probe:raised|" + last.name : "|");
+            if (last.name != "init") { // of which there is no property yet
+                EXPECT_EQ(channel.reason(), raises ? last.name : error.substr(unexpected.size()));
+            }
             channel.close();              // if it is open
             EXPECT_EQ(channel.init(), 1); // and all is well again
+            EXPECT_EQ(channel.reason(), "");
         }
     }
 }
@@ -141,6 +148,7 @@ TEST(StreamTest, PeekListsWhatReadDelivers)
     EXPECT_EQ(channel.read(1, 1, "Stamp"), Numbers{30}); // repeated in each part
     EXPECT_EQ(channel.read(1, 1, "Odd").size(), 7);      // does not divide either
     EXPECT_EQ(channel.readError(8, 2), noInput);         // 6 are left
+    EXPECT_EQ(channel.reason(), "Cannot read 8 counts: there are 6 and the device is done.");
     EXPECT_EQ(channel.close(), 1);
     EXPECT_EQ(channel.read(6, 2), range(29, 35)); // also after close
     EXPECT_EQ(channel.peek(), Numbers{});
@@ -186,6 +194,18 @@ TEST(StreamTest, EveryWaitEnds)
     slow.waitForEnd();
     EXPECT_EQ(slow.writeError({1}), noOutput); // nobody takes it
 
+    // Nor what was written before, which is not for the next time.
+    slow.close();
+    EXPECT_EQ(slow.write({1, 2, 3}), 3);
+    ASSERT_EQ(slow.open(), 1);
+    slow.waitForEnd();
+    EXPECT_EQ(slow.asyncError(), "brenix:Device:failed|failed in run");
+    EXPECT_EQ(slow.close(), 1);
+    EXPECT_EQ(slow.asyncError(),
+              "brenix:Stream:dataLost|The device ended and did not take 3 counts: "
+              "failed in run");
+    EXPECT_EQ(slow.ask(coderStreamGetDataAvailable, slow.output), 0);
+
     Channel full(probe, 1); // the device waits for room, and close ends it
     full.start({{"Streams", "i"}, {"Packets", "1 1 1"}});
     Channel::waitUntil([&] { return full.peek().size() == 1; });
@@ -204,6 +224,8 @@ TEST(StreamTest, WritesAreTakenWholeOrNotAtAll)
     EXPECT_EQ(channel.writeError(range(0, 6)), noOutput);
     EXPECT_EQ(channel.write(range(0, 3)), 3); // before open, up to the limit
     EXPECT_EQ(channel.writeError(range(3, 6)), noOutput);
+    EXPECT_EQ(channel.reason(),
+              "Cannot write 3 counts: there is no room and the channel is not open.");
     EXPECT_EQ(channel.ask(coderStreamGetDataAvailable, channel.output), 3);
     EXPECT_EQ(channel.ask(coderStreamGetSpaceAvailable, channel.output), 2);
     EXPECT_EQ(coderStreamFlush(channel.output), 1);
@@ -322,6 +344,27 @@ TEST(EventTest, PropertiesFollowTheDevice)
     }
 }
 
+TEST(EventTest, ATraceHasALineForEachEvent)
+{
+    const std::string file = testing::TempDir() + "trace-" + std::to_string(getpid());
+    ASSERT_EQ(setenv("BRENIX_TRACE", file.c_str(), 1), 0);
+    {
+        Channel channel(probe);
+        unsetenv("BRENIX_TRACE");
+        channel.init();
+        EXPECT_EQ(channel.execute("updateFromThread"), 1);
+    }
+    std::ifstream stream(file);
+    const std::string text{std::istreambuf_iterator<char>(stream), {}};
+    const std::string start =
+        "\\d{4}-\\d\\d-\\d\\dT\\d\\d:\\d\\d:\\d\\d\\.\\d{6}Z thread \\d+ " + probe + " ";
+    EXPECT_TRUE(std::regex_match(text, std::regex(start + "warning probe:warning: is dropped\n" +
+                                                  start + " brenix:Device:failed: \n" + start +
+                                                  "error probe:thread: from a thread\n")))
+        << text;
+    std::remove(file.c_str());
+}
+
 TEST(ConversionTest, AFailureLosesOnePacketAtMost)
 {
     Channel channel(probe, infinity, infinity, plugins + "pickyConverter.so");
@@ -329,6 +372,7 @@ TEST(ConversionTest, AFailureLosesOnePacketAtMost)
     EXPECT_EQ(channel.writeError({1, 13}), noOutputConversion);
     ASSERT_EQ(channel.open(), 1);
     EXPECT_EQ(channel.readError(30, 3), noInputConversion);
+    EXPECT_EQ(channel.reason(), "13 is refused");
     EXPECT_EQ(channel.peek(), (Numbers{10, 10}));
     Numbers rest = range(0, 10);
     const Numbers third = range(20, 30);
@@ -383,8 +427,13 @@ TEST(FilterTest, FiltersApplyInOrderAndAreTuned)
     EXPECT_EQ(add(channel.input, inputFilter), "|");
     EXPECT_EQ(add(channel.output, pickyFilter), "|");
     EXPECT_EQ(add(channel.output, "./none"), "brenix:Stream:couldNotLoadFilter|");
+    EXPECT_EQ(channel.reason().find("Could not load ./none: ./none: cannot open"), 0);
     EXPECT_EQ(add(channel.output, "loopback"), "brenix:Stream:couldNotCreateFilter|");
-    EXPECT_EQ(add(channel.input, inputFilter, "Factr"), unexpected + "Option Factr: is not known.");
+    EXPECT_NE(channel.reason().find(": it is a device and no filter"), npos);
+    for (const std::string option : {"Factr", "Timeout"}) { // the second is the channel's
+        EXPECT_EQ(add(channel.input, inputFilter, option.c_str()),
+                  unexpected + "Option " + option + ": is not known.");
+    }
     ASSERT_EQ(channel.open(), 1);
     EXPECT_EQ(add(channel.input, pickyFilter), "brenix:Stream:cannotAddFilterWhileOpen|");
 
@@ -425,6 +474,38 @@ TEST(FilterTest, ScaleAndDecimate)
     EXPECT_EQ(std::vector<int>(back, back + 3), (std::vector<int>{-128, 127, 0}));
 }
 
+TEST(FilterTest, WhatFiltersMakeMoreOfWaitsForRoom)
+{
+    // 30 and 10 are on the input's side, the device has 40, 80 wait, and 40 found no room in time.
+    for (const auto& [limit, writes, waits] :
+         {std::tuple(infinity, 20, 0), std::tuple(30.0, 5, 2)}) {
+        Channel channel("loopback", limit, 100);
+        ASSERT_EQ(channel.init(), 1);
+        ASSERT_EQ(Channel::addFilter(channel.output, pickyFilter, {{"Times", 2}}), 1);
+        ASSERT_EQ(channel.open(limit == infinity ? 10 : 0.2), 1);
+        Numbers all;
+        const auto begin = std::chrono::steady_clock::now();
+        for (int i = 0; i < 20 && channel.write(Numbers(20, 100 + i)) == 20; ++i) {
+            all.insert(all.end(), 40, 100 + i);
+        }
+        EXPECT_GE(std::chrono::steady_clock::now() - begin, waits * std::chrono::milliseconds(200));
+        EXPECT_EQ(all.size(), writes * 40);
+        EXPECT_EQ(channel.reason(),
+                  waits == 0 ? ""
+                             : "Cannot write 20 counts: there is no room and the time is over.");
+        Numbers back;
+        while (back.size() < all.size() && !HasFailure()) {
+            Channel::waitUntil(
+                [&] { return channel.ask(coderStreamGetDataAvailable, channel.input) >= 20; });
+            for (const double value :
+                 channel.read(20, static_cast<double>(channel.peek(20).size()))) {
+                back.push_back(value);
+            }
+        }
+        EXPECT_EQ(back, all);
+    }
+}
+
 TEST(FilterTest, VectorsAreArrays)
 {
     Channel channel(probe, infinity, infinity, "columns");
@@ -440,6 +521,14 @@ TEST(FilterTest, VectorsAreArrays)
 
 TEST(FilterTest, FiltersOfOneStreamSeeWhatIsWrittenOnce)
 {
+    Channel picky("loopback", infinity, 2, plugins + "pickyConverter.so");
+    ASSERT_EQ(picky.init(), 1);
+    EXPECT_EQ(picky.write({20}), 1); // becomes the number of packets that the converter has seen
+    EXPECT_EQ(picky.writeError({20, 20}), noOutput);
+    ASSERT_EQ(picky.open(), 1);
+    EXPECT_EQ(picky.write({20, 5}), 2);
+    EXPECT_EQ(picky.read(3, 2), (Numbers{1, 2, 5}));
+
     Channel channel("loopback", infinity, 2);
     ASSERT_EQ(channel.init(), 1);
     ASSERT_EQ(Channel::addFilter(channel.output, "decimate", {{"Factor", 3}}), 1);

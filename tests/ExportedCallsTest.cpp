@@ -1,5 +1,5 @@
 // What holds for every exported function of a channel or stream: one table of calls, and for each
-// the null handle, the last error, failures of the core, missing streams, wrong directions, null
+// wrong handles, the last error, failures of the core, missing streams, wrong directions, null
 // pointers and failing allocations, which SweepTest lets fail with the built core as well.
 
 #include "Calls.hpp"
@@ -47,10 +47,17 @@ protected:
 
 TEST_F(ExportedCallsTest, FailuresAnswerNothingAndLastErrorIsClearedOrKept)
 {
-    coderInputStreamFreeBuffer(nullptr, 1);
     coderChannelDestroy(nullptr);
+    coderChannelDestroy(input);
+    EXPECT_EQ(coderChannelIsOpen(channel, nullptr), 0);
+    const std::string before = lastError();
+    coderInputStreamFreeBuffer(nullptr, 1);
+    coderInputStreamFreeBuffer(channel, 1);
     for (const Call& call : calls.rows) {
-        failure(call, nullptr);
+        EXPECT_EQ(failure(call, nullptr), before);
+        EXPECT_EQ(failure(call, call.target == Channels ? input : channel), before);
+    }
+    for (const Call& call : calls.rows) {
         for (std::size_t i = 0; i < handles(call).size(); ++i) {
             refresh();
             EXPECT_EQ(coderChannelIsOpen(channel, nullptr), 0);
@@ -74,15 +81,22 @@ TEST_F(ExportedCallsTest, MissingStreamsAndWrongDirectionsAreNotSupported)
     }
     coderInputStreamFreeBuffer(output, 1);
     EXPECT_EQ(lastError(), "|");
-    core.hasStreams = false;
-    init();
-    for (const Call& call : calls.rows) {
-        for (void* handle : handles(call)) {
-            if (call.target != Channels && !call.operation.empty()) {
-                EXPECT_EQ(failure(call, handle), notSupported(handle == input));
+    const auto expectNone = [&](void* noInput, void* noOutput) {
+        for (const Call& call : calls.rows) {
+            for (void* handle : call.handles(channel, noInput, noOutput)) {
+                if (call.target != Channels && !call.operation.empty()) {
+                    EXPECT_EQ(failure(call, handle), notSupported(handle == noInput));
+                }
             }
         }
-    }
+    };
+    void* const old[] = {input, output};
+    init();
+    expectNone(old[0], old[1]);
+    core.hasStreams = false;
+    init();
+    expectNone(old[0], old[1]);
+    expectNone(input, output);
     // Nor are the options read.
     EXPECT_EQ(coderStreamAddFilter(input, "f", 1, "o", "int24", 1, ""), 0);
     EXPECT_EQ(lastError(), notSupported(true));
@@ -160,13 +174,14 @@ TEST_F(ExportedCallsTest, NullPointersAreNamed)
         }
     }
     double total = 0;
+    double size = 1;
     char* const m = message;
     expectNamed(coderChannelGetLastSyncError(channel, nullptr, m), "errorId");
     expectNamed(coderChannelGetLastSyncError(channel, m, nullptr), "errorMessage");
     expectNamed(coderChannelGetLastAsyncError(channel, nullptr, m), "errorId");
     expectNamed(coderChannelGetLastAsyncError(channel, m, nullptr), "errorMessage");
     expectNamed(coderInputStreamPeek(input, &total, &total, nullptr, 1), "numBuffers");
-    expectNamed(coderInputStreamPeek(input, &total, nullptr, &total, 1), "bufferCounts");
+    expectNamed(coderInputStreamPeek(input, &total, nullptr, &size, 1), "bufferCounts");
     expectNamed(coderChannelGetLastError(channel, nullptr, m), "bufferCounts"); // still this one
     expectNamed(coderChannelGetLastError(channel, m, nullptr), "bufferCounts");
     EXPECT_EQ(answer.written(), "");

@@ -163,6 +163,17 @@ TEST(TcpTest, ClosingSendsWhatIsLeft)
     Channel::waitUntil([&] { return readFile() == data; });
 }
 
+TEST(TcpTest, WhatAnswersTheLastOutputIsTaken)
+{
+    const Program answers(server + "SYSTEM:'head -c 5; sleep 0.1; echo more'");
+    Channel channel("tcp");
+    ASSERT_EQ(init(channel, "uint8"), 1);
+    Channel::waitUntil([&] { return channel.open(0.5) == 1; });
+    EXPECT_EQ(writeBytes(channel, "12345"), 1);
+    EXPECT_EQ(channel.close(), 1) << channel.error();
+    EXPECT_EQ(channel.ask(coderStreamGetDataAvailable, channel.input), 10);
+}
+
 TEST(TcpTest, NothingIsLostUnseenWhenThePeerEnds)
 {
     Acceptor acceptor(context, any);

@@ -26,15 +26,16 @@ struct StreamModel {
     bool isInput;
     void* handle = nullptr;
     bool supported = false, isNew = false;
+    Store store = {};
 };
 
 struct ChannelModel {
     Core core; ///< stands in the global one while the channel is called
     void* handle = nullptr;
     StreamModel input{true}, output{false};
+    std::vector<StreamModel> old;                    ///< the streams of earlier inits
     std::string last = "|", sync = "|", async = "|"; ///< "identifier|message"
     Fields properties;
-    Store store;
 };
 
 /// Leaves the model of a call, which must fail and leave this last error.
@@ -190,12 +191,17 @@ private:
 
     // Calls and comparisons.
 
-    /// Makes a call with a handle, or now and then with none, and compares its result.
+    /// Makes a call with a handle, or now and then with none or one of the other kind, and compares
+    /// its result.
     template <typename Model, typename Function>
     void call(void* handle, const Model& model, const Function& function)
     {
-        handle = rarely() ? nullptr : handle;
-        bool result = handle != nullptr;
+        const bool isWrong = rarely();
+        if (isWrong) {
+            handle = anyOf(
+                {static_cast<void*>(nullptr), handle == c->handle ? c->input.handle : c->handle});
+        }
+        bool result = handle != nullptr && !isWrong;
         try {
             if (result) {
                 c->last = "|";
@@ -228,7 +234,7 @@ private:
         std::size_t objects = 0;
         for (const ChannelModel& channel : channels) {
             objects += channel.properties.size();
-            for (const auto& buffer : channel.store) {
+            for (const auto& buffer : channel.input.store) {
                 objects += buffer.value_or(Fields()).size();
             }
             if (channel.handle != nullptr) {
@@ -251,7 +257,7 @@ private:
     void destroy()
     {
         expectRelease(c->properties);
-        expectRelease(c->store);
+        expectRelease(c->input.store);
         expected.insert(expected.end(), {"~Channel()", "~Converter()"});
         coderChannelDestroy(c->handle);
         compareLog();
@@ -266,7 +272,10 @@ private:
             c->input.supported = c->output.supported = false;
             for (StreamModel* s : {&c->input, &c->output}) {
                 expectCore(s->isInput ? "getInputStream" : "getOutputStream");
-                expectRelease(std::exchange(c->store, {}));
+                expectRelease(std::exchange(s->store, {}));
+                if (s->handle != nullptr) {
+                    c->old.push_back(*s);
+                }
                 s->supported = core.hasStreams;
                 s->isNew = true;
             }
@@ -288,8 +297,14 @@ private:
         c->last = "|";
     }
 
-    StreamModel& anyStream() { return pick(2) == 1 ? c->input : c->output; }
-    const StreamModel& mostlyInput() { return rarely() ? c->output : c->input; }
+    StreamModel& anyStream() { return pick(2) == 1 ? mostlyInput() : c->output; }
+    StreamModel& mostlyInput()
+    {
+        if (rarely()) {
+            return c->old.empty() ? c->output : c->old[pick(c->old.size())];
+        }
+        return c->input;
+    }
 
     /// A call that passes on to the core, and leaves behind only what happens there.
     void passing()
@@ -383,7 +398,7 @@ private:
 
     void read()
     {
-        const StreamModel& s = mostlyInput();
+        StreamModel& s = mostlyInput();
         Store buffers(pick(4));
         const double wanted = rarely() ? anyOf<double>({0, 1.5, NAN}) : double(buffers.size());
         const auto model = [&] {
@@ -396,7 +411,7 @@ private:
                 }
             }
             const bool matches = double(buffers.size()) == wanted;
-            expectRelease(matches ? std::exchange(c->store, buffers) : buffers);
+            expectRelease(matches ? std::exchange(s.store, buffers) : buffers);
             require(matches, unexpected + "The number of buffers read did not match the expected "
                                           "number.");
         };
@@ -405,15 +420,15 @@ private:
     }
 
     /// The stored buffer of an index, or null.
-    std::optional<Fields>* stored(int index)
+    static std::optional<Fields>* stored(StreamModel& s, int index)
     {
         const auto position = static_cast<std::size_t>(index) - 1;
-        return position < c->store.size() && c->store[position] ? &c->store[position] : nullptr;
+        return position < s.store.size() && s.store[position] ? &s.store[position] : nullptr;
     }
 
     void field()
     {
-        const StreamModel& s = mostlyInput();
+        StreamModel& s = mostlyInput();
         const int index = anyIndex();
         const int fieldIndex = anyIndex();
         const std::string name = anyName();
@@ -422,7 +437,7 @@ private:
         const auto model = [&] {
             require(s.isInput, notSupported(true));
             const std::string number = std::to_string(fieldIndex);
-            const auto* const buffer = stored(index);
+            const auto* const buffer = stored(s, index);
             require(buffer != nullptr,
                     unexpected + "Data buffer index: " + std::to_string(index) + " not found.");
             const Fields& fields = **buffer;
@@ -443,16 +458,16 @@ private:
 
     void free()
     {
-        const StreamModel& s = mostlyInput();
+        StreamModel& s = mostlyInput();
         const int index = anyIndex();
         const auto model = [&] {
-            if (auto* const buffer = stored(index); s.isInput && buffer != nullptr) {
+            if (auto* const buffer = stored(s, index); s.isInput && buffer != nullptr) {
                 expectRelease(*std::exchange(*buffer, std::nullopt));
             }
         };
         call(s.handle, model, [&](void* handle) {
             coderInputStreamFreeBuffer(handle, index);
-            return handle != nullptr;
+            return handle != nullptr && handle == s.handle;
         });
     }
 

@@ -61,11 +61,10 @@ TEST_F(StreamsTest, PeekFillsTheArrayThatThereIs)
     };
     for (const auto& [size, most, sum, limit] : rows) {
         Buffer counts(3 * sizeof(double));
+        auto* const array = size >= 1 ? reinterpret_cast<double*>(counts.data()) : nullptr;
         double total = -1;
         double buffers = size;
-        EXPECT_EQ(coderInputStreamPeek(input, &total, reinterpret_cast<double*>(counts.data()),
-                                       &buffers, most),
-                  1);
+        ASSERT_EQ(coderInputStreamPeek(input, &total, array, &buffers, most), 1);
         const double all[] = {3, 4, 1};
         EXPECT_EQ(counts.written(), bytesOf(all, static_cast<std::size_t>(buffers)));
         EXPECT_EQ(std::accumulate(all, all + static_cast<int>(buffers), 0.0), sum);

@@ -29,6 +29,7 @@ printf '1\nx\n' >letters.csv
 printf '1.5,2\n3,4\n' >fraction.csv
 printf '1e400\n1\n' >range.csv
 printf 'a,b\n1\n' >header.csv
+printf '1\n\e[31m\xc2\x9b\xc3\xa4\xff\n' >escapes.csv
 seq 50000 >many.csv
 seq -s , 3000 >wide.csv
 # Three channels of 8 bits: a frame and the byte that makes the length even, and two bytes of a frame.
@@ -42,7 +43,7 @@ while IFS='|' read -r code text arguments; do
     eval "set -- $arguments"
     got=0
     timeout -k 5 20 brenix "$@" >out 2>&1 </dev/null || got=$?
-    if [[ $got -ne $code ]] || ! grep -qF -- "$text" out; then
+    if [[ $got -ne $code ]] || ! grep -qF -- "$text" out || grep -q 'brenix: brenix:' out; then
         fail "brenix $arguments: exit code $got, wanted $code with: $text"
         cat out >&2
     fi
@@ -53,7 +54,7 @@ done <<END
 1|wrongFileType: ./text.so|check ./text.so
 1|missingDependency: it needs a library that does not load: libgone.so: cannot open|check ./needs.so
 1|notAPlugin|check ./other.so
-1|abiVersion: it has plug-in ABI version 999, needed is 1|check $plugins/otherAbiVersion.so
+1|abiVersion: it has plug-in ABI version 999, needed is 2|check $plugins/otherAbiVersion.so
 1|noFactory|check $plugins/noFactory.so
 1|factoryFailed: thrown by the factory|check $plugins/throwingFactory.so
 1|factoryFailed: the factory returned nothing|check $plugins/nullFactory.so
@@ -61,7 +62,7 @@ done <<END
 1|"problem": "abiVersion"|check --json signal $plugins/otherAbiVersion.so
 0|does not describe its options|plugins $plugins/probe.so
 1|couldNotLoadDevice: $build/lib/brenix-plugins/none.so: No such file|info none
-1|couldNotLoadFilter: it needs a library|info signal -f ./needs.so
+1|couldNotLoadFilter: Could not load ./needs.so: libgone.so: cannot open|info signal -f ./needs.so
 1|{"error":{"id":"brenix:Channel:unexpectedException","message":"Option Foo: is not known."}}|info signal -o Foo=1 --json
 2|not a value of type int8: 300|info signal -o Foo:int8=300
 2|an option is Name=value|info signal -o Foo
@@ -71,6 +72,8 @@ done <<END
 2|{"error":{"id":"","message":"The following argument was not expected: --nonsense|info signal --json --nonsense
 1|{"error":{"id":"brenix:Device:failed","message":"Field none|scope $plugins/probe.so -o Packets:int32=2,-4 --json
 0|wrote 2 counts|write loopback -i samples.csv -t int16
+0|{"counts":2,"seconds":|write loopback -i samples.csv --json
+0|"counts": 10,|scope signal -n 10 --json
 1|uneven.csv: line 2: 1 values instead of 2|write loopback -i uneven.csv
 1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
 1|range.csv: line 1: not a number of type double: 1e400|write loopback -i range.csv
@@ -78,7 +81,26 @@ done <<END
 1|header.csv: line 2: 1 values instead of 2|write loopback -i header.csv
 1|folder: cannot be read|write loopback -i folder
 1|folder: cannot be read|write loopback -i folder --format raw
-1|notSupported|write signal -i samples.csv
+1|signal has no output stream with these options: it cannot be written to|write signal -i samples.csv
+1|audiofile has no input stream with these options: it cannot be read|read audiofile -o Mode=write -o FileName=a.wav
+1|couldNotCreateDevice: scale: it is a filter and no device; filters are given with -f|read scale
+1|couldNotCreateConverter: scale: it is a filter and no converter|info signal -c scale
+1|identity.so: it is a converter and no filter|info signal -f identity
+1|has an ending that names no sound file format: 123.|read audiofile -o FileName=123 -o Mode=write
+0|Frequency: 0.0047 Hz|info signal -o Frequency=4.7m -o BlockSize=4Ki
+1|Frequency: must be one number|info signal -o Frequency=1k,2
+2|brenix: option Frequency: not a number: 1x|info signal -o Frequency=1x
+2|option Gain: not a number: nothing|read signal -f 'scale Gain='
+2|option Timeout: not a number: long|read signal --open-option Timeout=long
+0|read 1200 counts|read signal -o Pace=fast -n 1.2k -r 1M --limit 4Ki -w kilo.csv
+2|--block: 2Mi is not a whole number from 1 to 1048576|write loopback -b 2Mi
+2|foo is no command: there are plugins, check, info, read, write, scope|foo
+2|a command is missing: there are plugins|''
+2|--nonsense; see brenix read --help|read signal --nonsense
+0|Usage: brenix write|help write
+1|line 2: not a number of type double: \x1b[31m\xc2\x9bä\xff|write loopback -i escapes.csv
+1|brenix:Device:failed: failed in run; also: |write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
+1|brenix:InputStream:couldNotConvertInputData: 13 is refused|read $plugins/probe.so -c $plugins/pickyConverter.so -o Packets:int32=5,15 -w refused.csv
 0|wrote 1 counts|write audiofile -o FileName=padded.au -o Mode=write -o Channels=3 -i padded.wav
 1|incomplete.wav: the last frame has 2 of 3 bytes|write loopback -i incomplete.wav -n 5
 2|--block: 1048576 counts of 3000 columns are more than|write loopback -i wide.csv -b 1048576
@@ -89,7 +111,6 @@ done <<END
 0|read 0 counts|read $plugins/probe.so -w none.csv
 0|read 0 counts|read $plugins/probe.so -w none.flac -r 8000
 0|read 0 counts|read audiofile -o FileName=none.flac --field left --field right -w names.csv
-1|brenix:Device:failed: failed in run|write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
 1|Field none has no elements|read $plugins/probe.so -o Packets:int32=2,3,-4 -w kept.csv
 2|--counts: 1.5 is not a whole number of at least 1|read signal -n 1.5
 2|--limit: 0.5 is not a whole number of at least 1|read signal -n 1 --limit 0.5
@@ -104,7 +125,9 @@ done <<END
 1|the data has no field Foo|read signal -n 1 --field Foo
 0|RMS 0.7071|scope signal -o Pace=fast -n 4800 --png picture.png
 END
-[[ $(tr '\n' ' ' <kept.csv) == 'data 0 1 2 3 4 ' ]] || fail "what came before a device's error is lost"
+if [[ $(tr '\n' ' ' <kept.csv) != 'data 0 1 2 3 4 ' ]] || ! cmp kept.csv refused.csv; then
+    fail "what came before an error of a device or a converter is lost"
+fi
 [[ $(cat none.csv names.csv) == $'data\nleft,right' ]] || fail "names of nothing: $(cat none.csv names.csv)"
 for command in "info signal" plugins "check signal" "scope signal -n 10" \
     "read signal -n 10 --format "{csv,raw,wav,flac,ogg}; do
@@ -122,6 +145,28 @@ if [[ $got -ne 1 ]] || ! grep -q 'is it installed' out; then
     fail "scope without gnuplot: exit code $got"
 fi
 file picture.png | grep -q 'PNG image data' || fail "picture.png is no picture"
+
+# A picture of few samples has a part of the trace in each of its 79 columns, and some more at its steps.
+brenix scope signal -o Waveform=ramp -o SampleRate=8 -o Frequency=1 -o BlockSize=8 -o Pace=fast -n 8 >picture
+[[ $(LC_ALL=C.UTF-8 grep -o '[█▀▄]' picture | wc -l) -eq 89 ]] || fail "scope of few samples: $(cat picture)"
+
+# On a terminal a picture fits the screen, keys are not echoed, and the terminal is left as it was.
+while IFS='|' read -r columns keys shown arguments; do
+    rm -f terminal
+    got=0
+    {
+        while ! grep -qs $'\e\[J' terminal; do sleep 0.1; done
+        printf '%b' "$keys"
+    } | timeout -k 5 20 script -qefc "stty rows 24 cols $columns; stty -g >before
+        brenix scope signal $arguments && stty -g | cmp before -" terminal >/dev/null || got=$?
+    if [[ $got -ne 0 ]] || ! grep -qF "$shown" terminal || grep -qE 'xy|\^C' terminal ||
+        ! awk 'BEGIN { RS = "\033\\[J" } lines > 24 { exit 1 } { lines = gsub("\n", "") }' terminal; then
+        fail "scope on $columns columns, keys $keys: exit code $got: $(cat -v terminal)"
+    fi
+done <<'END'
+80|xyq|11 of 12 channels|-o Channels=12
+1|\003|RMS|-o Channels=2
+END
 
 # What an interrupted read has read is complete.
 got=0
@@ -190,6 +235,20 @@ compile() {
         "-L$build/lib" -lbrenixcoder -lsndfile -lm "-Wl,-rpath,$build/lib"
 }
 
+# Plug-ins are found also by a library that was found in a relative folder, before the program left it.
+cat >program.c <<'END'
+#include <brenixcoder/coder.h>
+#include <unistd.h>
+int main(void)
+{
+    char id[CODER_ERROR_SIZE], message[CODER_ERROR_SIZE];
+    return chdir("/") != 0 || coderChannelCreate("signal", "identity", id, message, 1.0, 1.0) == NULL;
+}
+END
+"$cc" "-I$source/include" program.c -o program "-L$build/lib" -lbrenixcoder "-Wl,-rpath-link,$build/lib"
+program=$PWD/program
+(cd "$build" && LD_LIBRARY_PATH=lib "$program") || fail "plug-ins beside a library in a relative folder"
+
 # Emitted programs: each does the same again. The result is a file, or what is printed.
 emitted() { # FILE-OF-RESULT ARGUMENTS...
     local result=$1
@@ -225,6 +284,15 @@ loud.flac|[0-9]+ samples beyond full scale
 /dev/full|cannot be written
 /dev/stdout|Illegal seek
 END
+# FLAC writes these 4000 samples only when it is closed.
+noise=(brenix read signal -o Waveform=noise -o Pace=fast -n 4000 -q -w full.flac)
+"${noise[@]}" --emit-c program.c
+compile
+for command in "${noise[*]}" "./program full.flac"; do
+    if (trap '' XFSZ && ulimit -f 4 && $command) 2>errors || ! grep -q 'full.flac: ' errors; then
+        fail "$command on a full disk: $(cat errors)"
+    fi
+done
 emitted b.flac write audiofile -o FileName=b.flac -o Mode=write -o Channels=2 -i a.flac
 grep -q 'static double elements' program.c || fail "the type that audiofile takes is not written"
 emitted b.au write audiofile -o FileName=b.au -o Mode=write -o Channels=2 -o SampleFormat=DOUBLE -i a.wav
@@ -251,19 +319,16 @@ done
 
 # Floating-point WAV has the levels of integers, from the command and from its program.
 printf '0.5\n-0.25\n1.5\n' | "${write[@]}" -o FileName=loud.wav
-write=(brenix write udp -o Host=127.0.0.1 -o Port=27111 -o ElementType=int16 -t int16 -i loud.wav -q)
-"${write[@]}" --emit-c program.c
+timeout 20 brenix read udp -o ElementType=int16 -n 6 -w levels.flac -r 8000 2>told &
+while kill -0 $! && ! grep -qs LocalPort told; do sleep 0.02; done
+brenix write udp -o Host=127.0.0.1 -o "Port=$(sed -n 's/^udp: LocalPort //p' told)" -o ElementType=int16 -t int16 \
+    -i loud.wav -q --emit-c program.c
 compile
-for sender in "${write[*]}" ./program; do
-    timeout 20 brenix read udp -o LocalPort=27111 -o ElementType=int16 -n 3 -q -w levels.flac -r 8000 &
-    while kill -0 $! 2>/dev/null; do
-        $sender
-        sleep 0.02
-    done
-    brenix read audiofile -o FileName=levels.flac -q >levels.csv
-    [[ $(tr '\n' ' ' <levels.csv) == 'data 0.5 -0.25 0.999969482421875 ' ]] ||
-        fail "levels of: $sender: $(cat levels.csv)"
-done
+./program
+wait $! || true
+brenix read audiofile -o FileName=levels.flac -q >levels.csv
+[[ $(tr '\n' ' ' <levels.csv) == 'data 0.5 -0.25 0.999969482421875 0.5 -0.25 0.999969482421875 ' ]] ||
+    fail "levels: $(cat told levels.csv)"
 
 # They tell what is wrong in their input, and keep what came before an error of the device.
 brenix write loopback -q -t int8 -i samples.csv --emit-c program.c
@@ -307,19 +372,24 @@ $number" >number.csv
         done
     done
 done <<'END'
-double|1e-400 -1e-400 1e308 -0 +1 .5 5. inf -Infinity nan "1"|1e400 -1e400 0x10 0X1p3 +-1 1"|
+double|1e-400 -1e-400 1e308 -0 +1 .5 5. inf -Infinity nan "1"|1e400 -1e400 0x10 0X1p3 +-1 1" "1
 float|1e-50 1e38|1e39 0x1
 int8|-0 +1 -128 127 007|128 -129 0x1 1.5 1e1 +-1
 uint8|-0 255|256 -1
 uint64|-0 18446744073709551615|18446744073709551616 -1
 logical|-0 +1 true false|2 -1 0x1 True
 END
-brenix read "$plugins/probe.so" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
-sed -i 's/{2, 3, 4}/{2, 3, -4}/' program.c
-compile
-if ./program broken.csv 2>errors || ! cmp broken.csv kept.csv; then
-    fail "the program of a device that fails: $(cat errors)"
-fi
+while read -r converter last message; do
+    brenix read "$plugins/probe.so" -c "$converter" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
+    sed -i "s/{2, 3, 4}/{2, 3, $last}/" program.c
+    compile
+    if ./program broken.csv 2>errors || ! cmp broken.csv kept.csv || ! grep -q "$message" errors; then
+        fail "the program with a packet $last: $(cat errors)"
+    fi
+done <<END
+identity -4 brenix:Device:failed: Field none
+$plugins/pickyConverter.so 9 couldNotConvertInputData: 13 is refused
+END
 
 # Samples arrive as they were, as far as the format holds them: a file of each format, through pipes.
 brenix read "${signal[@]}" -n 3000 --format raw -q >samples.raw

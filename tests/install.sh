@@ -87,16 +87,26 @@ expect '1.5 2.5 3.5' env -i programs/build/cpp
 echo "== the guide for plug-in authors"
 cp -r "$docs/plugins/template" plugins
 cd plugins
-pieces cpp docs/plugin-authors.md >numbers.cpp
+pieces cpp docs/plugin-authors.md 1 >numbers.cpp
+pieces cpp docs/plugin-authors.md 2 >ticks.cpp
 pieces c docs/plugin-authors.md >show.c
 expect '*0 1 2 3 4 5 5 5 ' bash -e <(pieces sh docs/plugin-authors.md 1)
+rm build/clip.so
+expect 'brenix:Stream:couldNotLoadFilter: * (exit code 1)' env -C build ./try
 pieces cmake docs/plugin-authors.md >>CMakeLists.txt
 expect '*
 1.5 2.5 3.5
 brenix:InputStream:synchronousInputNotPossible: 
 device: brenix:Device:failed: broken.txt: no number after 1 lines.
-brenix:Channel:unexpectedException: Option FileName: must be given.' \
-    bash -e <(pieces sh docs/plugin-authors.md 2)
+exit code 1
+brenix:Channel:unexpectedException: Option FileName: must be given.
+exit code 1' bash -e <(pieces sh docs/plugin-authors.md 2)
+expect '*device that loads*
+0
+1
+2
+read 3 counts *' env "PATH=$scratch/installed/bin:$PATH" "PKG_CONFIG_PATH=$folder" \
+    bash -e <(pieces sh docs/plugin-authors.md 3)
 cd ..
 
 echo "== the Debian package has the same files, and says what it needs"

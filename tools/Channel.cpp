@@ -7,8 +7,6 @@
 #include <array>
 #include <cstddef>
 #include <cstring>
-#include <numeric>
-#include <sstream>
 #include <string_view>
 #include <tuple>
 #include <utility>
@@ -33,16 +31,33 @@ int callWithOptions(const std::vector<Option>& options, const Call& call)
                       std::apply([](auto... option) { return std::tuple_cat(option...); }, list));
 }
 
-/// Adds to an error without a message why a plug-in did not load.
-Failure explained(const Failure& failure, const std::vector<std::string>& names)
+/// Where plug-ins of a kind are given.
+std::string placeOf(const std::string& kind)
 {
-    std::string message = failure.what();
-    for (const std::string& name : names) {
-        if (message.empty()) {
-            message = brenixcore::plugin::inspectPlugin(name).message;
+    return kind == "Device"      ? "devices are given first"
+           : kind == "Converter" ? "converters are given with -c"
+                                 : "filters are given with -f";
+}
+
+/// Adds to the error of a channel that could not be made, and so tells no reason, which plug-in did not load,
+/// and why.
+Failure explained(const std::string& id, std::string message, const ChannelSettings& settings)
+{
+    for (const auto& [name, kind] :
+         {std::pair(settings.converter, "Converter"), std::pair(settings.device, "Device")}) {
+        if (!message.empty()) {
+            break;
+        }
+        const auto report = brenixcore::plugin::inspectPlugin(name, kind);
+        message = report.message;
+        if (!message.empty() && message.rfind(report.path, 0) != 0) {
+            message.insert(0, name + ": ");
+        }
+        if (report.problem == "otherKind") {
+            message += "; " + placeOf(report.kind);
         }
     }
-    return {failure.getId(), message};
+    return {id, message};
 }
 
 void requireFixedNumber(const Field& field, std::size_t rows)
@@ -65,62 +80,40 @@ std::optional<Failure> caught(const std::function<void()>& work)
     return std::nullopt;
 }
 
-std::vector<Option> parseOptions(const std::vector<std::string>& texts)
+Channel::Channel(const ChannelSettings& settings, Use use)
 {
-    if (texts.size() > maxOptions) {
-        throw std::invalid_argument("at most " + std::to_string(maxOptions) +
-                                    " options are possible");
-    }
-    std::vector<Option> options;
-    options.reserve(texts.size());
-    for (const std::string& text : texts) {
-        options.push_back(parseOption(text));
-    }
-    return options;
-}
-
-FilterSettings parseFilter(const std::string& text)
-{
-    FilterSettings filter;
-    std::istringstream words(text);
-    words >> filter.name;
-    std::vector<std::string> options;
-    for (std::string word; words >> word;) {
-        options.push_back(word);
-    }
-    filter.options = parseOptions(options);
-    return filter;
-}
-
-Channel::Channel(const ChannelSettings& settings, bool filterOutput)
-{
-    const std::vector<Option> options = parseOptions(settings.options);
     std::array<char, CODER_ERROR_SIZE> id{};
     std::array<char, CODER_ERROR_SIZE> message{};
     handle = coderChannelCreate(settings.device.c_str(), settings.converter.c_str(), id.data(),
                                 message.data(), settings.inputLimit, settings.outputLimit);
     if (handle == nullptr) {
-        throw explained({id.data(), message.data()}, {settings.converter, settings.device});
+        throw explained(id.data(), message.data(), settings);
     }
     try {
-        check(callWithOptions(options,
-                              [&](auto... list) { return coderChannelInit(handle, list...); }));
-        initialised = true;
-        input = coderChannelGetInputStream(handle);
-        output = coderChannelGetOutputStream(handle);
-        for (const std::string& text : settings.filters) {
-            const FilterSettings filter = parseFilter(text);
-            const int added = callWithOptions(filter.options, [&](auto... list) {
-                return coderStreamAddFilter(filterOutput ? output : input, filter.name.c_str(),
-                                            list...);
-            });
-            if (added == 0) {
-                throw explained(lastError(), {filter.name});
-            }
-        }
+        initialise(settings, use);
     } catch (...) {
         release();
         throw;
+    }
+}
+
+void Channel::initialise(const ChannelSettings& settings, Use use)
+{
+    check(callWithOptions(parseOptions(settings.options, settings.device),
+                          [&](auto... list) { return coderChannelInit(handle, list...); }));
+    input = coderChannelGetInputStream(handle);
+    output = coderChannelGetOutputStream(handle);
+    void* const used = use == Use::Write ? output : input;
+    if (use != Use::Look && !isSupported(used)) {
+        throw Failure("", settings.device + " has no " + (used == output ? "output" : "input") +
+                              " stream with these options: it cannot be " +
+                              (used == output ? "written to" : "read"));
+    }
+    for (const std::string& text : settings.filters) {
+        const FilterSettings filter = parseFilter(text);
+        check(callWithOptions(filter.options, [&](auto... list) {
+            return coderStreamAddFilter(used, filter.name.c_str(), list...);
+        }));
     }
 }
 
@@ -138,12 +131,19 @@ void Channel::release() noexcept
 
 void Channel::open(const ChannelSettings& settings)
 {
-    check(callWithOptions(parseOptions(settings.openOptions),
+    check(callWithOptions(parseOptions(settings.openOptions, ""),
                           [&](auto... list) { return coderChannelOpen(handle, list...); }));
 }
 
 void Channel::finish(const std::optional<Failure>& failure)
 {
+    std::vector<Failure> failures;
+    const auto add = [&](const std::optional<Failure>& one) {
+        if (one) {
+            failures.push_back(*one);
+        }
+    };
+    add(deviceError());
     const auto ended = failure ? failure : caught([&] {
         std::uint8_t isOpen = 0;
         check(coderChannelIsOpen(handle, &isOpen));
@@ -151,13 +151,15 @@ void Channel::finish(const std::optional<Failure>& failure)
             check(coderChannelClose(handle));
         }
     });
-    coderChannelClose(handle); // the device may tell its error only now
-    if (const auto error = deviceError()) {
-        throw Failure(error->getId(),
-                      error->what() + (ended ? "; also: " + ended->text() : std::string()));
-    }
-    if (ended) {
-        throw Failure(*ended);
+    coderChannelClose(handle);
+    add(deviceError()); // some are told only now
+    add(ended);
+    if (!failures.empty()) {
+        std::string message = failures[0].what();
+        for (std::size_t i = 1; i < failures.size(); ++i) {
+            message += "; also: " + failures[i].text();
+        }
+        throw Failure(failures[0].getId(), message);
     }
     check(coderChannelTerm(handle));
 }
@@ -169,6 +171,9 @@ Failure Channel::lastError() const
     coderChannelGetLastError(handle, id.data(), message.data());
     if (id[0] == '\0') { // then a plug-in raised an error inside the call
         coderChannelGetLastSyncError(handle, id.data(), message.data());
+    }
+    if (message[0] == '\0') { // then the core may know why
+        coderChannelGetPropertyValue(handle, "Reason", "char", CODER_ERROR_SIZE, message.data());
     }
     return {id.data(), message.data()};
 }
@@ -202,8 +207,7 @@ double Channel::inputAvailable()
 {
     double available = 0;
     check(coderStreamGetDataAvailable(input, &available));
-    return std::accumulate(bufferCounts.begin() + static_cast<std::ptrdiff_t>(buffer),
-                           bufferCounts.end(), available);
+    return available;
 }
 
 bool Channel::isSupported(void* stream)
@@ -233,9 +237,10 @@ double Channel::nextBuffer(double most)
         if (bufferCounts.empty()) {
             return 0;
         }
-        check(coderInputStreamReadBuffers(input, total, buffers));
     }
-    return bufferCounts[buffer++];
+    const double counts = bufferCounts[buffer++];
+    check(coderInputStreamReadBuffers(input, counts, 1));
+    return counts;
 }
 
 /// Copies a value of which nobody tells how many elements it has: they are as many as the smallest
@@ -289,8 +294,7 @@ std::optional<double> Channel::number(const std::string& name, const char* type)
 Channel::Copy Channel::fieldCopier(const Field& field) const
 {
     return [this, &field](std::size_t capacity, void* destination) {
-        return coderInputStreamReadBufferData(input, static_cast<int>(buffer), 0,
-                                              field.name.c_str(), field.type->name,
+        return coderInputStreamReadBufferData(input, 1, 0, field.name.c_str(), field.type->name,
                                               static_cast<int>(capacity), destination);
     };
 }

@@ -2,7 +2,7 @@
 #ifndef BRENIX_TOOLS_CHANNEL_HPP
 #define BRENIX_TOOLS_CHANNEL_HPP
 
-#include "Values.hpp"
+#include "Options.hpp"
 
 #include <cstddef>
 #include <functional>
@@ -14,9 +14,6 @@
 
 namespace brenix
 {
-
-/// What an option list of a command line can have at most.
-constexpr std::size_t maxOptions = 16;
 
 /// A failed call of the library, an error of the device, or what else ends a command with exit code 1.
 class Failure : public std::runtime_error
@@ -46,19 +43,15 @@ std::optional<Failure> caught(const std::function<void()>& work);
 struct ChannelSettings {
     std::string device;
     std::string converter = "identity";
-    std::vector<std::string> options;     ///< of init, as parseOption() takes them
+    std::vector<std::string> options;     ///< of init, as parseOptions() takes them
     std::vector<std::string> openOptions; ///< of open
     std::vector<std::string> filters;     ///< each a plug-in and its options, with spaces
     double inputLimit = 65536;
     double outputLimit = 65536;
 };
 
-struct FilterSettings {
-    std::string name;
-    std::vector<Option> options;
-};
-FilterSettings parseFilter(const std::string& text);
-std::vector<Option> parseOptions(const std::vector<std::string>& texts);
+/// What a command does with a channel.
+enum class Use { Look, Read, Write };
 
 /// One field of the buffers of an input stream.
 struct Field {
@@ -71,8 +64,9 @@ struct Field {
 class Channel
 {
 public:
-    /// Creates and initialises a channel. The filters go to its input or its output stream.
-    Channel(const ChannelSettings& settings, bool filterOutput);
+    /// Creates and initialises a channel, with the filters for the stream that is used: the input, but
+    /// when writing. Throws when there is no stream to read or to write.
+    Channel(const ChannelSettings& settings, Use use);
     Channel(const Channel&) = delete;
     Channel& operator=(const Channel&) = delete;
     ~Channel();
@@ -80,7 +74,7 @@ public:
     void open(const ChannelSettings& settings);
 
     /// Closes, when it is open, and terminates. Throws what fails, or the failure that ended a
-    /// transfer, behind the device's error if there is one: mostly that is the reason.
+    /// transfer, behind the device's errors if there are any: mostly they are the reason.
     void finish(const std::optional<Failure>& failure = {});
 
     /// Throws the error of a call that returned 0.
@@ -100,10 +94,9 @@ public:
     bool isSupported(void* stream);
     bool isDone(void* stream);
 
-    double inputAvailable(); ///< counts that are there to be taken
+    double inputAvailable(); ///< counts that the input stream has
 
     /// Takes the next buffer, or as much of it as `most` counts, if one is there. Returns its counts.
-    /// Buffers come from the stream many at once.
     double nextBuffer(double most);
 
     /// The fields of the buffer that was taken: those of the names given, or else Data1, Data2..., or
@@ -114,6 +107,7 @@ public:
     void readField(Field& field, double counts);
 
 private:
+    void initialise(const ChannelSettings& settings, Use use);
     void release() noexcept;
 
     using Copy = std::function<int(std::size_t capacity, void* destination)>;
@@ -127,8 +121,8 @@ private:
     void* input = nullptr;
     void* output = nullptr;
     bool initialised = false;
-    std::vector<double> bufferCounts; ///< of the buffers that came from the stream at once
-    std::size_t buffer = 0;           ///< that was taken of them, from 1
+    std::vector<double> bufferCounts; ///< that the last peek told
+    std::size_t buffer = 0;           ///< so many of them were taken
 };
 
 } // namespace brenix

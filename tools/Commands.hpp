@@ -11,6 +11,7 @@
 #include <chrono>
 #include <cstddef>
 #include <limits>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -136,6 +137,12 @@ private:
     std::vector<Field> fields;
     std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();
 };
+
+/// The port at which the device receives, when the system has chosen it.
+std::optional<long> chosenPort(Channel& channel, const ChannelSettings& settings);
+
+/// Prints it on the standard error: the other side has to know it.
+void tellPort(Channel& channel, const Settings& settings);
 
 /// The rate that is given or that the device tells; 0 when neither is.
 double countRate(Channel& channel, const SampleFile& file);

@@ -188,7 +188,8 @@ Values commonValues(const Settings& settings, bool opens, bool output)
     values["COMMAND"] = commentOf(settings.commandLine);
     values["LIBRARIES"] = "-lbrenixcoder";
     values["CHECK"] = checkText;
-    values["INIT"] = optionList(parseOptions(channel.options), "init", values["SETUP_DATA"]);
+    values["INIT"] =
+        optionList(parseOptions(channel.options, channel.device), "init", values["SETUP_DATA"]);
     const auto add = [&](const char* call, const std::string& arguments) {
         values["CALLS"] += fill(furtherCall, {{"CALL", call}, {"ARGUMENTS", arguments}});
     };
@@ -202,8 +203,8 @@ Values commonValues(const Settings& settings, bool opens, bool output)
                            values["SETUP_DATA"]));
     }
     if (opens) {
-        add("coderChannelOpen", "channel, " + optionList(parseOptions(channel.openOptions), "open",
-                                                         values["SETUP_DATA"]));
+        add("coderChannelOpen", "channel, " + optionList(parseOptions(channel.openOptions, ""),
+                                                         "open", values["SETUP_DATA"]));
     }
     values["DEVICE"] = quote(channel.device);
     values["CONVERTER"] = quote(channel.converter);

@@ -12,7 +12,7 @@ namespace
 
 constexpr std::string_view readProgram = R"(
 static const char* name; /* of the file */
-@INFO@enum { MOST = @MOST@, BUFFERS = 4096 }; /* counts, and buffers, that are read at once */
+@INFO@enum { MOST = @MOST@, BUFFERS = 4096 }; /* counts of a buffer, and buffers, at most, of one peek */
 @FIELDS@@DISK@@PRINT@@ITEM@
 static int writeCounts(@FILE@* file, int counts)
 {
@@ -36,21 +36,19 @@ static int transfer(void* channel, @FILE@* file)
                                         left < MOST ? left : MOST))) {
             return 0;
         }
-        if (buffers > 0.0) {
+        for (int buffer = 0; buffer < (int)buffers; ++buffer) {
+            const int count = (int)counts[buffer];
             if (!check(channel, "coderInputStreamReadBuffers",
-                       coderInputStreamReadBuffers(input, total, buffers))) {
+                       coderInputStreamReadBuffers(input, count, 1.0)) ||
+                @READ@!writeCounts(file, count)) {
                 return 0;
             }
-            for (int buffer = 1; buffer <= (int)buffers; ++buffer) {
-                const int count = (int)counts[buffer - 1];
-                if (@READ@!writeCounts(file, count)) {
-                    return 0;
-                }
-            }
-            left -= total;
-        } else if (done) {
+            left -= count;
+        }
+        if (buffers == 0.0 && done) {
             break;
-        } else {
+        }
+        if (buffers == 0.0) {
             (void)nanosleep(&pause, NULL);
         }
         if (ok && !checkDevice(channel)) { /* then take what came before the error */
@@ -67,9 +65,9 @@ static int transfer(void* channel, @FILE@* file)
 )";
 
 constexpr std::string_view readField = R"(!check(channel, "coderInputStreamReadBufferData",
-                           coderInputStreamReadBufferData(input, buffer, 0, @NAME@, @TYPE@,
-                                                          count@TIMES@, @ARRAY@)) ||
-                    )";
+                       coderInputStreamReadBufferData(input, 1, 0, @NAME@, @TYPE@, count@TIMES@,
+                                                      @ARRAY@)) ||
+                )";
 
 constexpr std::string_view clipItem = R"(
 static long clipped; /* samples */

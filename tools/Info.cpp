@@ -1,9 +1,11 @@
 // The command info.
 
 #include "Commands.hpp"
+#include "Screen.hpp"
 #include "brenixcoder/coder.h"
 #include "brenixcore/plugin/Inspect.hpp"
 
+#include <cstdint>
 #include <iostream>
 #include <optional>
 #include <sstream>
@@ -71,7 +73,7 @@ std::optional<double> countDimension(Channel& channel, void* stream)
 
 ExitCode showInfo(const Settings& settings)
 {
-    Channel channel(settings.channel, false);
+    Channel channel(settings.channel, Use::Look);
     if (settings.open) {
         channel.open(settings.channel);
     }
@@ -83,7 +85,7 @@ ExitCode showInfo(const Settings& settings)
          {std::pair("input", channel.inputStream()), std::pair("output", channel.outputStream())}) {
         text << name << ": ";
         if (const auto dimension = countDimension(channel, stream)) {
-            streams[name] = {{"countDimension", *dimension}};
+            streams[name] = {{"countDimension", static_cast<std::int64_t>(*dimension)}};
             text << "counts along dimension " << *dimension << '\n';
         } else {
             streams[name] = nullptr;
@@ -96,8 +98,8 @@ ExitCode showInfo(const Settings& settings)
                         {"type", type->name},
                         {"unit", unit},
                         {"value", toJson(*type, elements)}});
-        text << name << ": " << printElements(*type, elements) << (unit.empty() ? "" : " ") << unit
-             << '\n';
+        text << name << ": " << printable(printElements(*type, elements))
+             << (unit.empty() ? "" : " ") << unit << '\n';
     }
     if (settings.json) {
         printJson(std::cout, {{"streams", streams}, {"properties", list}}, 2);

@@ -1,19 +1,21 @@
 // The command scope.
 
 #include "Commands.hpp"
+#include "Screen.hpp"
 #include "brenixcoder/coder.h"
 
-#include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <cmath>
 #include <csignal>
+#include <cstdint>
 #include <cstdio>
 #include <deque>
 #include <iostream>
 #include <limits>
+#include <optional>
 
 namespace brenix
 {
@@ -24,6 +26,8 @@ namespace
 struct Range {
     double low = std::numeric_limits<double>::infinity();
     double high = -std::numeric_limits<double>::infinity();
+
+    bool isEmpty() const { return low > high; }
 
     void add(const Range& other)
     {
@@ -88,35 +92,28 @@ struct Trace {
     double rms() const { return std::sqrt(sumOfSquares / count); }
 };
 
-/// Of the terminal.
-struct Size {
-    int columns = 80;
-    int rows = 24;
-};
-
-Size terminalSize()
-{
-    winsize size{};
-    if (ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_col == 0 || size.ws_row == 0) {
-        return {};
-    }
-    return {size.ws_col, size.ws_row};
-}
-
 /// A trace as lines of half blocks, its largest value at the upper and the lower edge.
 std::string drawTrace(const Trace& trace, int columns, int rows)
 {
-    std::vector<Range> ranges(static_cast<std::size_t>(columns));
     double scale = 0;
-    for (std::size_t i = 0; i < trace.latest.size(); ++i) {
-        ranges[i * ranges.size() / trace.latest.size()].add({trace.latest[i], trace.latest[i]});
-        scale = std::max(scale, std::fabs(trace.latest[i]));
+    for (const double sample : trace.latest) {
+        scale = std::isfinite(sample) ? std::max(scale, std::fabs(sample)) : scale;
     }
-    for (std::size_t i = 1; i < ranges.size(); ++i) { // joins neighbours
-        Range& range = ranges[i];
-        const Range& before = ranges[i - 1];
-        range.low = std::min(range.low, std::max(before.high, -scale));
-        range.high = std::max(range.high, std::min(before.low, scale));
+    std::vector<Range> ranges(static_cast<std::size_t>(columns));
+    const std::size_t count = trace.latest.size();
+    for (std::size_t i = 0; i < ranges.size(); ++i) {
+        // Samples that are fewer than the columns stay over several.
+        const std::size_t first = i * count / ranges.size();
+        const std::size_t end = std::max((i + 1) * count / ranges.size(), first + 1);
+        for (std::size_t sample = first; sample < end; ++sample) {
+            const double level = std::clamp(trace.latest[sample], -scale, scale);
+            ranges[i].add({level, level});
+        }
+        // Joins neighbours, but for what is not a number.
+        if (i > 0 && !ranges[i].isEmpty() && !ranges[i - 1].isEmpty()) {
+            ranges[i].low = std::min(ranges[i].low, ranges[i - 1].high);
+            ranges[i].high = std::max(ranges[i].high, ranges[i - 1].low);
+        }
     }
     scale = scale > 0 ? scale : 1;
     std::string text;
@@ -141,34 +138,26 @@ std::string printed(const char* format, double value)
     return text.data();
 }
 
-/// The whole picture, lines that end with a newline.
-std::string draw(const Settings& settings, const std::vector<Trace>& traces, double seconds,
-                 double fill, const std::string& error)
+/// The whole picture, lines that end with a newline. A screen has as many channels as there is room for.
+std::string draw(const std::string& title, const std::vector<Trace>& traces, double seconds,
+                 double fill, const std::string& error, bool onScreen)
 {
     const Size size = terminalSize();
-    const int height =
-        std::max(1, (size.rows - 3) / std::max<int>(1, static_cast<int>(traces.size())) - 1);
+    const int room = size.rows - (error.empty() ? 2 : 3);
+    const int all = static_cast<int>(traces.size());
+    const int shown = onScreen ? std::clamp(room / 2, 0, all) : all;
+    const int height = std::clamp(room / std::max(shown, 1) - 1, 1, 12);
     const double counts = traces.empty() ? 0 : traces[0].count;
     std::string text =
-        settings.channel.device + printed("  %.1f s", seconds) + printed("  %.0f counts", counts) +
+        title + (shown < all ? printed("  %.0f of ", shown) + printed("%.0f channels", all) : "") +
+        printed("  %.1f s", seconds) + printed("  %.0f counts", counts) +
         printed("  %.4g counts/s", counts / seconds) + printed("  buffer %.0f%%\n", 100 * fill);
-    for (const Trace& trace : traces) {
+    for (int i = 0; i < shown; ++i) {
+        const Trace& trace = traces[static_cast<std::size_t>(i)];
         text += trace.name + printed("  peak %.4g", trace.peak) +
-                printed("  RMS %.4g\n", trace.rms()) +
-                drawTrace(trace, size.columns - 1, std::min(height, 12));
+                printed("  RMS %.4g\n", trace.rms()) + drawTrace(trace, size.columns - 1, height);
     }
     return text + (error.empty() ? "" : error + '\n');
-}
-
-/// Draws the picture anew in the place of the last one.
-void show(const std::string& picture)
-{
-    static int lines = 0; // of the last one
-    if (lines > 0) {
-        std::cout << "\033[" << lines << "A\033[J";
-    }
-    std::cout << picture << std::flush;
-    lines = static_cast<int>(std::count(picture.begin(), picture.end(), '\n'));
 }
 
 /// Has gnuplot draw everything that was read, one plot for each channel.
@@ -242,7 +231,7 @@ double bufferFill(Channel& channel)
 
 ExitCode showScope(const Settings& settings)
 {
-    Channel channel(settings.channel, false);
+    Channel channel(settings.channel, Use::Read);
     const double rate = countRate(channel, settings.file);
     channel.open(settings.channel);
     Reading reading(channel, settings, rate);
@@ -251,24 +240,34 @@ ExitCode showScope(const Settings& settings)
     std::string error;
     double drawn = -1;
     double fill = 0;
+    std::string title = settings.channel.device;
+    std::optional<Screen> screen;
+    if (live) {
+        const auto port = chosenPort(channel, settings.channel);
+        title += port ? "  LocalPort " + std::to_string(*port) : "";
+        screen.emplace();
+    } else {
+        tellPort(channel, settings);
+    }
     const auto failure = caught([&] {
-        while (!reading.isOver()) {
+        while (!reading.isOver() && !(live && Screen::isTyped('q'))) {
             fill = bufferFill(channel);
             if (const std::size_t counts = reading.next(); counts > 0) {
                 add(traces, reading, counts, settings.window);
             }
             if (const auto raised = channel.deviceError()) {
-                error = raised->text();
+                error = printable(raised->text());
                 if (!live) {
                     report(settings, *raised);
                 }
             }
             if (live && reading.getSeconds() - drawn > 0.04) {
-                show(draw(settings, traces, reading.getSeconds(), fill, error));
+                Screen::show(draw(title, traces, reading.getSeconds(), fill, error, true));
                 drawn = reading.getSeconds();
             }
         }
     });
+    screen.reset();
     const double seconds = reading.getSeconds();
     if (settings.json) {
         Json list = Json::array();
@@ -276,9 +275,12 @@ ExitCode showScope(const Settings& settings)
             list.push_back({{"name", trace.name}, {"peak", trace.peak}, {"rms", trace.rms()}});
         }
         printJson(std::cout,
-                  {{"counts", reading.getCounts()}, {"seconds", seconds}, {"channels", list}}, 2);
+                  {{"counts", static_cast<std::int64_t>(reading.getCounts())},
+                   {"seconds", seconds},
+                   {"channels", list}},
+                  2);
     } else {
-        show(draw(settings, traces, seconds, fill, error));
+        std::cout << draw(title, traces, seconds, fill, error, false);
     }
     const auto noPicture = caught([&] {
         if (!settings.png.empty() && !traces.empty()) {

@@ -1,6 +1,7 @@
 // What the commands have to do with the terminal.
 
 #include "Commands.hpp"
+#include "Screen.hpp"
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -36,6 +37,7 @@ void catchInterrupts()
     action.sa_handler = [](int /*signal*/) {
         interrupted = interrupted + 1;
         if (interrupted == 3) { // the order is taking too long
+            leaveScreen();
             _exit(Interrupted);
         }
         endInput();

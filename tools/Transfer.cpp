@@ -62,7 +62,7 @@ std::string typeOfData(const std::vector<DescribedValue>& fields,
     for (const DescribedValue& option : options) {
         type = option.name == name ? option.defaultValue : type;
     }
-    for (const Option& option : parseOptions(settings.channel.options)) {
+    for (const Option& option : parseOptions(settings.channel.options, settings.channel.device)) {
         type = option.name == name ? printElements(*option.type, option.elements) : type;
     }
     return type;
@@ -119,6 +119,26 @@ double countRate(Channel& channel, const SampleFile& file)
     return file.rate > 0 ? file.rate : channel.number("SampleRate", "double").value_or(0);
 }
 
+std::optional<long> chosenPort(Channel& channel, const ChannelSettings& settings)
+{
+    const auto port = channel.number("LocalPort", "uint16");
+    const bool isGiven = std::any_of(
+        settings.options.begin(), settings.options.end(), [](const std::string& option) {
+            return option.rfind("LocalPort", 0) == 0 && option.substr(option.find('=')) != "=0";
+        });
+    return port && !isGiven ? std::optional(std::lround(*port)) : std::nullopt;
+}
+
+void tellPort(Channel& channel, const Settings& settings)
+{
+    const auto port = chosenPort(channel, settings.channel);
+    if (port && settings.json) {
+        printJson(std::cerr, {{"LocalPort", *port}});
+    } else if (port && !settings.quiet) {
+        std::cerr << settings.channel.device << ": LocalPort " << *port << '\n';
+    }
+}
+
 Reading::Reading(Channel& openChannel, const Settings& settings, double rate)
     : channel(openChannel), fieldNames(settings.fields)
 {
@@ -156,9 +176,10 @@ ExitCode readSamples(const Settings& given)
 {
     Settings settings = given;
     settleFormat(settings.file);
-    Channel channel(settings.channel, false);
+    Channel channel(settings.channel, Use::Read);
     settings.file.rate = countRate(channel, settings.file);
     channel.open(settings.channel);
+    tellPort(channel, settings);
     Reading reading(channel, settings, settings.file.rate);
     const double most = reading.getMostCounts();
     Progress progress(std::min(most, channel.number("Frames", "int64").value_or(INFINITY)),
@@ -219,7 +240,7 @@ ExitCode writeSamples(const Settings& given)
     settings.channel.inputLimit = INFINITY;
     settings.channel.outputLimit =
         std::max(settings.channel.outputLimit, static_cast<double>(settings.block * columns));
-    Channel channel(settings.channel, true);
+    Channel channel(settings.channel, Use::Write);
     void* const output = channel.outputStream();
     const bool hasInput = channel.isSupported(channel.inputStream());
     double rate = settings.file.rate > 0 ? settings.file.rate : reader->getRate();

@@ -205,35 +205,4 @@ std::string quoted(const std::string& text, const char* escaped)
     return result + "'";
 }
 
-Option parseOption(const std::string& text)
-{
-    const std::size_t equals = text.find('=');
-    if (equals == std::string::npos || equals == 0) {
-        throw std::invalid_argument("an option is Name=value or Name:type=value, not " + text);
-    }
-    Option option;
-    option.name = text.substr(0, equals);
-    const std::string values = text.substr(equals + 1);
-    std::string wrong;
-    const std::size_t colon = option.name.find(':');
-    if (colon == std::string::npos) {
-        option.type = &elementType("double");
-        if (!parseRow(*option.type, values, option.elements, wrong)) {
-            option.type = &elementType("char");
-        }
-    } else {
-        option.type = &elementType(std::string_view(option.name).substr(colon + 1));
-        option.name.resize(colon);
-    }
-    option.elements.clear();
-    if (option.type->isText) {
-        option.elements.assign(values.begin(), values.end());
-    } else if (!parseRow(*option.type, values, option.elements, wrong)) {
-        throw std::invalid_argument("option " + option.name + ": not a value of type " +
-                                    option.type->name + ": " + wrong);
-    }
-    option.count = static_cast<int>(option.elements.size() / option.type->size);
-    return option;
-}
-
 } // namespace brenix

@@ -1,4 +1,4 @@
-// Typed values on the command line: their types, their texts, and options made of them.
+// Typed values on the command line: their types and their texts.
 #ifndef BRENIX_TOOLS_VALUES_HPP
 #define BRENIX_TOOLS_VALUES_HPP
 
@@ -42,18 +42,6 @@ std::string printElements(const ElementType& type, const Bytes& elements);
 
 /// A text between apostrophes; those in it become `escaped`.
 std::string quoted(const std::string& text, const char* escaped);
-
-/// An option of a channel, as coder.h takes it.
-struct Option {
-    std::string name;
-    const ElementType* type;
-    int count;
-    Bytes elements;
-};
-
-/// Reads "Name:type=value,value...". Without a type numbers are "double" and the rest is "char".
-/// Throws std::invalid_argument.
-Option parseOption(const std::string& text);
 
 } // namespace brenix
 

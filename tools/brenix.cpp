@@ -1,13 +1,17 @@
 // brenix: lists and checks plug-ins, and reads and writes samples through a channel.
 
 #include "Commands.hpp"
+#include "Screen.hpp"
 
 #include <CLI/CLI.hpp>
 #include <nlohmann/json.hpp>
 
 #include <algorithm>
+#include <array>
 #include <cmath>
+#include <cstdio>
 #include <iostream>
+#include <stdexcept>
 #include <string_view>
 
 namespace
@@ -36,20 +40,30 @@ void addList(CLI::App& command, const char* name, std::vector<std::string>& list
     command.add_option(name, list, help)->type_name(value)->allow_extra_args(false);
 }
 
-/// A number above 0; of counts, which cannot be divided, a whole one.
-void addNumber(CLI::App& command, const char* name, double& number, const char* help,
-               const char* unit)
+/// A number above 0, as parseQuantity() takes it; of counts, which cannot be divided, a whole one.
+template <typename Number>
+CLI::Option* addNumber(CLI::App& command, const char* name, Number& number, const char* help,
+                       const char* unit, int most = 0)
 {
     const bool whole = unit == std::string_view("COUNTS");
-    const auto check = [whole](const std::string& text) {
+    const std::string wanted = !whole ? " is not a number above 0"
+                               : most > 0
+                                   ? " is not a whole number from 1 to " + std::to_string(most)
+                                   : " is not a whole number of at least 1";
+    const auto settle = [whole, most, wanted](std::string& text) {
         double value = 0;
-        const bool ok = CLI::detail::lexical_cast(text, value) && std::isfinite(value) &&
-                        value > 0 && (!whole || value == std::floor(value));
-        return ok      ? std::string()
-               : whole ? text + " is not a whole number of at least 1"
-                       : text + " is not a number above 0";
+        if (!parseQuantity(text, value) || !std::isfinite(value) || !(value > 0) ||
+            (most > 0 && value > most) || (whole && value != std::floor(value))) {
+            return text + wanted;
+        }
+        std::array<char, 32> digits{};
+        std::snprintf(digits.data(), digits.size(), "%.17g", value);
+        text = digits.data();
+        return std::string();
     };
-    command.add_option(name, number, help)->type_name(unit)->check(check);
+    return command.add_option(name, number, help)
+        ->type_name(unit)
+        ->transform(CLI::Validator(settle, ""));
 }
 
 void addChannel(CLI::App& command, ChannelSettings& channel, double& limit)
@@ -111,7 +125,6 @@ ExitCode run(Settings& settings, int count, char** arguments)
     CLI::App app("Lists and checks plug-ins, and reads and writes samples through a channel.",
                  "brenix");
     app.set_version_flag("--version", "brenix " BRENIX_VERSION);
-    app.require_subcommand(1);
     app.footer("Exit codes: 0 done, 1 an error or a plug-in that does not load, 2 wrong usage, 130 "
                "interrupted.\nSee brenix(1).");
     const auto add = [&](const char* name, const char* help, ExitCode (*command)(const Settings&)) {
@@ -149,8 +162,7 @@ ExitCode run(Settings& settings, int count, char** arguments)
     addFile(*command, settings, "-i,--from", "File of the samples (default: standard input)");
     command->add_option("-t,--type", settings.type,
                         "Element type to write (default: as the plug-ins or the file tell)");
-    command->add_option("-b,--block", settings.block, "Counts of one buffer")
-        ->check(CLI::Range(1, 1 << 20))
+    addNumber(*command, "-b,--block", settings.block, "Counts of one buffer", "COUNTS", 1 << 20)
         ->capture_default_str();
     addEmit(*command, settings);
 
@@ -158,17 +170,37 @@ ExitCode run(Settings& settings, int count, char** arguments)
     addChannel(*command, settings.channel, inputLimit);
     addExtent(*command, settings);
     addFields(*command, settings);
-    command->add_option("--window", settings.window, "Counts across the screen")
-        ->check(CLI::Range(1, 1 << 24))
+    addNumber(*command, "--window", settings.window, "Counts across the screen", "COUNTS", 1 << 24)
         ->capture_default_str();
     command
         ->add_option("--png", settings.png, "Write a picture of all that was read (needs gnuplot)")
         ->type_name("FILE");
 
+    std::vector<std::string> words(arguments + 1, arguments + count);
+    if (!words.empty() && words[0] == "help") { // as many programs have it
+        words.erase(words.begin());
+        words.emplace_back("--help");
+    }
+    std::string known;
+    for (const CLI::App* const subcommand : app.get_subcommands({})) {
+        known += (known.empty() ? "" : ", ") + subcommand->get_name();
+    }
+    const std::string word = words.empty() ? "" : words[0];
+    if (word.rfind('-', 0) != 0 &&
+        (", " + known + ", ").find(", " + word + ", ") == std::string::npos) {
+        throw std::invalid_argument(
+            (word.empty() ? "a command is missing" : word + " is no command") + ": there are " +
+            known);
+    }
     try {
-        app.parse(count, arguments);
+        std::reverse(words.begin(), words.end()); // as parse() wants them
+        app.parse(words);
     } catch (const CLI::Success& help) {
         app.exit(help);
+    } catch (const CLI::ParseError& error) {
+        const auto given = app.get_subcommands();
+        throw std::invalid_argument(error.what() + std::string("; see brenix ") +
+                                    (given.empty() ? "" : given[0]->get_name() + ' ') + "--help");
     }
     if (!std::cout.flush()) {
         throw Failure("", "standard output: cannot be written");
@@ -189,7 +221,9 @@ void brenix::report(const Settings& settings, const Failure& failure)
     if (settings.json) {
         printJson(std::cerr, {{"error", {{"id", failure.getId()}, {"message", failure.what()}}}});
     } else {
-        std::cerr << "brenix: " << failure.text() << '\n';
+        const std::string text = printable(failure.text());
+        const bool isNamed = text.rfind("brenix:", 0) == 0; // the library's identifiers are
+        std::cerr << (isNamed ? "" : "brenix: ") << text << '\n';
     }
 }
 
@@ -203,9 +237,6 @@ int main(int count, char** arguments)
         catchInterrupts();
         std::ios::sync_with_stdio(false);
         return run(settings, count, arguments);
-    } catch (const CLI::ParseError& error) {
-        report(settings, {"", error.what() + std::string("; see brenix --help")});
-        return WrongUsage;
     } catch (const std::invalid_argument& error) {
         report(settings, {"", error.what()});
         return WrongUsage;

@@ -1,61 +1,39 @@
-#include "brenixcore/Channel.hpp"
+#include "Channel.hpp"
 
 #include "Converter.hpp"
-#include "Packets.hpp"
-#include "Plugin.hpp"
-#include "Stream.hpp"
+#include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 
-#include <atomic>
 #include <exception>
-#include <functional>
-#include <set>
 #include <stdexcept>
-#include <thread>
+#include <string_view>
 #include <utility>
 
 namespace brenixcore
 {
 
-using brenixplugin::OwnedProperty;
 using brenixplugin::PropertyMap;
 
 namespace
 {
 
-/// An event for the time of one call to the handler.
-class Event : public CustomEvent
+// The core's own properties.
+constexpr const char* reasonName = "Reason";   ///< why the last operation that failed did so
+constexpr const char* lostName = "LostCounts"; ///< of the input stream, since open
+
+Overflow overflowOf(const std::string& policy)
 {
-public:
-    Event(const char* eventName, const char* eventIdentifier, const char* eventMessage)
-        : name(textOf(eventName)), identifier(textOf(eventIdentifier)),
-          message(textOf(eventMessage))
-    {
+    constexpr std::pair<std::string_view, Overflow> policies[] = {
+        {"wait", Overflow::Wait},
+        {"dropOldest", Overflow::DropOldest},
+        {"dropNewest", Overflow::DropNewest}};
+    for (const auto& [name, overflow] : policies) {
+        if (policy == name) {
+            return overflow;
+        }
     }
-    const char* getEventName() override { return name; }
-    const char* getIdentifier() override { return identifier; }
-    const char* getMessage() override { return message; }
-
-private:
-    static const char* textOf(const char* text) { return text == nullptr ? "" : text; }
-
-    const char* name;
-    const char* identifier;
-    const char* message;
-};
-
-/// The core's own option: how long reads and writes wait, in seconds.
-std::optional<double> readTimeout(const PropertyMap& optionMap)
-{
-    plugin::Options options(optionMap);
-    const std::optional<double> seconds = options.number("Timeout");
-    if (seconds && *seconds < 0) {
-        plugin::Options::fail("Timeout", "must be 0 or more seconds");
-    }
-    return seconds;
+    plugin::Options::fail("Overflow", "must be wait, dropOldest or dropNewest, not " + policy);
 }
-
-enum class State { Created, Initialised, Open, Closed, Terminated };
 
 const char* nameOf(State state)
 {
@@ -76,136 +54,19 @@ const char* nameOf(State state)
 
 } // namespace
 
-struct BRENIXCORE_INTERNAL Channel::Impl final : plugin::DeviceHost, plugin::DeviceStreams {
-    Impl(const std::string& devicePath, plugin::Converter& channelConverter,
-         IEventHandler& eventHandler, unsigned long firstLimit, unsigned long secondLimit)
-        : converter(channelConverter), inputLimit(firstLimit), outputLimit(secondLimit),
-          device(loadPlugin<plugin::Device, CouldNotLoadDevice, CouldNotCreateDevice>(devicePath)),
-          handler(&eventHandler)
-    {
+CoreOptions::CoreOptions(PropertyMap& optionMap)
+{
+    plugin::Options options(optionMap);
+    timeout = options.number("Timeout");
+    if (timeout && *timeout < 0) {
+        plugin::Options::fail("Timeout", "must be 0 or more seconds");
     }
-
-    ~Impl();
-
-    // What the device calls.
-    void raise(const char* name, const char* identifier, const char* message) override;
-    void updateProperty(OwnedProperty property) override;
-    bool push(plugin::Packet packet) override;
-    std::optional<plugin::Packet> pull() override;
-    bool tryPush(plugin::Packet& packet) override;
-    std::optional<plugin::Packet> tryPull() override;
-    bool isClosing() const override;
-    void refuseOutput() override;
-
-    bool enter(plugin::Packet& packet, bool waits);
-    std::optional<plugin::Packet> leave(bool waits);
-
-    /// Refuses an operation in a state in which it has no meaning.
-    void require(bool allowed, const char* operation) const;
-
-    template <typename Operation>
-    void forEachStream(const Operation& operation);
-    void runDevice();
-    void stopDevice(Phase phase);
-    void terminateDevice();
-
-    // The libraries outlive everything that their code made.
-    std::list<PluginLibrary> filterLibraries;
-    plugin::Converter& converter;
-    const std::uint64_t inputLimit;
-    const std::uint64_t outputLimit;
-    LoadedPlugin<plugin::Device> device;
-
-    std::mutex handlerMutex; ///< held during each call of the handler; guards these two
-    IEventHandler* handler;  ///< null once the channel is being destroyed
-    std::set<std::string, std::less<>> propertyNames; ///< that init delivered
-
-    State state = State::Created;
-    std::unique_ptr<InputStream> input;
-    std::unique_ptr<OutputStream> output;
-    std::atomic<bool> closing = false; ///< while the channel waits for the device to stop
-    std::thread worker;                ///< runs the device while the channel is open
-};
-
-// --- What the device calls ---
-
-void Channel::Impl::raise(const char* name, const char* identifier, const char* message)
-{
-    const std::lock_guard lock(handlerMutex);
-    if (handler != nullptr) {
-        // An error whose identifier is empty would pass for none.
-        const bool isNamed = identifier != nullptr && *identifier != '\0';
-        Event event(name, isNamed ? identifier : "brenix:Device:failed", message);
-        handler->onCustomEvent(event);
+    if (const auto policy = options.text("Overflow")) {
+        overflow = overflowOf(*policy);
     }
-}
-
-void Channel::Impl::updateProperty(OwnedProperty property)
-{
-    const std::lock_guard lock(handlerMutex);
-    if (handler != nullptr && property && propertyNames.contains(property->getName())) {
-        handler->onPropertyUpdate(property.get());
-        property.release();
-    }
-}
-
-bool Channel::Impl::push(plugin::Packet packet)
-{
-    return enter(packet, true);
-}
-
-bool Channel::Impl::tryPush(plugin::Packet& packet)
-{
-    const bool isTaken = enter(packet, false);
-    if (!isTaken) {
-        packet.fields.setChecked(false); // it is in the device's hands again
-    }
-    return isTaken;
-}
-
-bool Channel::Impl::enter(plugin::Packet& packet, bool waits)
-{
-    if (!input) {
-        throw std::logic_error("The device pushed a packet but has no input stream.");
-    }
-    if (packet.counts == 0) {
-        throw std::invalid_argument("The device pushed a packet without counts.");
-    }
-    requireWhole(packet);
-    return input->impl->push(packet, waits, *this);
-}
-
-std::optional<plugin::Packet> Channel::Impl::pull()
-{
-    return leave(true);
-}
-
-std::optional<plugin::Packet> Channel::Impl::tryPull()
-{
-    return leave(false);
-}
-
-std::optional<plugin::Packet> Channel::Impl::leave(bool waits)
-{
-    if (!output) {
-        throw std::logic_error("The device pulled a packet but has no output stream.");
-    }
-    auto packet = output->impl->pull(waits);
-    if (!packet && input) {
-        input->impl->endDraining(); // nothing more will come of the output
-    }
-    return packet;
-}
-
-bool Channel::Impl::isClosing() const
-{
-    return closing;
-}
-
-void Channel::Impl::refuseOutput()
-{
-    if (output) {
-        output->impl->setDeviceDone();
+    stamps = options.logical("Stamps");
+    for (const char* const name : {"Timeout", "Overflow", "Stamps"}) {
+        optionMap.erase(name);
     }
 }
 
@@ -219,46 +80,112 @@ void Channel::Impl::require(bool allowed, const char* operation) const
     }
 }
 
-template <typename Operation>
-void Channel::Impl::forEachStream(const Operation& operation)
+template <typename Direction>
+std::unique_ptr<Direction> Channel::Impl::makeStream(const std::optional<plugin::StreamInfo>& info,
+                                                     std::uint64_t limit)
 {
-    if (input) {
-        operation(*input->impl);
-    }
-    if (output) {
-        operation(*output->impl);
-    }
+    return info ? std::make_unique<Direction>(std::make_unique<Stream::Impl>(
+                      *device.object, converter, filterLibraries, *this, limit, *info))
+                : nullptr;
 }
 
-void Channel::Impl::runDevice()
+void Channel::Impl::init(const PropertyMap& options, PropertyMap& properties)
 {
-    constexpr const char* identifier = "brenix:Device:failed";
-    try {
-        try {
-            device.object->run(*this);
-        } catch (const std::exception& exception) {
-            raise("error", identifier, exception.what());
-        } catch (...) {
-            raise("error", identifier, "Unrecognized error.");
-        }
-    } catch (...) { // the handler threw on a thread where it must not
+    require(state != State::Open, "init");
+    PropertyMap deviceOptions = options;
+    CoreOptions coreOptions(deviceOptions);
+    coreOptions.timeout = coreOptions.timeout.value_or(10);
+    if (state == State::Initialised || state == State::Closed) {
+        terminateDevice();
     }
-    forEachStream([](Stream::Impl& stream) { stream.setDeviceDone(); });
+    {
+        const std::lock_guard lock(handlerMutex);
+        propertyNames.clear(); // no updates until the new ones are delivered
+    }
+
+    brenixplugin::OwnedPropertyMap delivered;
+    std::set<std::string, std::less<>> names;
+    const plugin::DeviceInfo info = device.object->init(deviceOptions, delivered.map, *this);
+    try {
+        auto newInput = makeStream<InputStream>(info.input, inputLimit);
+        auto newOutput = makeStream<OwningOutputStream>(info.output, outputLimit);
+        for (const auto& property : delivered.map) {
+            names.insert(property.first);
+        }
+        // The core's, where they are none of the device's own.
+        if (!names.contains(reasonName)) {
+            plugin::publish(delivered.map, reasonName, std::string());
+        }
+        if (info.input && !names.contains(lostName)) {
+            plugin::publish(delivered.map, lostName, std::uint64_t{0});
+        }
+        input = std::move(newInput);
+        output = std::move(newOutput);
+    } catch (...) {
+        terminateDevice();
+        throw;
+    }
+    useOptions(coreOptions);
+    state = State::Initialised;
+    keepsReason = !names.contains(reasonName);
+    keepsLost = input && !names.contains(lostName);
+
+    // From here on nothing fails. What takes the place of an earlier property goes into the
+    // caller's map, and the earlier one out with the rest.
+    properties.merge(delivered.map);
+    for (auto& [name, property] : delivered.map) {
+        std::swap(property, properties.find(name)->second);
+    }
+    const std::lock_guard lock(handlerMutex);
+    propertyNames.swap(names); // updates may come
+}
+
+void Channel::Impl::useOptions(const CoreOptions& options)
+{
+    forEachStream([&](Stream::Impl& stream) {
+        if (options.timeout) {
+            stream.queue.setTimeout(*options.timeout);
+        }
+        if (options.overflow) {
+            stream.queue.setOverflow(*options.overflow);
+        }
+        stream.stamps = options.stamps.value_or(stream.stamps);
+    });
+}
+
+void Channel::Impl::open(const PropertyMap& options)
+{
+    require(state == State::Initialised || state == State::Closed, "open");
+    PropertyMap deviceOptions = options;
+    const CoreOptions coreOptions(deviceOptions);
+    device.object->open(deviceOptions);
+    useOptions(coreOptions);
+    forEachStream([](Stream::Impl& stream) { stream.queue.setPhase(Phase::Open); });
+    try {
+        updateLostCounts();
+        worker = std::thread([this] { runDevice(); });
+    } catch (...) {
+        forEachStream([](Stream::Impl& stream) { stream.queue.setPhase(Phase::Closed); });
+        device.object->close();
+        throw;
+    }
+    state = State::Open;
 }
 
 void Channel::Impl::stopDevice(Phase phase)
 {
     closing = true;
     if (input) {
-        input->impl->setPhase(output ? phase : Phase::Stopping); // without output nothing drains
+        input->impl->queue.setPhase(output ? phase
+                                           : Phase::Stopping); // without output nothing drains
     }
     if (output) {
-        output->impl->setPhase(phase);
+        output->impl->queue.setPhase(phase);
     }
     device.object->wake();
     worker.join();
     closing = false;
-    forEachStream([](Stream::Impl& stream) { stream.setPhase(Phase::Closed); });
+    forEachStream([](Stream::Impl& stream) { stream.queue.setPhase(Phase::Closed); });
     state = State::Closed;
     device.object->close();
 }
@@ -289,6 +216,37 @@ Channel::Impl::~Impl()
     }
 }
 
+void Channel::Impl::updateLostCounts()
+{
+    const std::lock_guard lock(handlerMutex);
+    if (handler != nullptr &&
+        keepsLost) { // the sum under the lock, or an older one could come later
+        auto property = plugin::makeScalar(lostName, input->impl->queue.getLost());
+        handler->onPropertyUpdate(property.get());
+        property.release();
+    }
+}
+
+void Channel::Impl::keepReason(const std::string& reason) noexcept
+{
+    if (std::exchange(raised, nullptr) == std::current_exception()) {
+        return; // it is kept already
+    }
+    if (!keepsReason) {
+        return;
+    }
+    try {
+        constexpr std::size_t most = 1023; // what a buffer for the message of an error takes
+        auto property = plugin::makeScalar(reasonName, std::string(reason.c_str()).substr(0, most));
+        const std::lock_guard lock(handlerMutex);
+        if (handler != nullptr) {
+            handler->onPropertyUpdate(property.get());
+            property.release();
+        }
+    } catch (...) { // memory is out, which needs no further reason
+    }
+}
+
 // --- The channel ---
 
 Channel::Channel(const std::string& devicePath, Converter& converter, IEventHandler& handler,
@@ -302,96 +260,41 @@ Channel::~Channel() = default;
 void Channel::init(const PropertyMap& options, PropertyMap& properties)
 {
     const OwnedOptions owned(options);
-    impl->require(impl->state != State::Open, "init");
-    const double timeout = readTimeout(options).value_or(10);
-    if (impl->state == State::Initialised || impl->state == State::Closed) {
-        impl->terminateDevice();
-    }
-    {
-        const std::lock_guard lock(impl->handlerMutex);
-        impl->propertyNames.clear(); // no updates until the new ones are delivered
-    }
-
-    brenixplugin::OwnedPropertyMap delivered;
-    std::set<std::string, std::less<>> names;
-    const plugin::DeviceInfo info = impl->device.object->init(options, delivered.map, *impl);
-    try {
-        std::unique_ptr<InputStream> input;
-        std::unique_ptr<OutputStream> output;
-        if (info.input) {
-            input = std::make_unique<InputStream>(std::make_unique<Stream::Impl>(
-                *impl->device.object, impl->converter, impl->filterLibraries, impl->inputLimit,
-                *info.input));
-        }
-        if (info.output) {
-            output = std::make_unique<OutputStream>(std::make_unique<Stream::Impl>(
-                *impl->device.object, impl->converter, impl->filterLibraries, impl->outputLimit,
-                *info.output));
-        }
-        for (const auto& property : delivered.map) {
-            names.insert(property.first);
-        }
-        impl->input = std::move(input);
-        impl->output = std::move(output);
-    } catch (...) {
-        impl->terminateDevice();
-        throw;
-    }
-    impl->forEachStream([&](Stream::Impl& stream) { stream.setTimeout(timeout); });
-    impl->state = State::Initialised;
-
-    // From here on nothing fails. What takes the place of an earlier property goes into the
-    // caller's map, and the earlier one out with the rest.
-    properties.merge(delivered.map);
-    for (auto& [name, property] : delivered.map) {
-        std::swap(property, properties.find(name)->second);
-    }
-    const std::lock_guard lock(impl->handlerMutex);
-    impl->propertyNames.swap(names); // updates may come
+    impl->explain([&] { impl->init(options, properties); });
 }
 
 void Channel::open(const PropertyMap& options)
 {
     const OwnedOptions owned(options);
-    impl->require(impl->state == State::Initialised || impl->state == State::Closed, "open");
-    const std::optional<double> timeout = readTimeout(options);
-    impl->device.object->open(options);
-    impl->forEachStream([&](Stream::Impl& stream) {
-        stream.setPhase(Phase::Open);
-        if (timeout) {
-            stream.setTimeout(*timeout);
-        }
-    });
-    try {
-        impl->worker = std::thread([this] { impl->runDevice(); });
-    } catch (...) {
-        impl->forEachStream([](Stream::Impl& stream) { stream.setPhase(Phase::Closed); });
-        impl->device.object->close();
-        throw;
-    }
-    impl->state = State::Open;
+    impl->explain([&] { impl->open(options); });
 }
 
 void Channel::execute(const char* command, const PropertyMap& options)
 {
     const OwnedOptions owned(options);
-    impl->require(impl->state != State::Created && impl->state != State::Terminated, "execute");
-    if (command == nullptr) {
-        throw std::invalid_argument("The command to execute must not be null.");
-    }
-    impl->device.object->execute(command, options);
+    impl->explain([&] {
+        impl->require(impl->state != State::Created && impl->state != State::Terminated, "execute");
+        if (command == nullptr) {
+            throw std::invalid_argument("The command to execute must not be null.");
+        }
+        impl->device.object->execute(command, options);
+    });
 }
 
 void Channel::close()
 {
-    impl->require(impl->state == State::Open, "close");
-    impl->stopDevice(Phase::Draining);
+    impl->explain([&] {
+        impl->require(impl->state == State::Open, "close");
+        impl->stopDevice(Phase::Draining);
+    });
 }
 
 void Channel::term()
 {
-    impl->require(impl->state == State::Initialised || impl->state == State::Closed, "term");
-    impl->terminateDevice();
+    impl->explain([&] {
+        impl->require(impl->state == State::Initialised || impl->state == State::Closed, "term");
+        impl->terminateDevice();
+    });
 }
 
 bool Channel::isOpen() const

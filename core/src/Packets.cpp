@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <memory>
+#include <optional>
 #include <stdexcept>
 #include <string>
 
@@ -39,19 +40,16 @@ struct Slicer {
     std::uint64_t length;
     std::uint64_t counts;
     OwnedProperty result;
-    std::uint64_t elements = 0; ///< in the whole property
 
     template <typename T>
     void operator()(const TScalarProperty<T>& scalar)
     {
-        elements = 1;
         result = plugin::makeScalar(scalar.name, scalar.value);
     }
 
     template <typename T>
     void operator()(const TPointerProperty<T>& array)
     {
-        elements = array.count;
         const Range range(first, length, counts, array.count);
         std::unique_ptr<T[]> copy(new T[range.size]);
         std::copy_n(array.data + range.begin, range.size, copy.get());
@@ -61,8 +59,7 @@ struct Slicer {
     template <typename T>
     void operator()(const TVectorProperty<T>& vector)
     {
-        elements = vector.values.size();
-        const Range range(first, length, counts, elements);
+        const Range range(first, length, counts, vector.values.size());
         auto copy = std::make_unique<TVectorProperty<T>>(vector.name, range.size);
         std::copy_n(vector.values.begin() + static_cast<std::ptrdiff_t>(range.begin), range.size,
                     copy->values.begin());
@@ -78,18 +75,27 @@ void visitField(const std::string& name, void* property, Visitor&& visitor)
     }
 }
 
-/// Throws when an array has lost its elements.
-struct RequireElements {
+/// Counts the elements of the first property. Throws when an array has lost its elements.
+struct CountElements {
+    std::optional<std::uint64_t> first;
+
     template <typename T>
-    void operator()(const TPointerProperty<T>& array) const
+    void operator()(const TPointerProperty<T>& array)
     {
         if (array.data == nullptr && array.count > 0) {
             throw std::invalid_argument("Field " + array.name + " has no elements.");
         }
+        first = first.value_or(array.count);
     }
-    template <typename Other>
-    void operator()(const Other& /*holds its values*/) const
+    template <typename T>
+    void operator()(const TScalarProperty<T>& /*one*/)
     {
+        first = first.value_or(1);
+    }
+    template <typename T>
+    void operator()(const TVectorProperty<T>& vector)
+    {
+        first = first.value_or(vector.values.size());
     }
 };
 
@@ -107,6 +113,15 @@ plugin::Packet slice(const plugin::Packet& packet, std::uint64_t first, std::uin
     return part;
 }
 
+std::uint64_t countsOf(const PropertyMap& fields)
+{
+    CountElements counter;
+    for (const auto& [name, property] : fields) {
+        visitField(name, property, counter);
+    }
+    return counter.first.value_or(0);
+}
+
 plugin::Packet copyFields(const PropertyMap& fields)
 {
     plugin::Packet copy;
@@ -114,10 +129,8 @@ plugin::Packet copyFields(const PropertyMap& fields)
         Slicer slicer{0, 1, 1, nullptr};
         visitField(name, property, slicer);
         storeProperty(*copy.fields, name, std::move(slicer.result));
-        if (copy.counts == 0) {
-            copy.counts = slicer.elements;
-        }
     }
+    copy.counts = countsOf(fields);
     return copy;
 }
 
@@ -132,9 +145,7 @@ void requireWhole(const plugin::Packet& packet)
     if (packet.fields.isChecked()) {
         return;
     }
-    for (const auto& [name, property] : *packet.fields) {
-        visitField(name, property, RequireElements());
-    }
+    countsOf(*packet.fields);
     packet.fields.setChecked(true);
 }
 

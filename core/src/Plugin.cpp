@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <fstream>
 #include <optional>
+#include <sstream>
 #include <stdexcept>
 
 namespace brenixcore
@@ -44,15 +45,40 @@ void requireWholeFile(const std::string& path)
     }
 }
 
+/// The file that is mapped at an address, as the system has it; empty when there is none.
+std::string mappedFile(std::uintptr_t address)
+{
+    std::ifstream mappings("/proc/self/maps");
+    for (std::string line; std::getline(mappings, line);) {
+        // begin-end access offset device inode path
+        std::istringstream fields(line);
+        std::uintptr_t begin = 0;
+        std::uintptr_t end = 0;
+        fields >> std::hex >> begin;
+        fields.ignore(1);
+        fields >> end;
+        const std::size_t path = line.find('/');
+        if (address >= begin && address < end && path != std::string::npos) {
+            return line.substr(path);
+        }
+    }
+    return "";
+}
+
 } // namespace
 
 std::string plugin::pluginFolder()
 {
+    const auto* const here = reinterpret_cast<const char*>(&pluginPath);
     Dl_info info{};
-    if (dladdr(reinterpret_cast<const void*>(&pluginPath), &info) == 0) {
+    std::string library = dladdr(here, &info) == 0 ? "" : info.dli_fname;
+    if (library.rfind('/', 0) != 0) {
+        // The loader found it in a folder relative to what was then the current one.
+        library = mappedFile(reinterpret_cast<std::uintptr_t>(here));
+    }
+    if (library.empty()) {
         throw std::runtime_error("the folder of this library is not known");
     }
-    const std::string library = info.dli_fname;
     return library.substr(0, library.rfind('/') + 1) + "brenix-plugins/";
 }
 

@@ -1,298 +1,64 @@
 #include "Stream.hpp"
 
 #include "Packets.hpp"
+#include "brenixcore/plugin/Make.hpp"
 
 #include <algorithm>
-#include <iterator>
+#include <chrono>
 #include <stdexcept>
 #include <string>
 #include <utility>
+#include <vector>
 
 namespace brenixcore
 {
 
 using brenixplugin::PropertyMap;
 
-// --- The queue ---
-
-void Stream::Impl::setPhase(Phase newPhase)
+bool Stream::Impl::push(plugin::Packet& packet, bool waits)
 {
-    const std::lock_guard lock(mutex);
-    phase = newPhase;
-    if (phase == Phase::Open) {
-        deviceDone = false;
-    }
-    changed.notify_all();
-}
-
-void Stream::Impl::endDraining()
-{
-    const std::lock_guard lock(mutex);
-    if (phase == Phase::Draining) {
-        phase = Phase::Stopping;
-        changed.notify_all();
-    }
-}
-
-void Stream::Impl::setDeviceDone()
-{
-    const std::lock_guard lock(mutex);
-    deviceDone = true;
-    changed.notify_all();
-}
-
-void Stream::Impl::setTimeout(double seconds)
-{
-    using namespace std::chrono;
-    constexpr double longest = 1e9; // more than a clock's range is as good as for ever
-    const std::lock_guard lock(mutex);
-    timeout.reset();
-    if (seconds < longest) {
-        timeout = duration_cast<steady_clock::duration>(duration<double>(seconds));
-    }
-}
-
-bool Stream::Impl::giveWay(std::unique_lock<std::mutex>& lock)
-{
-    if (sleeps > 0) {
-        --sleeps;
+    Queue::Lock lock = queue.lock();
+    if (!queue.awaitTurn(lock, waits)) {
         return false;
     }
-    using std::chrono::steady_clock;
-    lock.unlock();
-    const auto begin = steady_clock::now();
-    std::this_thread::yield();
-    const bool tookLong = steady_clock::now() - begin > std::chrono::microseconds(200);
-    lock.lock();
-    // Busy threads leave the processor to one that is woken, but not to one that gave it away.
-    if (tookLong) {
-        sleeps = caution;
-        caution = std::min(2 * caution, 1U << 16);
-    } else {
-        caution = std::max(caution - 1, 16U);
-    }
-    return !tookLong;
-}
-
-bool Stream::Impl::push(plugin::Packet& packet, bool waits, plugin::DeviceHost& host)
-{
-    std::unique_lock lock(mutex);
-    if (waits) {
-        waitUntil(lock, [&] { return pending.empty() || phase != Phase::Open; });
-    }
-    if (!pending.empty() || !takesPart()) {
-        return false;
-    }
+    const std::uint64_t brought = packet.counts;
     if (!filters.empty()) {
         lock.unlock();
         try {
-            applyFilters(packet);
-        } catch (...) {
-            host.raise("error", "brenix:Stream:filterFailed", currentExceptionText().c_str());
-            return true; // without this packet
+            filters.apply(packet);
+        } catch (...) { // without this packet
+            const std::string reason = currentExceptionText();
+            queue.lose(packet.lost + brought, nullptr);
+            tellLosses(false);
+            reporter.raise("error", "brenix:Stream:filterFailed", reason.c_str());
+            return true;
         }
         lock.lock();
     }
-    if (packet.counts > 0) {
-        pending.emplace_back(std::move(packet));
-        refill();
+    double period = 0;
+    if (info.rate > 0 && packet.counts > 0) { // filters change the number of counts, not their time
+        period =
+            1e9 / info.rate * static_cast<double>(brought) / static_cast<double>(packet.counts);
     }
-    const bool ends = wanted > 0 && counts >= wanted; // the wait of a read
-    lock.unlock();
-    if (ends) {
-        changed.notify_all();
+    if (queue.bring(lock, std::move(packet), period)) {
+        tellLosses(false);
     }
     return true;
 }
 
-void Stream::Impl::refill()
+void Stream::Impl::tellLosses(bool atEnd)
 {
-    while (!pending.empty()) {
-        QueuedPacket& next = pending.front();
-        std::uint64_t part = next.counts();
-        if (!fits(part)) {
-            // Room for a part is used only where waiting for more would never end: by a packet
-            // beyond the limit, or while a read waits for more counts than are there.
-            if (counts >= limit || (counts > 0 && wanted <= counts)) {
-                return;
-            }
-            part = limit - counts;
-        }
-        if (part == next.packet.counts) {
-            packets.splice(packets.end(), pending, pending.begin());
-        } else {
-            packets.emplace_back(slice(next.packet, next.taken, part));
-            next.taken += part;
-            if (next.counts() == 0) {
-                pending.pop_front();
-            }
-        }
-        counts += part;
+    const auto gaps = queue.takeNews(atEnd);
+    if (!gaps) {
+        return;
     }
-}
-
-std::optional<plugin::Packet> Stream::Impl::pull(bool waits)
-{
-    std::unique_lock lock(mutex);
-    if (waits) {
-        waitUntil(lock, [&] { return !packets.empty() || phase != Phase::Open; });
+    reporter.updateLostCounts();
+    for (const Gap& gap : *gaps) {
+        const std::string message = std::to_string(gap.counts) +
+                                    " counts were lost: " + gap.reason + "; " +
+                                    std::to_string(gap.sum) + " since open.";
+        reporter.raise("error", "brenix:Stream:dataLost", message.c_str());
     }
-    if (packets.empty() || !takesPart()) {
-        return std::nullopt;
-    }
-    plugin::Packet packet = std::move(packets.front().packet);
-    packets.pop_front();
-    counts -= packet.counts;
-    lock.unlock();
-    changed.notify_all();
-    return packet;
-}
-
-void Stream::Impl::notifyDevice(std::unique_lock<std::mutex>& lock)
-{
-    const bool running = phase != Phase::Closed;
-    lock.unlock();
-    changed.notify_all();
-    if (running) {
-        device.wake();
-    }
-}
-
-Stream::Impl::Packets Stream::Impl::take(std::uint64_t count)
-{
-    Packets result;
-    try {
-        for (std::uint64_t missing = count; missing > 0;) {
-            QueuedPacket& front = packets.front();
-            const std::uint64_t part = std::min(missing, front.counts());
-            if (part < front.packet.counts) {
-                result.emplace_back(slice(front.packet, front.taken, part)).converted =
-                    front.converted;
-                front.taken += part;
-                if (front.counts() == 0) {
-                    packets.pop_front();
-                }
-            } else {
-                result.splice(result.end(), packets, packets.begin());
-            }
-            missing -= part;
-        }
-    } catch (...) {
-        packets.splice(packets.begin(), result);
-        throw;
-    }
-    counts -= count;
-    return result;
-}
-
-void Stream::Impl::putBack(Packets& taken) noexcept
-{
-    for (const QueuedPacket& queued : taken) {
-        counts += queued.counts();
-    }
-    packets.splice(packets.begin(), taken);
-}
-
-Stream::Impl::Packets Stream::Impl::takeInTime(std::uint64_t count)
-{
-    std::unique_lock lock(mutex);
-    const auto refuse = [&](const std::string& why) {
-        throw SynchronousInputNotPossible("Cannot read " + std::to_string(count) +
-                                          " counts: " + why + ".");
-    };
-    if (count > limit) {
-        refuse("the limit is " + std::to_string(limit));
-    }
-    wanted = count;
-    try {
-        refill();
-    } catch (...) {
-        wanted = 0;
-        throw;
-    }
-    if (counts < count) { // the device may be waiting for this
-        notifyDevice(lock);
-        lock.lock();
-    }
-    waitUntil(
-        lock, [&] { return counts >= count || !isFlowing(); }, timeout);
-    wanted = 0;
-    if (counts < count) {
-        refuse("there are " + std::to_string(counts) + " and " + reason());
-    }
-    Packets taken = take(count);
-    try {
-        refill();
-    } catch (...) { // what waits on would be missed by whoever waits for it to arrive
-        putBack(taken);
-        throw;
-    }
-    notifyDevice(lock);
-    return taken;
-}
-
-const char* Stream::Impl::reason() const
-{
-    if (phase != Phase::Open) {
-        return "the channel is not open";
-    }
-    return deviceDone ? "the device is done" : "the time is over";
-}
-
-// --- Filters ---
-
-void Stream::Impl::addFilter(const std::string& name, const PropertyMap& options)
-{
-    if (const std::lock_guard lock(mutex); phase != Phase::Closed) {
-        throw CannotAddFilterWhileOpen("Cannot add filter " + name + " while the channel is open.");
-    }
-    auto loaded = loadPlugin<plugin::Filter, CouldNotLoadFilter, CouldNotCreateFilter>(name);
-    libraries.push_back(std::move(loaded.library));
-    plugin::Options given(options);
-    loaded.object->tune(given);
-    given.requireAllKnown();
-    const std::lock_guard lock(filterMutex);
-    filters.push_back(std::move(loaded.object));
-}
-
-void Stream::Impl::tuneFilters(const PropertyMap& options)
-{
-    plugin::Options given(options);
-    const std::lock_guard lock(filterMutex);
-    for (const auto& filter : filters) {
-        filter->tune(given);
-    }
-    given.requireAllKnown(); // to one of them
-}
-
-void Stream::Impl::applyFilters(plugin::Packet& packet)
-{
-    const std::lock_guard lock(filterMutex);
-    for (const auto& filter : filters) {
-        if (packet.counts > 0) {
-            filter->apply(packet);
-            requireWhole(packet);
-        }
-    }
-}
-
-std::uint64_t Stream::Impl::applyFilters(Packets& outgoing)
-{
-    std::uint64_t filtered = 0;
-    for (auto queued = outgoing.begin(); queued != outgoing.end();) {
-        const plugin::Packet& packet = queued->packet;
-        try {
-            applyFilters(queued->packet);
-            if (packet.counts > limit - filtered) {
-                throw std::length_error("The filters made more counts than the limit.");
-            }
-        } catch (...) {
-            throw CouldNotConvertOutputData(currentExceptionText());
-        }
-        filtered += packet.counts;
-        queued = packet.counts > 0 ? std::next(queued) : outgoing.erase(queued);
-    }
-    return filtered;
 }
 
 void Stream::Impl::convert(plugin::Packet& packet,
@@ -304,6 +70,28 @@ void Stream::Impl::convert(plugin::Packet& packet,
         throw std::logic_error("The converter changed the number of counts.");
     }
     requireWhole(packet);
+}
+
+void Stream::Impl::send(Queue::Packets& outgoing, std::chrono::steady_clock::time_point begin)
+{
+    try {
+        std::uint64_t filtered = 0;
+        for (QueuedPacket& queued : outgoing) {
+            plugin::Packet& packet = queued.packet;
+            convert(packet, &plugin::Converter::convertOutput);
+            filters.apply(packet);
+            if (packet.counts > queue.getLimit() - filtered) {
+                throw std::length_error("The filters made more counts than the limit.");
+            }
+            filtered += packet.counts;
+        }
+    } catch (...) {
+        throw CouldNotConvertOutputData(currentExceptionText());
+    }
+    outgoing.erase(std::remove_if(outgoing.begin(), outgoing.end(),
+                                  [](const QueuedPacket& queued) { return queued.counts() == 0; }),
+                   outgoing.end());
+    queue.add(outgoing, begin);
 }
 
 // --- Both directions ---
@@ -320,46 +108,45 @@ bool Stream::isInput() const
 void Stream::addFilter(const std::string& filterName, const PropertyMap& options)
 {
     const OwnedOptions owned(options);
-    impl->addFilter(filterName, options);
+    impl->reporter.explain([&] {
+        if (isOpen()) {
+            throw CannotAddFilterWhileOpen("Cannot add filter " + filterName +
+                                           " while the channel is open.");
+        }
+        impl->filters.add(filterName, options);
+    });
 }
 
 void Stream::tuneFilters(const PropertyMap& options)
 {
     const OwnedOptions owned(options);
-    impl->tuneFilters(options);
+    impl->reporter.explain([&] { impl->filters.tune(options); });
 }
 
 void Stream::flush()
 {
-    Impl::Packets discarded;
-    std::unique_lock lock(impl->mutex);
-    discarded.splice(discarded.end(), impl->packets);
-    discarded.splice(discarded.end(), impl->pending);
-    impl->counts = 0;
-    impl->notifyDevice(lock);
+    impl->queue.flush();
 }
 
 bool Stream::isOpen() const
 {
-    const std::lock_guard lock(impl->mutex);
-    return impl->phase != Phase::Closed;
+    return impl->queue.getPhase(impl->queue.lock()) != Phase::Closed;
 }
 
 bool Stream::isUnlimited() const
 {
-    return impl->limit == UINT64_MAX;
+    return impl->queue.getLimit() == UINT64_MAX;
 }
 
 unsigned long Stream::getDataAvailable() const
 {
-    const std::lock_guard lock(impl->mutex);
-    return impl->counts;
+    return impl->queue.getCounts();
 }
 
 unsigned long Stream::getSpaceAvailable() const
 {
-    const std::lock_guard lock(impl->mutex);
-    return impl->limit - std::min(impl->limit, impl->counts);
+    const std::uint64_t limit = impl->queue.getLimit();
+    return limit - std::min(limit, impl->queue.getCounts());
 }
 
 // --- Input ---
@@ -375,8 +162,7 @@ bool InputStream::isInput() const
 
 bool InputStream::isDeviceDone() const
 {
-    const std::lock_guard lock(impl->mutex);
-    return impl->deviceDone;
+    return impl->queue.isDone();
 }
 
 unsigned long InputStream::getCountDimension() const
@@ -387,15 +173,7 @@ unsigned long InputStream::getCountDimension() const
 void InputStream::peekCounts(unsigned long limit, unsigned long& total,
                              std::vector<unsigned long>& counts)
 {
-    const std::lock_guard lock(impl->mutex);
-    total = 0;
-    for (const QueuedPacket& queued : impl->packets) {
-        if (total == limit) {
-            break;
-        }
-        counts.push_back(std::min(limit - total, queued.counts()));
-        total += counts.back();
-    }
+    impl->reporter.explain([&] { impl->queue.list(limit, total, counts); });
 }
 
 void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigned long& countRead)
@@ -406,32 +184,43 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
         ~Taken()
         {
             if (!packets.empty()) {
-                const std::lock_guard lock(stream.mutex);
-                stream.putBack(packets);
+                queue.putBack(packets);
+            }
+            queue.settle();
+        }
+        Queue& queue;
+        Queue::Packets packets;
+    };
+    stream.reporter.explain([&] {
+        Taken taken{stream.queue, stream.queue.take(count)};
+        buffers.reserve(taken.packets.size());
+        for (auto current = taken.packets.begin(); current != taken.packets.end(); ++current) {
+            if (current->converted) {
+                continue;
+            }
+            try {
+                stream.convert(current->packet, &plugin::Converter::convertInput);
+                current->converted = true;
+            } catch (...) {
+                const std::string reason = currentExceptionText();
+                stream.queue.loseTaken(current->counts());
+                taken.packets.erase(current);
+                stream.reporter.updateLostCounts();
+                throw CouldNotConvertInputData(reason);
             }
         }
-        Impl& stream;
-        Impl::Packets packets;
-    } taken{stream, stream.takeInTime(count)};
-
-    buffers.reserve(taken.packets.size());
-    for (auto current = taken.packets.begin(); current != taken.packets.end(); ++current) {
-        if (current->converted) {
-            continue;
+        if (stream.stamps) {
+            for (QueuedPacket& queued : taken.packets) {
+                plugin::setField(queued.packet, plugin::makeScalar("Index", queued.index));
+                plugin::setField(queued.packet, plugin::makeScalar("Time", queued.packet.time));
+            }
         }
-        try {
-            stream.convert(current->packet, &plugin::Converter::convertInput);
-            current->converted = true;
-        } catch (...) {
-            taken.packets.erase(current);
-            throw CouldNotConvertInputData(currentExceptionText());
+        for (QueuedPacket& queued : taken.packets) {
+            buffers.push_back(queued.packet.fields.release());
         }
-    }
-    for (QueuedPacket& queued : taken.packets) {
-        buffers.push_back(queued.packet.fields.release());
-    }
-    taken.packets.clear();
-    countRead = count;
+        taken.packets.clear();
+        countRead = count;
+    });
 }
 
 // --- Output ---
@@ -447,8 +236,7 @@ bool OutputStream::isInput() const
 
 bool OutputStream::isDeviceDone() const
 {
-    const std::lock_guard lock(impl->mutex);
-    return impl->deviceDone;
+    return impl->queue.isDone();
 }
 
 unsigned long OutputStream::getCountDimension() const
@@ -458,55 +246,43 @@ unsigned long OutputStream::getCountDimension() const
 
 unsigned long OutputStream::write(const std::vector<void*>& dataList)
 {
-    Impl& stream = *impl;
-    Impl::Packets outgoing;
-    std::uint64_t written = 0; // counts as the caller wrote them
-    for (const void* buffer : dataList) {
-        plugin::Packet packet = copyFields(*static_cast<const PropertyMap*>(buffer));
-        try {
-            stream.convert(packet, &plugin::Converter::convertOutput);
-        } catch (...) {
-            throw CouldNotConvertOutputData(currentExceptionText());
+    return impl->reporter.explain([&] {
+        const auto begin = std::chrono::steady_clock::now();
+        Queue::Packets outgoing;
+        outgoing.reserve(dataList.size());
+        std::uint64_t written = 0; // counts as the caller wrote them
+        for (const void* buffer : dataList) {
+            outgoing.emplace_back(copyFields(*static_cast<const PropertyMap*>(buffer)));
+            written += outgoing.back().counts();
         }
-        if (packet.counts > 0) {
-            written += packet.counts;
+        // First, so that neither the converter nor a filter sees twice what is refused and written again.
+        impl->queue.awaitRoom(written);
+        impl->send(outgoing, begin);
+        return written;
+    });
+}
+
+unsigned long OwningOutputStream::takeBuffers(std::vector<void*>& dataList)
+{
+    return impl->reporter.explain([&] {
+        const auto begin = std::chrono::steady_clock::now();
+        Queue::Packets outgoing;
+        outgoing.reserve(dataList.size());
+        std::uint64_t written = 0;
+        for (const void* buffer : dataList) {
+            written += countsOf(*static_cast<const PropertyMap*>(buffer));
+        }
+        impl->queue.awaitRoom(written); // the buffers are the caller's until here
+        for (void*& buffer : dataList) {
+            plugin::Packet packet{plugin::Fields(brenixplugin::OwnedDataBuffer(
+                static_cast<PropertyMap*>(std::exchange(buffer, nullptr))))};
+            packet.counts = countsOf(*packet.fields);
+            packet.fields.setChecked(true);
             outgoing.emplace_back(std::move(packet));
         }
-    }
-
-    const auto refuse = [&](const std::string& why) {
-        throw SynchronousOutputNotPossible("Cannot write " + std::to_string(written) +
-                                           " counts: " + why + ".");
-    };
-    const auto requirePossible = [&](std::uint64_t counts) {
-        if (!stream.fits(counts)) {
-            refuse(std::string("there is no room and ") + stream.reason());
-        }
-        if (counts > 0 && stream.phase == Phase::Open && stream.deviceDone) {
-            refuse("the device is done");
-        }
-    };
-    std::unique_lock lock(stream.mutex);
-    if (written > stream.limit) {
-        refuse("the limit is " + std::to_string(stream.limit));
-    }
-    stream.waitUntil(
-        lock, [&] { return stream.fits(written) || !stream.isFlowing(); }, stream.timeout);
-    requirePossible(written);
-
-    std::uint64_t filtered = written;
-    if (!stream.filters.empty()) {
-        // Only now, so that a filter does not see twice what is refused and written again. Meanwhile
-        // nobody but this thread takes the room.
-        lock.unlock();
-        filtered = stream.applyFilters(outgoing);
-        lock.lock();
-        requirePossible(filtered);
-    }
-    stream.packets.splice(stream.packets.end(), outgoing);
-    stream.counts += filtered;
-    stream.notifyDevice(lock);
-    return written;
+        impl->send(outgoing, begin);
+        return written;
+    });
 }
 
 } // namespace brenixcore

@@ -14,10 +14,11 @@
  * lets a C++ exception out, also when memory runs out.
  *
  * A null channel or stream handle makes every function return its failure value (0, NULL or
- * nothing) and do nothing else, but for the out-values that are reset first. A null pointer for an
- * out-value or a destination is an error ("Argument <name> must not be null.") and nothing is done.
- * A handle is not checked further: it must be one that the library gave out and that is still
- * valid.
+ * nothing) and do nothing else, but for the out-values that are reset first; so does a stream
+ * handle in place of a channel handle, and a channel handle in place of a stream handle. A null
+ * pointer for an out-value or a destination is an error ("Argument <name> must not be null.") and
+ * nothing is done. A handle is not checked further: it must be one that the library gave out, of a
+ * channel that is not destroyed.
  *
  * ### Three error records
  *
@@ -158,10 +159,11 @@ CODER_API void* coderChannelCreate(const char* devicePath, const char* converter
  * Initialises the device with options, fills the property store and makes new stream handles.
  *
  * Whatever the result, ask for both stream handles again: a call that succeeds replaces both and
- * releases the buffers that the old input stream held. A call that fails before the device is
- * initialised leaves the old handles valid; one that fails after it (memory runs out while the
- * handles are made) may have replaced the input handle, and the old output handle, if it could not
- * be replaced, reports that it is not supported.
+ * releases the buffers that the old input stream held. The old handles then answer as those of a
+ * channel without streams; the channel keeps some 150 bytes for the two until it is destroyed. A
+ * call that fails before the device is initialised leaves the handles as they are; one that fails
+ * after it (memory runs out while the handles are made) may have replaced the input handle, and a
+ * handle that it has not replaced reports that it is not supported.
  *
  * @param channel     channel handle
  * @param optionCount number of options that follow, each a #CODER_OPTION
@@ -212,16 +214,16 @@ CODER_API int coderChannelIsOpen(void* channel, uint8_t* open) CODER_NOEXCEPT;
 /**
  * Releases the channel, its streams with the buffers they hold, and its plug-ins. A null handle is
  * allowed. Close and terminate the channel first: events of an open device must not meet a channel
- * that is going away. The handle and its stream handles are invalid afterwards.
+ * that is going away. The handle and all its stream handles are invalid afterwards.
  */
 CODER_API void coderChannelDestroy(void* channel) CODER_NOEXCEPT;
 
 /**
  * The channel's input stream.
- * @return a stream handle owned by the channel, valid until the next coderChannelInit() or
- *         coderChannelDestroy(); NULL before the first successful coderChannelInit(). A channel
- *         without input has a handle all the same: coderStreamIsSupported() tells. Clears the last
- *         error and records none.
+ * @return a stream handle owned by the channel and valid until coderChannelDestroy(), but from the
+ *         next coderChannelInit() on without a stream; NULL before the first successful
+ *         coderChannelInit(). A channel without input has a handle all the same:
+ *         coderStreamIsSupported() tells. Clears the last error and records none.
  */
 CODER_API void* coderChannelGetInputStream(void* channel) CODER_NOEXCEPT;
 
@@ -283,8 +285,9 @@ CODER_API int coderChannelGetLastAsyncError(void* channel, char* errorId,
 /**
  * @name Streams
  * The stream is one of the two handles of a channel. On a channel without a stream of this
- * direction everything but coderStreamGetChannel() and coderStreamIsSupported() fails with
- * brenix:InputStream:notSupported or brenix:OutputStream:notSupported. Errors are recorded as the
+ * direction, and with a handle of before the last coderChannelInit(), everything but
+ * coderStreamGetChannel() and coderStreamIsSupported() fails with brenix:InputStream:notSupported or
+ * brenix:OutputStream:notSupported; no buffers are stored there. Errors are recorded as the
  * channel's last error.
  * @{
  */
@@ -292,7 +295,7 @@ CODER_API int coderChannelGetLastAsyncError(void* channel, char* errorId,
 /** The handle of the channel that owns the stream. Leaves the last error alone. */
 CODER_API void* coderStreamGetChannel(void* stream) CODER_NOEXCEPT;
 
-/** Writes 1 to `supported` if the channel has a stream of this direction, else 0. */
+/** Writes 1 to `supported` if there is a stream behind the handle, else 0. */
 CODER_API int coderStreamIsSupported(void* stream, uint8_t* supported) CODER_NOEXCEPT;
 
 /** Writes 1 to `done` if the device will deliver or take no more, else 0. */
@@ -345,9 +348,9 @@ CODER_API int coderStreamTuneFilters(void* stream, uint64_t optionCount, ...) CO
  * @param stream       input stream handle
  * @param totalCounts  receives the sum of the counts reported; 0.0 at once, so also on failure
  * @param bufferCounts receives one count for each reported buffer, oldest first; an array of at
- *                     least `*numBuffers` elements
- * @param numBuffers   in: how many elements `bufferCounts` has (negative or NaN is 0); out: how
- *                     many were written
+ *                     least `*numBuffers` elements. With room for none it may be NULL.
+ * @param numBuffers   in: how many elements `bufferCounts` has (below 0 or NaN is 0, fractions are
+ *                     cut); out: how many were written
  * @param maxCounts    list no more counts than this; below 0 is 0, INFINITY lists all. A read of
  *                     that many counts delivers just these buffers.
  * @return 1, or 0 with the last error

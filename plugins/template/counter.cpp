@@ -76,7 +76,7 @@ constexpr PropertyInfo propertyTable[] = {
 };
 
 constexpr FieldInfo fieldTable[] = {
-    {dataField, "uint32", "", "running numbers"},
+    {"data", "uint32", "", "running numbers"},
     {},
 };
 
@@ -90,5 +90,5 @@ constexpr CommandInfo commandTable[] = {
 BRENIXCORE_EXPORT_DEVICE(Counter)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
-BRENIXCORE_DESCRIBE_FIELDS(fieldTable, noFields)
+BRENIXCORE_DESCRIBE_FIELDS(fieldTable, brenixcore::plugin::noFields)
 BRENIXCORE_DESCRIBE_COMMANDS(commandTable)

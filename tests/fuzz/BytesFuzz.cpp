@@ -65,6 +65,9 @@ struct Bench : Base, DeviceStreams, DeviceHost {
     }
 
     void refuseOutput() override {}
+    void endInput() override {}
+    void tellLost(std::uint64_t /*counts*/, const char* /*reason*/) override {}
+    std::uint64_t takenCounts() const override { return 0; }
 
     bool isClosing() const override
     {

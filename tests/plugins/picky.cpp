@@ -1,11 +1,13 @@
 // A converter and a filter, by build, that refuse packets with the number 13 and spoil those with the
-// numbers after it. The filter also multiplies, by a factor that can be tuned; a factor of 0 leaves no
-// counts.
+// numbers after it. The converter makes of a first number 20 how many packets of output it has seen. The
+// filter also multiplies, by a factor that can be tuned, where 0 leaves no counts, and repeats the numbers.
 
+#include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
 #include <algorithm>
+#include <memory>
 #include <stdexcept>
 
 namespace
@@ -47,13 +49,26 @@ class PickyConverter : public Converter
 {
 public:
     void convertInput(Packet& packet) override { spoil(packet, *dataOf(packet).data); }
-    void convertOutput(Packet& packet) override { spoil(packet, *dataOf(packet).data); }
+    void convertOutput(Packet& packet) override
+    {
+        double& first = *dataOf(packet).data;
+        ++seen;
+        first = first == 20 ? seen : first;
+        spoil(packet, first);
+    }
+
+private:
+    double seen = 0;
 };
 
 class PickyFilter : public Filter
 {
 public:
-    void tune(Options& options) override { factor = options.number("Factor").value_or(factor); }
+    void tune(Options& options) override
+    {
+        factor = options.number("Factor").value_or(factor);
+        times = static_cast<std::uint64_t>(options.wholeNumber("Times", 1, 9).value_or(1));
+    }
 
     void apply(Packet& packet) override
     {
@@ -61,11 +76,20 @@ public:
         const double first = *data.data;
         std::for_each(data.data, data.data + data.count, [&](double& value) { value *= factor; });
         packet.counts *= factor != 0;
+        if (times > 1) {
+            std::unique_ptr<double[]> repeated(new double[data.count * times]);
+            for (std::uint64_t i = 0; i < times; ++i) {
+                std::copy_n(data.data, data.count, repeated.get() + i * data.count);
+            }
+            packet.counts *= times;
+            setField(packet, makeArray(dataField, std::move(repeated), packet.counts));
+        }
         spoil(packet, first);
     }
 
 private:
     double factor = 1;
+    std::uint64_t times = 1;
 };
 
 } // namespace

@@ -23,7 +23,7 @@ struct DescribedValue {
 
 /// A row of a plug-in's commands.
 struct DescribedCommand {
-    std::string name;
+    std::string name;                    ///< with which it is executed
     std::vector<DescribedValue> options; ///< that it takes
     std::string meaning;                 ///< in a few words
 };

@@ -72,11 +72,26 @@ public:
         return static_cast<long>(*value);
     }
 
-    /// Refuses options that were not asked for. The core's own is always allowed.
+    /// True or false: "logical", or the number 1 or 0.
+    std::optional<bool> logical(const std::string& name)
+    {
+        const auto* const scalar =
+            dynamic_cast<brenixplugin::kit::device::TScalarProperty<bool>*>(find(name));
+        if (scalar != nullptr) {
+            return scalar->value;
+        }
+        const std::optional<double> value = number(name);
+        if (value && *value != 0 && *value != 1) {
+            fail(name, "must be true or false");
+        }
+        return value ? std::optional(*value == 1) : std::nullopt;
+    }
+
+    /// Refuses options that were not asked for.
     void requireAllKnown() const
     {
         for (const auto& option : options) {
-            if (asked.find(option.first) == asked.end() && option.first != "Timeout") {
+            if (asked.find(option.first) == asked.end()) {
                 fail(option.first, "is not known");
             }
         }

@@ -18,6 +18,11 @@ namespace brenixcore::plugin
 class Fields
 {
 public:
+    /// A map without fields.
+    Fields() : map(new brenixplugin::PropertyMap) {}
+    /// Takes the map over with its objects.
+    explicit Fields(brenixplugin::OwnedDataBuffer fields) noexcept : map(std::move(fields)) {}
+
     /// The map, which must be there.
     brenixplugin::PropertyMap& operator*() const
     {
@@ -39,7 +44,7 @@ public:
     void setChecked(bool sound) const { checked = sound; }
 
 private:
-    brenixplugin::OwnedDataBuffer map{new brenixplugin::PropertyMap};
+    brenixplugin::OwnedDataBuffer map;
     mutable bool checked = false;
 };
 
@@ -49,6 +54,8 @@ private:
 struct Packet {
     Fields fields;            ///< never null
     std::uint64_t counts = 0; ///< of each field
+    std::int64_t time = 0;    ///< of its first count, in nanoseconds since 1970 (UTC); 0: not known
+    std::uint64_t lost = 0;   ///< counts that the device lost before it
 };
 
 /// Adds a field, or replaces the one of its name.

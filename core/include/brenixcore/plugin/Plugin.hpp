@@ -6,8 +6,8 @@
 ///     BRENIXCORE_EXPORT_DEVICE(Silence)
 ///
 /// It is built with hidden visibility, C++17 or later, and links neither brenixcore nor
-/// brenixcoder. Any operation may throw a std::exception; its text reaches the caller, or, from a
-/// thread of the core, becomes an "error" event.
+/// brenixcoder. Any operation may throw a std::exception; its text reaches the caller, as the message of the
+/// error or as the channel's property Reason, or, from a thread of the core, becomes an "error" event.
 #ifndef BRENIXCORE_PLUGIN_PLUGIN_HPP
 #define BRENIXCORE_PLUGIN_PLUGIN_HPP
 
@@ -27,14 +27,14 @@ namespace brenixcore::plugin
 {
 
 /// The version of everything in this file. A plug-in made for another version is not loaded.
-constexpr std::uint32_t abiVersion = 1;
+constexpr std::uint32_t abiVersion = 2;
 
 /// How a device reports to its channel, from any thread, from its init() to its term().
 class BRENIXCORE_PLUGIN_SHARED DeviceHost
 {
 public:
-    /// Raises an event. `name` is "error", "warning" or "trace". An event without an identifier has
-    /// brenix:Device:failed. On the thread that is inside an operation of the channel, an error throws,
+    /// Raises an event. `name` is "error", "warning" or "trace"; the last two are seen only where the
+    /// environment's BRENIX_TRACE says. An event without an identifier has brenix:Device:failed. On the thread that is inside an operation of the channel, an error throws,
     /// and the exception must pass through the device.
     virtual void raise(const char* name, const char* identifier, const char* message) = 0;
 
@@ -50,9 +50,10 @@ protected:
 class BRENIXCORE_PLUGIN_SHARED DeviceStreams
 {
 public:
-    /// Puts a packet of at least one count into the input stream, waiting while there is no room.
-    /// Its fields must be property objects of the classes of Visit.hpp. Returns false when the channel
-    /// is closing and the packet was dropped: there is no room, or no output left that it could answer.
+    /// Puts a packet of at least one count into the input stream, waiting while there is no room, unless the
+    /// option Overflow says that counts are then lost. Its fields must be property objects of the classes of
+    /// Visit.hpp. Returns false when the channel is closing and the packet was dropped: there is no room, or
+    /// no output left that it could answer.
     virtual bool push(Packet packet) = 0;
 
     /// Takes the next packet from the output stream, waiting for one. Returns nothing when the
@@ -67,12 +68,27 @@ public:
     /// As pull(), but returns nothing when there is nothing at once.
     virtual std::optional<Packet> tryPull() = 0;
 
-    /// Whether the channel is closing: run() must return once tryPull() returns nothing.
+    /// Whether the channel is closing: run() must return once tryPull() returns nothing and no answer to
+    /// the output is to be expected.
     virtual bool isClosing() const = 0;
 
     /// Says that the device takes no more output than what is queued, while it may go on with its
-    /// input: further writes are refused, and one that waits ends.
+    /// input: further writes are refused, and one that waits ends. What run() then leaves in the output
+    /// stream is discarded at close, and told.
     virtual void refuseOutput() = 0;
+
+    /// Says that the device pushes nothing more, while it may go on with its output: its reader is told
+    /// that the device is done, and one that waits ends.
+    virtual void endInput() = 0;
+
+    /// Says that the device lost counts behind those that it pushed last, and why, in a few words: where no
+    /// packet follows that could tell by its `lost`, or to give the reason.
+    virtual void tellLost(std::uint64_t counts, const char* reason) = 0;
+
+    /// How far the caller has come with the input stream: all counts before this number, from open and lost
+    /// ones included, were read, flushed or lost. wake() tells when it changes. For a device that keeps
+    /// its place elsewhere.
+    virtual std::uint64_t takenCounts() const = 0;
 
 protected:
     ~DeviceStreams() = default;
@@ -81,6 +97,7 @@ protected:
 /// What a device has in one direction.
 struct StreamInfo {
     std::uint64_t countDimension = 1; ///< the dimension of the data along which it counts
+    double rate = 0;                  ///< counts a second of an input stream; 0: not known
 };
 
 /// The streams that a device has.

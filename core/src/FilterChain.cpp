@@ -1,0 +1,45 @@
+#include "FilterChain.hpp"
+
+#include "Packets.hpp"
+
+#include <utility>
+
+namespace brenixcore
+{
+
+void FilterChain::add(const std::string& name, const brenixplugin::PropertyMap& options)
+{
+    auto loaded = loadPlugin<plugin::Filter, CouldNotLoadFilter, CouldNotCreateFilter>(name);
+    libraries.push_back(std::move(loaded.library));
+    plugin::Options given(options);
+    loaded.object->tune(given);
+    given.requireAllKnown();
+    const std::lock_guard lock(mutex);
+    filters.push_back(std::move(loaded.object));
+}
+
+void FilterChain::tune(const brenixplugin::PropertyMap& options)
+{
+    plugin::Options given(options);
+    const std::lock_guard lock(mutex);
+    for (const auto& filter : filters) {
+        filter->tune(given);
+    }
+    given.requireAllKnown(); // to one of them
+}
+
+void FilterChain::apply(plugin::Packet& packet)
+{
+    if (filters.empty()) {
+        return;
+    }
+    const std::lock_guard lock(mutex);
+    for (const auto& filter : filters) {
+        if (packet.counts > 0) {
+            filter->apply(packet);
+            requireWhole(packet);
+        }
+    }
+}
+
+} // namespace brenixcore

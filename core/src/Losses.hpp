@@ -1,0 +1,99 @@
+#ifndef BRENIXCORE_SRC_LOSSES_HPP
+#define BRENIXCORE_SRC_LOSSES_HPP
+
+#include <cstdint>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace brenixcore
+{
+
+/// Counts that were lost in one place of a stream.
+struct Gap {
+    std::uint64_t counts = 0;
+    std::string reason;
+    std::uint64_t sum = 0; ///< lost since open, with these
+
+    void add(std::uint64_t more, const char* why)
+    {
+        if (counts == 0) {
+            reason = why;
+        }
+        counts += more;
+    }
+};
+
+/// What an input stream has lost since open, and what of it is still to be told. A gap is told when it can
+/// no longer grow.
+class Losses
+{
+public:
+    std::uint64_t getSum() const { return sum; }
+    bool hasNews() const { return news; }
+
+    void clear() { *this = Losses(); }
+
+    /// Behind all that waits, where the next packet ends the gap.
+    void addAtEnd(std::uint64_t counts, const char* reason) { add(atEnd, counts, reason); }
+    void endAtEnd() { end(atEnd); }
+
+    /// Before all that waits, where the next read ends the gap.
+    void addAtFront(std::uint64_t counts, const char* reason)
+    {
+        if (frontIsRead) {
+            endAtFront();
+        }
+        add(atFront, counts, reason);
+    }
+    void endAtFront()
+    {
+        end(atFront);
+        frontIsRead = false;
+    }
+
+    /// The caller goes beyond the gap at the front; the device's thread tells it.
+    void passFront() { frontIsRead = atFront.counts > 0; }
+    bool isFrontPassed() const { return frontIsRead; }
+
+    /// Told otherwise.
+    void addTold(std::uint64_t counts)
+    {
+        sum += counts;
+        news = true;
+    }
+
+    /// The gaps that ended; then there is nothing new.
+    std::vector<Gap> takeNews()
+    {
+        news = false;
+        return std::exchange(ended, {});
+    }
+
+private:
+    void add(Gap& gap, std::uint64_t counts, const char* reason)
+    {
+        gap.add(counts, reason);
+        addTold(counts);
+    }
+
+    void end(Gap& gap)
+    {
+        if (gap.counts > 0) {
+            gap.sum = sum;
+            ended.push_back(std::exchange(gap, {}));
+            news = true;
+        }
+    }
+
+    std::uint64_t sum = 0;
+    Gap atEnd;
+    Gap atFront;
+    bool frontIsRead = false;
+    std::vector<Gap> ended;
+    bool news = false;
+};
+
+} // namespace brenixcore
+
+#endif

@@ -1,0 +1,118 @@
+// What the devices share that move bytes: the types of their elements, the byte order, and the options and
+// fields of both.
+#ifndef BRENIX_PLUGINS_ELEMENTS_HPP
+#define BRENIX_PLUGINS_ELEMENTS_HPP
+
+#include "brenixcore/plugin/Describe.hpp"
+#include "brenixcore/plugin/Make.hpp"
+#include "brenixcore/plugin/Options.hpp"
+#include "brenixcore/plugin/Plugin.hpp"
+
+#include <asio/buffer.hpp>
+
+#include <algorithm>
+#include <array>
+#include <bit>
+#include <cstdint>
+#include <cstring>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+
+namespace bytes
+{
+
+using namespace brenixcore::plugin;
+using brenixplugin::OwnedProperty;
+using brenixplugin::PropertyMap;
+using brenixplugin::interfaces::IPropertyInfo;
+using brenixplugin::kit::coderconverter::TPointerProperty;
+using brenixplugin::kit::device::TScalarProperty;
+
+struct ElementType {
+    std::string_view name;
+    std::size_t size; ///< in bytes
+    OwnedProperty (*make)(const unsigned char* data, std::size_t count);
+    /// The elements of an array of this type; nothing for any other property.
+    std::optional<asio::mutable_buffer> (*find)(IPropertyInfo* property);
+};
+
+template <typename T>
+constexpr ElementType elementType(std::string_view name)
+{
+    return {name, sizeof(T),
+            [](const unsigned char* data, std::size_t count) {
+                std::unique_ptr<T[]> elements(new T[count]);
+                std::memcpy(elements.get(), data, count * sizeof(T));
+                return makeArray(dataField, std::move(elements), count);
+            },
+            [](IPropertyInfo* property) {
+                auto* const array = dynamic_cast<TPointerProperty<T>*>(property);
+                return array == nullptr ? std::nullopt
+                                        : std::optional(asio::mutable_buffer(
+                                              array->data, array->count * sizeof(T)));
+            }};
+}
+
+constexpr std::array elementTypes = {
+    elementType<double>("double"),       elementType<float>("float"),
+    elementType<signed char>("int8"),    elementType<short>("int16"),
+    elementType<int>("int32"),           elementType<long>("int64"),
+    elementType<unsigned char>("uint8"), elementType<unsigned short>("uint16"),
+    elementType<unsigned int>("uint32"), elementType<unsigned long>("uint64"),
+};
+
+/// The options that readFormat() reads.
+constexpr OptionInfo elementTypeOption = {"ElementType", "text", "", "uint8",
+                                          "double, float, int8 to int64 or uint8 to uint64"};
+constexpr OptionInfo byteOrderOption = {"ByteOrder", "text", "", "little",
+                                        "little or big: of the elements on their way"};
+constexpr OptionInfo blockSizeOption = {"BlockSize", "whole number", "elements", "16384",
+                                        "of the largest packet that arrives"};
+
+/// What a property holds that is not what it should be.
+inline std::string describe(IPropertyInfo* property)
+{
+    for (const ElementType& type : elementTypes) {
+        if (type.find(property)) {
+            return std::string(type.name);
+        }
+    }
+    if (dynamic_cast<TPointerProperty<bool>*>(property) != nullptr) {
+        return "logical";
+    }
+    if (dynamic_cast<TScalarProperty<std::u16string>*>(property) != nullptr) {
+        return "char";
+    }
+    return property == nullptr ? "missing" : "not an array of numbers";
+}
+
+inline void reverseEach(unsigned char* data, std::size_t length, std::size_t size)
+{
+    for (unsigned char* element = data; element < data + length; element += size) {
+        std::reverse(element, element + size);
+    }
+}
+
+/// One of the texts that an option may have; its index.
+template <std::size_t N>
+std::size_t readChoice(Options& options, const std::string& name,
+                       const std::array<std::string_view, N>& choices)
+{
+    const std::string given = options.text(name).value_or(std::string(choices[0]));
+    const auto* const found = std::find(choices.begin(), choices.end(), given);
+    if (found == choices.end()) {
+        std::string list(choices[0]);
+        for (std::size_t i = 1; i < N; ++i) {
+            list += (i + 1 < N ? ", " : " or ") + std::string(choices[i]);
+        }
+        Options::fail(name, "must be " + list + ", not " + given);
+    }
+    return static_cast<std::size_t>(found - choices.begin());
+}
+
+} // namespace bytes
+
+#endif
