@@ -1,5 +1,4 @@
-// What the devices share that move bytes: the types of their elements, the byte order, and the options and
-// fields of both.
+// What the devices share that move bytes: elements of numeric types and their bytes, both ways.
 #ifndef BRENIX_PLUGINS_ELEMENTS_HPP
 #define BRENIX_PLUGINS_ELEMENTS_HPP
 
@@ -20,6 +19,7 @@
 #include <string>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 namespace bytes
 {
@@ -64,13 +64,14 @@ constexpr std::array elementTypes = {
     elementType<unsigned int>("uint32"), elementType<unsigned long>("uint64"),
 };
 
-/// The options that readFormat() reads.
 constexpr OptionInfo elementTypeOption = {"ElementType", "text", "", "uint8",
                                           "double, float, int8 to int64 or uint8 to uint64"};
 constexpr OptionInfo byteOrderOption = {"ByteOrder", "text", "", "little",
                                         "little or big: of the elements on their way"};
-constexpr OptionInfo blockSizeOption = {"BlockSize", "whole number", "elements", "16384",
-                                        "of the largest packet that arrives"};
+
+/// What arrives and what is written.
+constexpr FieldInfo elementFields[] = {{dataField, "(ElementType)", "", "a count is an element"},
+                                       {}};
 
 /// What a property holds that is not what it should be.
 inline std::string describe(IPropertyInfo* property)
@@ -112,6 +113,74 @@ std::size_t readChoice(Options& options, const std::string& name,
     }
     return static_cast<std::size_t>(found - choices.begin());
 }
+
+/// What the bytes are on their way.
+struct Format {
+    const ElementType* type = nullptr;
+    bool reverses = false; ///< the bytes of each element
+
+    /// Turns the elements into bytes, in place. Nothing for a property that is no array of the type.
+    std::optional<asio::const_buffer> toBytes(IPropertyInfo* property) const
+    {
+        const auto found = type->find(property);
+        if (found && reverses) {
+            reverseEach(static_cast<unsigned char*>(found->data()), found->size(), type->size);
+        }
+        return found;
+    }
+};
+
+/// Reads its two options.
+inline Format readFormat(Options& options)
+{
+    const std::string name = options.text("ElementType").value_or("uint8");
+    const auto* const found =
+        std::find_if(elementTypes.begin(), elementTypes.end(),
+                     [&](const ElementType& candidate) { return candidate.name == name; });
+    if (found == elementTypes.end()) {
+        Options::fail("ElementType", "is not a numeric type: " + name);
+    }
+    const bool isBig = readChoice<2>(options, "ByteOrder", {"little", "big"}) == 1;
+    return {found, isBig != (std::endian::native == std::endian::big)};
+}
+
+/// Makes packets of whole elements from bytes that arrive in pieces.
+class Assembler
+{
+public:
+    Assembler(Format elementFormat, std::size_t most) : format(elementFormat), buffer(most) {}
+
+    /// Where the next bytes go.
+    asio::mutable_buffer space() { return asio::buffer(buffer) + held; }
+
+    /// The elements that are whole with so many more bytes, if any; the rest waits for its other bytes.
+    std::optional<Packet> take(std::size_t length)
+    {
+        const std::size_t size = format.type->size;
+        const std::size_t all = held + length;
+        held = all % size;
+        const std::size_t whole = all - held;
+        std::optional<Packet> packet;
+        if (whole > 0) {
+            if (format.reverses) {
+                reverseEach(buffer.data(), whole, size);
+            }
+            packet.emplace();
+            packet->counts = whole / size;
+            setField(*packet, format.type->make(buffer.data(), packet->counts));
+            std::copy_n(buffer.data() + whole, held, buffer.data());
+        }
+        return packet;
+    }
+
+    /// Gives up the rest. Returns its bytes.
+    std::size_t dropRest() { return std::exchange(held, 0); }
+
+private:
+    const Format format;
+    std::vector<unsigned char> buffer;
+    std::size_t held = 0; ///< bytes at its beginning, of an element without its end
+};
 
 } // namespace bytes
 

@@ -3,7 +3,15 @@
 
 #include "ByteDevice.hpp"
 
+#include <linux/serial.h>
+#include <sys/ioctl.h>
 #include <termios.h>
+
+#include <array>
+#include <cstdint>
+#include <optional>
+#include <stdexcept>
+#include <string>
 
 namespace
 {
@@ -11,12 +19,21 @@ namespace
 using namespace bytes;
 using Base = asio::serial_port_base;
 
+/// What goes wrong on a line, in the order in which it is counted.
+struct LineError {
+    const char* property;
+    const char* name;
+};
+constexpr std::array lineErrors = {
+    LineError{"Overruns", " overruns"}, LineError{"FramingErrors", " framing errors"},
+    LineError{"ParityErrors", " parity errors"}, LineError{"Breaks", " breaks"}};
+
 class Serial : public ByteDevice<asio::serial_port>
 {
 public:
     Serial() : ByteDevice(Framing::None) {}
 
-    DeviceInfo init(const PropertyMap& optionMap, PropertyMap& /*properties*/,
+    DeviceInfo init(const PropertyMap& optionMap, PropertyMap& properties,
                     DeviceHost& deviceHost) override
     {
         Options options(optionMap);
@@ -34,9 +51,14 @@ public:
                                          Base::flow_control::hardware};
         flowControl =
             controls.at(readChoice<3>(options, "FlowControl", {"none", "software", "hardware"}));
-        readFormat(options);
+        readOptions(options);
         options.requireAllKnown();
         host = &deviceHost;
+        source = peer;
+        counts = {};
+        for (const LineError& error : lineErrors) {
+            publish(properties, error.property, std::uint64_t{0});
+        }
         return {StreamInfo{}, StreamInfo{}};
     }
 
@@ -52,6 +74,12 @@ public:
         set("Parity", Base::parity(parity));
         set("StopBits", Base::stop_bits(stopBits));
         set("FlowControl", Base::flow_control(flowControl));
+        const auto first = systemCounts();
+        losesUnseen = first.has_value();
+        counted = first.value_or(SystemCounts{});
+        for (std::size_t i = 0; i < lineErrors.size(); ++i) {
+            setCount(i, 0);
+        }
     }
 
     void close() override
@@ -73,6 +101,43 @@ private:
         }
     }
 
+    using SystemCounts = std::array<std::uint32_t, lineErrors.size()>;
+
+    /// As the system counts, modulo 2^32. Nothing where it does not, as for pseudo-terminals.
+    std::optional<SystemCounts> systemCounts()
+    {
+        serial_icounter_struct line{};
+        if (::ioctl(port.native_handle(), TIOCGICOUNT, &line) != 0) {
+            return std::nullopt;
+        }
+        const auto number = [](int count) { return static_cast<std::uint32_t>(count); };
+        return SystemCounts{number(line.overrun) + number(line.buf_overrun), number(line.frame),
+                            number(line.parity), number(line.brk)};
+    }
+
+    void setCount(std::size_t which, std::uint64_t count)
+    {
+        if (counts.at(which) != count) {
+            counts.at(which) = count;
+            host->updateProperty(makeScalar(lineErrors.at(which).property, count));
+        }
+    }
+
+    std::string lostBefore() override
+    {
+        std::string all;
+        const SystemCounts now = systemCounts().value_or(counted);
+        for (std::size_t i = 0; i < lineErrors.size(); ++i) {
+            setCount(i, counts.at(i) + (now.at(i) - counted.at(i)));
+            if (counts.at(i) > 0) {
+                all.append(all.empty() ? "" : ", ").append(std::to_string(counts.at(i)));
+                all.append(lineErrors.at(i).name);
+            }
+        }
+        counted = now;
+        return all.empty() ? all : "Line " + peer + " had " + all + ".";
+    }
+
     /// Or else closing would wait for it.
     void abandonOutput() override { ::tcflush(port.native_handle(), TCOFLUSH); }
 
@@ -80,6 +145,8 @@ private:
     Base::parity::type parity = Base::parity::none;
     Base::stop_bits::type stopBits = Base::stop_bits::one;
     Base::flow_control::type flowControl = Base::flow_control::none;
+    SystemCounts counted{};                                ///< so far
+    std::array<std::uint64_t, lineErrors.size()> counts{}; ///< since open
 };
 
 constexpr OptionInfo optionTable[] = {
@@ -95,7 +162,17 @@ constexpr OptionInfo optionTable[] = {
     {},
 };
 
+constexpr PropertyInfo propertyTable[] = {
+    {"Overruns", "uint64", "", "since open: times that bytes were lost for want of room"},
+    {"FramingErrors", "uint64", "", "since open: bytes that had no stop bit"},
+    {"ParityErrors", "uint64", "", "since open: bytes of the other parity"},
+    {"Breaks", "uint64", "", "since open"},
+    {},
+};
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Serial)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
+BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
+BRENIXCORE_DESCRIBE_FIELDS(elementFields, elementFields)

@@ -32,10 +32,11 @@ public:
         }
         timeout = std::chrono::duration_cast<std::chrono::steady_clock::duration>(
             std::chrono::duration<double>(seconds));
-        readFormat(options);
+        endsWithInput = readChoice<2>(options, "HalfClose", {"keep", "end"}) == 1;
+        readOptions(options);
         options.requireAllKnown();
         host = &deviceHost;
-        peer = hostName + ":" + portNumber;
+        source = peer = hostName + ":" + portNumber;
         return {StreamInfo{}, StreamInfo{}};
     }
 
@@ -103,6 +104,9 @@ constexpr OptionInfo optionTable[] = {
     elementTypeOption,
     byteOrderOption,
     blockSizeOption,
+    {"HalfClose", "text", "", "keep",
+     "when the other side ends its output: keep sends on until it refuses, end sends what is "
+     "queued and is done"},
     {"ConnectTimeout", "number", "seconds", "10",
      "for the connection, up to 86400; the system's look-up of the name is apart"},
     {},
@@ -112,3 +116,4 @@ constexpr OptionInfo optionTable[] = {
 
 BRENIXCORE_EXPORT_DEVICE(Tcp)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
+BRENIXCORE_DESCRIBE_FIELDS(elementFields, elementFields)

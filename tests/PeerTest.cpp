@@ -6,20 +6,29 @@
 #include <asio.hpp>
 
 #include <fcntl.h>
+#include <linux/serial.h>
+#include <sys/ioctl.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <termios.h>
 #include <unistd.h>
 
+#include <array>
+#include <atomic>
 #include <cmath>
+#include <cstdarg>
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
+#include <sstream>
 #include <tuple>
 
 using namespace driver;
 
 namespace
 {
+
+std::atomic<int> framingErrors = -1; ///< that lines have had; less than 0 where nobody counts
 
 constexpr std::size_t npos = std::string::npos;
 asio::io_context context;
@@ -102,6 +111,22 @@ Numbers soxSamples(const std::string& soundFile)
 
 } // namespace
 
+/// The system's, also for plug-ins, but that it counts for pseudo-terminals, too.
+extern "C" __attribute__((visibility("default"))) int ioctl(int handle, unsigned long request,
+                                                            ...) noexcept
+{
+    va_list rest;
+    va_start(rest, request);
+    void* const argument = va_arg(rest, void*);
+    va_end(rest);
+    if (request != TIOCGICOUNT || framingErrors < 0) {
+        return static_cast<int>(syscall(SYS_ioctl, handle, request, argument));
+    }
+    *static_cast<serial_icounter_struct*>(argument) = {};
+    static_cast<serial_icounter_struct*>(argument)->frame = framingErrors;
+    return 0;
+}
+
 TEST(TcpTest, SixtyFourMiBComeBackAndThenThePeerIsKilled)
 {
     auto echo = std::make_unique<Program>(server + "EXEC:cat");
@@ -142,8 +167,7 @@ TEST(TcpTest, APeerThatClosesEndsTheDevice)
     Channel::waitUntil([&] { return channel.open(0.5) == 1; });
     channel.waitForEnd();
     EXPECT_EQ(channel.read(1, 1), Numbers{-1});
-    EXPECT_EQ(channel.asyncError(),
-              lost + "The last 3 bytes of the data from " + peer + " are no whole double.");
+    EXPECT_EQ(channel.asyncError(), lost + "3 bytes from " + peer + " are no whole double.");
     Channel::waitUntil([] { return readFile() == "\xC0\0\0\0\0\0\0\0"s; }); // only one side ended
 }
 
@@ -155,8 +179,9 @@ TEST(TcpTest, ClosingSendsWhatIsLeft)
     ASSERT_EQ(init(channel, "uint8"), 1);
     Channel::waitUntil([&] { return channel.open(0.5) == 1; });
     ASSERT_EQ(channel.write({1}), 1);
-    EXPECT_EQ(channel.asyncError(),
-              "brenix:Device:wrongType|Data to send must be uint8, but is double.");
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:wrongType|Data to send must be uint8, but is "
+                                    "double. 1 elements of another type were not sent to " +
+                                        peer + ".");
     const std::string data(8 << 20, 'x');
     ASSERT_EQ(writeBytes(channel, data), 1);
     EXPECT_EQ(channel.close(), 1);
@@ -179,13 +204,13 @@ TEST(TcpTest, NothingIsLostUnseenWhenThePeerEnds)
     Acceptor acceptor(context, any);
     for (int round = 0; round < 40; ++round) {
         Channel channel("tcp");
-        ASSERT_EQ(init(channel, "uint8", acceptor.local_endpoint().port()), 1);
-        ASSERT_EQ(channel.open(), 1);
+        channel.start(
+            {{"Host", host}, {"Port", acceptor.local_endpoint().port()}, {"HalfClose", "end"}});
         auto socket = acceptor.accept();
         socket.shutdown(socket.shutdown_send);
         std::size_t accepted = 0;
         while (writeBytes(channel, "x") == 1) { // until the device is done
-            ++accepted;
+            ASSERT_LT(++accepted, 100000);
         }
         EXPECT_EQ(channel.close(), 1);
         std::string got;
@@ -195,34 +220,95 @@ TEST(TcpTest, NothingIsLostUnseenWhenThePeerEnds)
     }
 }
 
-TEST(TcpTest, AResetEndsEveryWait)
+TEST(TcpTest, OutputGoesOnWhenThePeerHasEndedItsOwn)
 {
     Acceptor acceptor(context, any);
+    for (const bool refuses : {false, true}) {
+        Channel channel("tcp");
+        channel.start({{"Host", host}, {"Port", acceptor.local_endpoint().port()}});
+        auto socket = acceptor.accept();
+        socket.shutdown(socket.shutdown_send);
+        channel.waitForEnd();
+        uint8_t done = 0;
+        const std::string data(refuses ? 2 : 8 << 20, 'x');
+        std::string got(data.size() - refuses, '\0');
+        ASSERT_EQ(writeBytes(channel, data), 1);
+        asio::read(socket, asio::buffer(got));
+        if (refuses) {
+            socket.close();
+            Channel::waitUntil(
+                [&] { return coderStreamIsDeviceDone(channel.output, &done) == 1 && done == 1; });
+            EXPECT_EQ(channel.asyncError().find("brenix:Device:failed|Transfer with " + host), 0);
+        }
+        EXPECT_EQ(got, data.substr(refuses));
+        EXPECT_EQ(channel.close(), 1);
+        EXPECT_EQ(channel.error(coderChannelGetLastAsyncError), "|");
+    }
+}
+
+TEST(TcpTest, AResetEndsEveryWaitAndTellsWhatIsLost)
+{
+    Acceptor acceptor(context, any);
+    const int number = acceptor.local_endpoint().port();
+    const std::string name = host + ":" + std::to_string(number);
     for (const bool closes : {false, true}) {
         Channel channel("tcp", 10);
-        ASSERT_EQ(init(channel, "uint8", acceptor.local_endpoint().port()), 1);
+        ASSERT_EQ(init(channel, "uint8", number), 1);
         ASSERT_EQ(channel.open(infinity), 1);
         auto socket = acceptor.accept();
         asio::write(socket, asio::buffer(std::string(200, 'x'))); // fills the input
-        if (closes) {
-            EXPECT_EQ(writeBytes(channel, "x"), 1);
-        }
+        Channel::waitUntil(
+            [&] { return channel.ask(coderStreamGetDataAvailable, channel.input) == 10; });
+        const std::string block(closes ? 1 : 1 << 20, 'x');
+        std::size_t written = writeBytes(channel, block) == 1 ? block.size() : 0;
+        std::size_t taken = 0;
         std::thread reset([&] {
             std::this_thread::sleep_for(std::chrono::milliseconds(300));
+            taken = socket.available();
             socket.set_option(asio::socket_base::linger(true, 0));
             socket.close();
         });
+        double unpulled = 0;
         if (closes) {
             EXPECT_EQ(channel.close(), 1);
         } else {
-            while (writeBytes(channel, std::string(1 << 20, 'x')) == 1) {
+            for (; writeBytes(channel, block) == 1; written += block.size()) {
             }
             EXPECT_EQ(channel.error(), "brenix:OutputStream:synchronousOutputNotPossible|");
+            unpulled = channel.ask(coderStreamGetDataAvailable, channel.output);
             std::ignore = coderStreamFlush(channel.input); // the device waits for room no longer
         }
         reset.join();
-        EXPECT_NE(channel.asyncError().find(": Connection reset by peer"), npos);
+        std::ostringstream error;
+        error << "brenix:Device:failed|Transfer with " << name
+              << " failed: Connection reset by peer.";
+        if (const double unsent = double(written - taken) - unpulled; unsent > 0) {
+            error << ' ' << std::size_t(unsent) << " bytes were not sent to " << name << '.';
+        }
+        EXPECT_EQ(channel.asyncError(), error.str());
     }
+}
+
+TEST(TcpTest, ClosingTellsWhatFindsNoRoom)
+{
+    Acceptor acceptor(context, any);
+    const int number = acceptor.local_endpoint().port();
+    const std::string name = host + ":" + std::to_string(number);
+    Channel channel("tcp", 10);
+    ASSERT_EQ(channel.init({{"Host", host}, {"Port", number}, {"BlockSize", 10}}), 1);
+    ASSERT_EQ(channel.open(), 1);
+    auto socket = acceptor.accept();
+    std::string bytes(250, '\0');
+    std::iota(bytes.begin(), bytes.end(), '\0');
+    asio::write(socket, asio::buffer(bytes));
+    socket.shutdown(socket.shutdown_send);
+    ASSERT_EQ(writeBytes(channel, "x"), 1);
+    ASSERT_EQ(channel.close(), 1); // waits for the end of the input
+    double next = 0;
+    while (readOn(channel, next)) {
+    }
+    EXPECT_EQ(channel.asyncError(), lost + std::to_string(250 - int(next)) + " elements from " +
+                                        name + " found no room while the channel closed.");
 }
 
 TEST(TcpTest, TheExampleStreams)
@@ -265,8 +351,116 @@ TEST(UdpTest, DatagramsArePackets)
     }
     ASSERT_EQ(sender.open(), 1);
     EXPECT_EQ(receiver.read(3, 2), (Numbers{0, 0, 0}));
-    EXPECT_EQ(receiver.asyncError(), lost + "The last 3 bytes of a datagram are no whole double.");
+    EXPECT_EQ(receiver.asyncError(), lost + "6 bytes from datagrams to " + host + ":" +
+                                         std::to_string(local) + " are no whole double.");
     EXPECT_NE(sender.asyncError().find(lost + "70000 bytes were not sent to " + host + ":"), npos);
+}
+
+TEST(UdpTest, ReadAndLostAreAllThatWereSent)
+{
+    Channel receiver("udp", 10);
+    ASSERT_EQ(receiver.init({{"LocalHost", host}, {"ReceiveBuffer", 4096}}), 1);
+    EXPECT_EQ(receiver.property<uint32_t>("ReceiveBuffer", "uint32"), 4096);
+    const auto local = receiver.property<uint16_t>("LocalPort", "uint16");
+    const auto countLost = [&] { return receiver.property<uint64_t>("LostDatagrams", "uint64"); };
+    asio::ip::udp::socket socket(context, {asio::ip::make_address(host), 0});
+    double sent = 0;
+    double read = 0;
+    const auto send = [&](int count) {
+        for (sent += count; count > 0; --count) {
+            socket.send_to(asio::buffer("x", 1), {asio::ip::make_address(host), local});
+        }
+    };
+    const auto readAll = [&] {
+        for (Numbers counts = receiver.peek(); !counts.empty(); counts = receiver.peek()) {
+            const double total = std::accumulate(counts.begin(), counts.end(), 0.0);
+            ASSERT_EQ(coderInputStreamReadBuffers(receiver.input, total, double(counts.size())), 1);
+            read += total;
+        }
+    };
+    uint64_t lostEarlier = 0;
+    const auto expectError = [&] {
+        const std::string error = receiver.asyncError(); // before the property is asked for
+        EXPECT_EQ(error, lost + std::to_string(countLost() - lostEarlier) + " datagrams to " +
+                             host + ":" + std::to_string(local) + " found no room.");
+    };
+
+    send(1000); // most find no room before the channel is open
+    ASSERT_EQ(receiver.open(), 1);
+    expectError();
+    Channel::waitUntil([&] {
+        readAll();
+        return read + double(countLost()) == sent;
+    });
+    EXPECT_GT(read, 0);
+
+    EXPECT_EQ(receiver.close(), 1);
+    ASSERT_EQ(receiver.open(), 1);
+    lostEarlier = countLost();
+    Channel::waitUntil([&] { // and now while it is
+        send(1);
+        return receiver.ask(coderStreamGetSpaceAvailable, receiver.input) == 0;
+    });
+    send(1000);
+    EXPECT_EQ(receiver.close(), 1);
+    expectError();
+    readAll();
+    EXPECT_EQ(receiver.term(), 1);
+    EXPECT_EQ(read + double(countLost()), sent);
+}
+
+TEST(UdpTest, OutputLeavesFromWhereItsPeerCanAnswer)
+{
+    const bool hasIpv6 = std::ifstream("/proc/net/if_inet6").peek() != EOF;
+    const std::string group = "239" + host.substr(host.find('.'));
+    const Option none{"ElementType", "double"};
+    const Option loopback{"Interface", "lo"};
+    const struct {
+        const char* name;
+        Option local, more, host;
+    } rows[] = {
+        {"nothing said", none, none, {"Host", "localhost"}},
+        {"broadcast", {"LocalHost", "0.0.0.0"}, none, {"Host", "127.255.255.255"}},
+        {"IPv6", {"LocalHost", "::1"}, none, {"Host", "::1"}},
+        {"multicast", {"Group", group}, loopback, {"Host", group}},
+    };
+    for (const auto& [name, local, more, peerHost] : rows) {
+        if (name == "IPv6"s && !hasIpv6) {
+            continue;
+        }
+        SCOPED_TRACE(name);
+        Channel receiver("udp");
+        receiver.start({none, local, more});
+        const int number = receiver.property<uint16_t>("LocalPort", "uint16");
+        Channel sender("udp");
+        sender.start({none, more, peerHost, {"Port", number}});
+        EXPECT_EQ(sender.write({7}), 1);
+        EXPECT_EQ(receiver.read(1, 1), Numbers{7});
+    }
+
+    // One that sees where output comes from, and one that receives on one interface only.
+    using asio::ip::udp, asio::ip::make_address_v4;
+    udp::socket outward(context, udp::v4());
+    asio::error_code isAlone; // nothing is sent
+    outward.connect({make_address_v4("192.0.2.1"), 9}, isAlone);
+    const std::string own = isAlone ? "127.0.0.1" : outward.local_endpoint().address().to_string();
+    udp::socket socket(context, udp::endpoint(udp::v4(), 0));
+    socket.non_blocking(true);
+    socket.set_option(
+        asio::ip::multicast::join_group(make_address_v4(group), make_address_v4("127.0.0.1")));
+    for (const bool multicasts : {false, true}) {
+        Channel sender("udp");
+        sender.start({none,
+                      multicasts ? loopback : none,
+                      {"Host", multicasts ? group : own},
+                      {"Port", socket.local_endpoint().port()}});
+        EXPECT_EQ(sender.write({7}), 1);
+        Channel::waitUntil([&] { return socket.available() > 0; });
+        std::array<char, 8> bytes{};
+        udp::endpoint from;
+        socket.receive_from(asio::buffer(bytes), from);
+        EXPECT_TRUE(multicasts || from.address().to_string() == own) << from.address();
+    }
 }
 
 TEST(UdpTest, APeerAnswers)
@@ -314,6 +508,22 @@ TEST(SerialTest, TwoPortsTalk)
         EXPECT_EQ(end->peek(), Numbers{});
     }
     std::remove(other.c_str());
+}
+
+TEST(SerialTest, ErrorsOfTheLineAreCounted)
+{
+    const Program line("socat PTY,link=" + file + " PTY");
+    framingErrors = 7; // before
+    Channel channel("serial");
+    ASSERT_EQ(channel.init({{"Port", file}}), 1);
+    Channel::waitUntil([&] { return channel.open() == 1; });
+    for (const unsigned int errors : {1U, 2U}) {
+        ++framingErrors;
+        EXPECT_EQ(channel.asyncError(),
+                  lost + "Line " + file + " had " + std::to_string(errors) + " framing errors.");
+        EXPECT_EQ(channel.property<uint64_t>("FramingErrors", "uint64"), errors);
+    }
+    framingErrors = -1;
 }
 
 TEST(AudioFileTest, WhatIsWrittenIsWhatSoxReads)

@@ -54,7 +54,7 @@ done <<END
 1|wrongFileType: ./text.so|check ./text.so
 1|missingDependency: it needs a library that does not load: libgone.so: cannot open|check ./needs.so
 1|notAPlugin|check ./other.so
-1|abiVersion: it has plug-in ABI version 999, needed is 2|check $plugins/otherAbiVersion.so
+1|abiVersion: it has plug-in ABI version 999, needed is |check $plugins/otherAbiVersion.so
 1|noFactory|check $plugins/noFactory.so
 1|factoryFailed: thrown by the factory|check $plugins/throwingFactory.so
 1|factoryFailed: the factory returned nothing|check $plugins/nullFactory.so
@@ -78,6 +78,8 @@ done <<END
 1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
 1|range.csv: line 1: not a number of type double: 1e400|write loopback -i range.csv
 1|fraction.csv: line 1: not a number of type int16: 1.5|write loopback -i fraction.csv -t int16
+1|fraction.csv: line 1: not a number of type uint8: 1.5|write udp -o Host=127.0.0.1 -o Port=9 -i fraction.csv
+1|fraction.csv: line 1: not a number of type int64: 1.5|write udp -o Host=127.0.0.1 -o Port=9 -o ElementType=int64 -i fraction.csv
 1|header.csv: line 2: 1 values instead of 2|write loopback -i header.csv
 1|folder: cannot be read|write loopback -i folder
 1|folder: cannot be read|write loopback -i folder --format raw
@@ -119,13 +121,16 @@ done <<END
 2|--rate: 0 is not a number above 0|read signal -n 1 -r 0
 1|a sound file needs a whole number as sample rate|read signal -n 1 -r 44100.5 -w rate.wav
 1|does not load|plugins nosuch
+0|command set: from the next block on|plugins signal
 1|brenix: nosuch: notFound|plugins --names signal nosuch
-1|field Stamp has no fixed number of elements|read $plugins/probe.so -o Packets:int32=10,10,5 --field Stamp
+0|  Stamp  double in s: one for each packet|plugins $plugins/pickyConverter.so
+0|  Stamp  double in s: one for each packet|info $plugins/probe.so -c $plugins/pickyConverter.so
+1|the data has no field Foo; it has data, Stamp|read $plugins/probe.so -c $plugins/pickyConverter.so -o Packets:int32=3,4 --field Foo
 1|field Odd has no fixed number of elements|scope $plugins/probe.so -o Packets:int32=10,10,5 --field Odd
-1|the data has no field Foo|read signal -n 1 --field Foo
+1|the data has no field Foo; it has data|read signal -n 1 --field Foo
 0|RMS 0.7071|scope signal -o Pace=fast -n 4800 --png picture.png
 END
-if [[ $(tr '\n' ' ' <kept.csv) != 'data 0 1 2 3 4 ' ]] || ! cmp kept.csv refused.csv; then
+if [[ $(tr '\n' ' ' <kept.csv) != 'data 0 1 2 3 4 ' ]] || ! cut -d, -f1 refused.csv | cmp - kept.csv; then
     fail "what came before an error of a device or a converter is lost"
 fi
 [[ $(cat none.csv names.csv) == $'data\nleft,right' ]] || fail "names of nothing: $(cat none.csv names.csv)"
@@ -204,6 +209,8 @@ done
 # Completion offers what fits.
 # shellcheck source=/dev/null
 source "$source/tools/brenix.bash"
+# shellcheck disable=SC2317 # the completion calls it
+compopt() { :; }
 while IFS='|' read -r words offered; do
     eval "COMP_WORDS=(brenix $words)"
     COMP_CWORD=$((${#COMP_WORDS[@]} - 1))
@@ -213,6 +220,9 @@ done <<'END'
 read s|serial signal
 read signal -c ''|columns identity
 read signal -f ''|decimate scale
+read signal -o F|Frequency= Frames=
+read loopback -o ''|
+read loopback --field ''|data
 write loopback -t u|uint8 uint16 uint32 uint64
 check co|columns
 read signal --format w|wav w64
@@ -265,6 +275,9 @@ emitted() { # FILE-OF-RESULT ARGUMENTS...
 }
 signal=(signal -o Pace=fast -o Channels=2)
 emitted - info "${signal[@]}" --open -p Channels:uint32
+emitted - info "$plugins/probe.so" -c "$plugins/pickyConverter.so"
+emitted - read "$plugins/probe.so" -c "$plugins/pickyConverter.so" -o Packets:int32=1,3 -q
+[[ $(tail -n 2 second | tr '\n' ' ') == '2,4 3,4 ' ]] || fail "a stamp of each packet: $(cat second)"
 emitted - info signal -o Channels=1 -o Channels=2 -p Channels:uint32
 name=$'./*\\\n/*??/\n/*.raw' # it would end a comment
 mkdir -p "${name%/*}"
@@ -383,7 +396,7 @@ while read -r converter last message; do
     brenix read "$plugins/probe.so" -c "$converter" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
     sed -i "s/{2, 3, 4}/{2, 3, $last}/" program.c
     compile
-    if ./program broken.csv 2>errors || ! cmp broken.csv kept.csv || ! grep -q "$message" errors; then
+    if ./program broken.csv 2>errors || ! cut -d, -f1 broken.csv | cmp - kept.csv || ! grep -q "$message" errors; then
         fail "the program with a packet $last: $(cat errors)"
     fi
 done <<END

@@ -1,5 +1,6 @@
 #include "Channel.hpp"
 
+#include "Described.hpp"
 #include "brenixcoder/coder.h"
 #include "brenixcore/plugin/Inspect.hpp"
 
@@ -60,11 +61,21 @@ Failure explained(const std::string& id, std::string message, const ChannelSetti
     return {id, message};
 }
 
-void requireFixedNumber(const Field& field, std::size_t rows)
+/// What is there once for the whole buffer is there in each row.
+void requireFixedNumber(Field& field, std::size_t rows)
 {
+    if (!field.type->isText && field.elements.size() == field.type->size && field.perCount < 2) {
+        const Bytes one = field.elements;
+        for (std::size_t row = 1; row < rows; ++row) {
+            field.elements.insert(field.elements.end(), one.begin(), one.end());
+        }
+        field.isRepeated = field.isRepeated || rows > 1;
+        field.perCount = 1;
+    }
     if (field.type->isText || field.elements.size() != rows * field.perCount * field.type->size) {
-        throw Failure("",
-                      "field " + field.name + " has no fixed number of elements for each count");
+        throw Failure("", "field " + field.name +
+                              " has no fixed number of elements for each count" +
+                              "; choose others with --field");
     }
 }
 
@@ -104,6 +115,11 @@ void Channel::initialise(const ChannelSettings& settings, Use use)
     input = coderChannelGetInputStream(handle);
     output = coderChannelGetOutputStream(handle);
     void* const used = use == Use::Write ? output : input;
+    if (use == Use::Read) {
+        for (const auto& field : describe(settings).inputFields) {
+            inputFields.push_back(field.name);
+        }
+    }
     if (use != Use::Look && !isSupported(used)) {
         throw Failure("", settings.device + " has no " + (used == output ? "output" : "input") +
                               " stream with these options: it cannot be " +
@@ -315,6 +331,18 @@ std::optional<Field> Channel::findField(const std::string& name, double counts)
     return std::nullopt;
 }
 
+/// For an error: what there is instead of a field.
+std::string Channel::fieldsThere(double counts)
+{
+    std::string list;
+    static_cast<void>(caught([&] {
+        for (const Field& field : findFields({}, counts)) {
+            list += field.name.empty() ? "" : (list.empty() ? "; it has " : ", ") + field.name;
+        }
+    }));
+    return list;
+}
+
 std::vector<Field> Channel::findFields(const std::vector<std::string>& names, double counts)
 {
     std::vector<Field> fields;
@@ -326,15 +354,29 @@ std::vector<Field> Channel::findFields(const std::vector<std::string>& names, do
         fields.push_back(*std::move(field));
         return true;
     };
+    const auto addAll = [&](const std::string& name) {
+        const std::size_t mark = name.find('#');
+        if (mark == std::string::npos) {
+            add(name);
+            return;
+        }
+        for (int number = 1; add(std::string(name).replace(mark, 1, std::to_string(number)));
+             ++number) {
+        }
+    };
     for (const std::string& name : names) {
         if (!add(name)) {
-            throw Failure("", "the data has no field " + name);
+            throw Failure("", "the data has no field " + name + fieldsThere(counts));
         }
     }
     if (names.empty()) {
-        while (add("Data" + std::to_string(fields.size() + 1))) {
+        std::for_each(inputFields.begin(), inputFields.end(), addAll);
+        for (const char* const guess : {"Data#", "data", ""}) {
+            if (fields.empty()) {
+                addAll(guess);
+            }
         }
-        if (fields.empty() && !add("data") && !add("")) {
+        if (fields.empty()) {
             throw Failure("", "the data has no field that can be read");
         }
     }

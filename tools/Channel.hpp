@@ -59,6 +59,7 @@ struct Field {
     const ElementType* type = nullptr;
     std::size_t perCount = 0; ///< elements of each count
     Bytes elements;           ///< of the buffer that was read last
+    bool isRepeated = false;  ///< a buffer had one element, which is now in each row
 };
 
 class Channel
@@ -99,8 +100,8 @@ public:
     /// Takes the next buffer, or as much of it as `most` counts, if one is there. Returns its counts.
     double nextBuffer(double most);
 
-    /// The fields of the buffer that was taken: those of the names given, or else Data1, Data2..., or
-    /// else the first.
+    /// The fields of the buffer that was taken: those of the names given, or else those that the plug-ins
+    /// describe, or else Data1, Data2..., or data, or the first.
     std::vector<Field> findFields(const std::vector<std::string>& names, double counts);
 
     /// Copies out a field of the buffer that was taken.
@@ -115,14 +116,15 @@ private:
     bool readAll(const ElementType& type, const Copy& copy, std::size_t guess, Bytes& elements);
     Copy fieldCopier(const Field& field) const;
     Failure lastError() const;
+    std::string fieldsThere(double counts);
     std::optional<Field> findField(const std::string& name, double counts);
 
     void* handle = nullptr;
     void* input = nullptr;
     void* output = nullptr;
-    bool initialised = false;
-    std::vector<double> bufferCounts; ///< that the last peek told
-    std::size_t buffer = 0;           ///< so many of them were taken
+    std::vector<double> bufferCounts;     ///< that the last peek told
+    std::size_t buffer = 0;               ///< so many of them were taken
+    std::vector<std::string> inputFields; ///< that the plug-ins describe; "#" is any number from 1
 };
 
 } // namespace brenix

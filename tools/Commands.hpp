@@ -70,7 +70,8 @@ struct PropertyValue {
 
 // Each writes settings.emitC, the C program that does what the command did. Throws a Failure when it
 // cannot.
-void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties);
+void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties,
+              const std::string& fields);
 void emitRead(const Settings& settings, const std::vector<Field>& fields, double mostCounts,
               double mostSeconds);
 void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInput,

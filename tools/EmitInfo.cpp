@@ -2,6 +2,8 @@
 
 #include "EmitC.hpp"
 
+#include <sstream>
+
 namespace brenix
 {
 
@@ -58,7 +60,8 @@ constexpr std::string_view propertyBlock = R"(    {
 
 } // namespace
 
-void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties)
+void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties,
+              const std::string& fields)
 {
     Values values = commonValues(settings, settings.open, false);
     for (const PropertyValue& property : properties) {
@@ -84,6 +87,10 @@ void emitInfo(const Settings& settings, const std::vector<PropertyValue>& proper
     }
     if (properties.empty()) {
         values["PROPERTIES"] = "    (void)channel; /* it describes none */\n";
+    }
+    std::istringstream lines(fields);
+    for (std::string line; std::getline(lines, line);) {
+        values["PROPERTIES"] += "    puts(" + quote(line) + ");\n";
     }
     save(settings, infoProgram, values);
 }

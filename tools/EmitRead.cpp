@@ -16,7 +16,7 @@ static const char* name; /* of the file */
 @FIELDS@@DISK@@PRINT@@ITEM@
 static int writeCounts(@FILE@* file, int counts)
 {
-@WRITE@}
+@REPEAT@@WRITE@}
 @CLOCK@
 static int transfer(void* channel, @FILE@* file)
 {
@@ -68,6 +68,11 @@ constexpr std::string_view readField = R"(!check(channel, "coderInputStreamReadB
                        coderInputStreamReadBufferData(input, 1, 0, @NAME@, @TYPE@, count@TIMES@,
                                                       @ARRAY@)) ||
                 )";
+
+constexpr std::string_view repeatField = R"(    for (int row = 1; row < counts; ++row) {
+        @ARRAY@[row] = @ARRAY@[0];
+    }
+)";
 
 constexpr std::string_view clipItem = R"(
 static long clipped; /* samples */
@@ -190,6 +195,9 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
                                            {"TYPE", quote(type.name)},
                                            {"TIMES", times},
                                            {"ARRAY", array}});
+        if (fields[f].isRepeated) { // a buffer has one for all its counts
+            values["REPEAT"] += fill(repeatField, {{"ARRAY", array}});
+        }
     }
     values["FIELDS"] += "\n";
     std::string soundFormat;

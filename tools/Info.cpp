@@ -1,14 +1,15 @@
 // The command info.
 
 #include "Commands.hpp"
+#include "Described.hpp"
 #include "Screen.hpp"
 #include "brenixcoder/coder.h"
-#include "brenixcore/plugin/Inspect.hpp"
 
 #include <cstdint>
 #include <iostream>
 #include <optional>
 #include <sstream>
+#include <tuple>
 
 namespace brenix
 {
@@ -17,10 +18,11 @@ namespace
 {
 
 /// The properties that the device describes, and those that are asked for.
-std::vector<PropertyValue> findProperties(Channel& channel, const Settings& settings)
+std::vector<PropertyValue> findProperties(Channel& channel, const PluginReport& report,
+                                          const Settings& settings)
 {
     std::vector<PropertyValue> values;
-    for (const auto& row : brenixcore::plugin::inspectPlugin(settings.channel.device).properties) {
+    for (const auto& row : report.properties) {
         const ElementType& type = elementType(row.type);
         if (const auto elements = channel.property(row.name, type)) {
             values.push_back({row.name, row.unit, &type, *elements});
@@ -77,19 +79,23 @@ ExitCode showInfo(const Settings& settings)
     if (settings.open) {
         channel.open(settings.channel);
     }
-    const auto properties = findProperties(channel, settings);
+    PluginReport report = describe(settings.channel);
+    const auto properties = findProperties(channel, report, settings);
     Json streams;
     Json list = Json::array();
     std::ostringstream text;
-    for (const auto& [name, stream] :
-         {std::pair("input", channel.inputStream()), std::pair("output", channel.outputStream())}) {
+    for (const auto& [name, stream, fields] :
+         {std::tuple("input", channel.inputStream(), &report.inputFields),
+          std::tuple("output", channel.outputStream(), &report.outputFields)}) {
         text << name << ": ";
         if (const auto dimension = countDimension(channel, stream)) {
-            streams[name] = {{"countDimension", static_cast<std::int64_t>(*dimension)}};
+            streams[name] = {{"countDimension", static_cast<std::int64_t>(*dimension)},
+                             {"fields", toJson(*fields)}};
             text << "counts along dimension " << *dimension << '\n';
         } else {
             streams[name] = nullptr;
             text << "none\n";
+            fields->clear();
         }
     }
     channel.finish();
@@ -101,13 +107,16 @@ ExitCode showInfo(const Settings& settings)
         text << name << ": " << printable(printElements(*type, elements))
              << (unit.empty() ? "" : " ") << unit << '\n';
     }
+    const std::string fields = printedFields("", report);
     if (settings.json) {
-        printJson(std::cout, {{"streams", streams}, {"properties", list}}, 2);
+        printJson(
+            std::cout,
+            {{"streams", streams}, {"properties", list}, {"commands", toJson(report.commands)}}, 2);
     } else {
-        std::cout << text.str();
+        std::cout << text.str() << fields;
     }
     if (!settings.emitC.empty()) {
-        emitInfo(settings, properties);
+        emitInfo(settings, properties, fields);
     }
     return Success;
 }

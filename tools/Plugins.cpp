@@ -1,7 +1,7 @@
 // The commands plugins and check.
 
 #include "Commands.hpp"
-#include "brenixcore/plugin/Inspect.hpp"
+#include "Described.hpp"
 
 #include <algorithm>
 #include <cctype>
@@ -13,9 +13,6 @@ namespace brenix
 
 namespace
 {
-
-using brenixcore::plugin::DescribedValue;
-using brenixcore::plugin::PluginReport;
 
 std::vector<std::string> installedPlugins()
 {
@@ -38,20 +35,6 @@ std::string kindOf(const PluginReport& report)
     return kind;
 }
 
-Json toJson(const std::vector<DescribedValue>& values, bool defaults)
-{
-    Json list = Json::array();
-    for (const DescribedValue& value : values) {
-        Json entry = {{"name", value.name}, {"type", value.type}, {"unit", value.unit}};
-        if (defaults) {
-            entry["default"] = value.defaultValue;
-        }
-        entry["meaning"] = value.meaning;
-        list.push_back(entry);
-    }
-    return list;
-}
-
 Json toJson(const std::string& name, const PluginReport& report)
 {
     Json entry = {{"name", name},
@@ -63,24 +46,6 @@ Json toJson(const std::string& name, const PluginReport& report)
         entry["message"] = report.message;
     }
     return entry;
-}
-
-void print(const std::vector<DescribedValue>& values)
-{
-    std::size_t width = 0;
-    for (const DescribedValue& value : values) {
-        width = std::max(width, value.name.size());
-    }
-    for (const DescribedValue& value : values) {
-        std::cout << "  " << value.name << std::string(width + 2 - value.name.size(), ' ')
-                  << value.type << (value.unit.empty() ? "" : " in " + value.unit);
-        if (!value.defaultValue.empty()) {
-            std::cout << ", "
-                      << (value.defaultValue == "(required)" ? "required"
-                                                             : "default " + value.defaultValue);
-        }
-        std::cout << (value.meaning.empty() ? "" : ": " + value.meaning) << '\n';
-    }
 }
 
 } // namespace
@@ -108,7 +73,10 @@ ExitCode listPlugins(const Settings& settings)
             Json entry = toJson(name, report);
             entry["options"] =
                 report.describesOptions ? toJson(report.options, true) : Json(nullptr);
-            entry["properties"] = toJson(report.properties, false);
+            entry["properties"] = toJson(report.properties);
+            entry["inputFields"] = toJson(report.inputFields);
+            entry["outputFields"] = toJson(report.outputFields);
+            entry["commands"] = toJson(report.commands);
             list.push_back(entry);
             continue;
         }
@@ -118,11 +86,8 @@ ExitCode listPlugins(const Settings& settings)
         } else if (!report.describesOptions) {
             std::cout << "  does not describe its options\n";
         }
-        print(report.options);
-        if (!report.properties.empty()) {
-            std::cout << "  properties:\n";
-            print(report.properties);
-        }
+        std::cout << printed("", "", report.options)
+                  << printed("  ", "properties", report.properties) << printedFields("  ", report);
     }
     if (settings.json) {
         printJson(std::cout, {{"folder", brenixcore::plugin::pluginFolder()}, {"plugins", list}},

@@ -1,8 +1,8 @@
 // The commands read and write.
 
 #include "Commands.hpp"
+#include "Described.hpp"
 #include "brenixcoder/coder.h"
-#include "brenixcore/plugin/Inspect.hpp"
 
 #include <algorithm>
 #include <cmath>
@@ -43,44 +43,24 @@ void summarise(const Settings& settings, const char* verb, double counts, double
     }
 }
 
-using brenixcore::plugin::DescribedValue;
-using brenixcore::plugin::inspectPlugin;
-
-/// The type of the field "data" of a plug-in that describes it; empty when it tells none.
-std::string typeOfData(const std::vector<DescribedValue>& fields,
-                       const std::vector<DescribedValue>& options, const Settings& settings)
+/// Null for a name that is none.
+const ElementType* typeNamed(const std::string& name)
 {
-    const auto data = std::find_if(fields.begin(), fields.end(), [](const DescribedValue& field) {
-        return field.name == "data";
-    });
-    if (data == fields.end() || data->type.substr(0, 1) != "(") {
-        return data == fields.end() ? "" : data->type;
-    }
-    const std::string name =
-        data->type.substr(1, data->type.size() - 2); // of the option that says it
-    std::string type;
-    for (const DescribedValue& option : options) {
-        type = option.name == name ? option.defaultValue : type;
-    }
-    for (const Option& option : parseOptions(settings.channel.options, settings.channel.device)) {
-        type = option.name == name ? printElements(*option.type, option.elements) : type;
-    }
-    return type;
+    const auto& types = elementTypes();
+    const auto type = std::find_if(types.begin(), types.end(),
+                                   [&](const ElementType& known) { return known.name == name; });
+    return type == types.end() ? nullptr : &*type;
 }
 
-/// The element type that is asked for or that the plug-ins take; null when nobody tells.
+/// The element type that is asked for or that the plug-ins take; null when nobody tells one.
 const ElementType* typeToWrite(const Settings& settings)
 {
     if (!settings.type.empty()) {
         return &elementType(settings.type);
     }
-    for (const std::string& name : {settings.channel.converter, settings.channel.device}) {
-        const auto plugin = inspectPlugin(name);
-        const std::string type = typeOfData(plugin.outputFields, plugin.options, settings);
-        for (const ElementType& known : elementTypes()) { // the device refuses others itself
-            if (known.name == type) {
-                return &known;
-            }
+    for (const DescribedValue& field : describe(settings.channel).outputFields) {
+        if (field.name == "data") {
+            return typeNamed(field.type);
         }
     }
     return nullptr;
@@ -89,27 +69,36 @@ const ElementType* typeToWrite(const Settings& settings)
 /// The fields of a device that was done before it delivered any, as far as it tells.
 std::vector<Field> describedFields(Channel& channel, const Settings& settings)
 {
-    const auto device = inspectPlugin(settings.channel.device);
-    const auto fields = inspectPlugin(settings.channel.converter).inputFields;
-    const std::string type = typeOfData(device.inputFields, device.options, settings);
-    auto channels = static_cast<std::size_t>(channel.number("Channels", "uint32").value_or(1));
-    std::vector<std::string> names = settings.fields;
-    if (names.empty() && !fields.empty() && fields[0].name == "Data#") {
+    const auto channels =
+        static_cast<std::size_t>(channel.number("Channels", "uint32").value_or(1));
+    std::vector<Field> fields;
+    const auto add = [&](const std::string& name, const ElementType* type, std::size_t perCount) {
+        Field& field = fields.emplace_back();
+        field.name = name;
+        field.type = type != nullptr ? type : &elementType("double");
+        field.perCount = perCount;
+    };
+    if (!settings.fields.empty()) {
+        for (const std::string& name : settings.fields) {
+            add(name, nullptr, 1);
+        }
+        return fields;
+    }
+    for (const DescribedValue& described : describe(settings.channel).inputFields) {
+        const ElementType* const type = typeNamed(described.type);
+        const std::size_t mark = described.name.find('#');
+        if (mark == std::string::npos) {
+            add(described.name, type, described.name == "data" ? channels : 1);
+            continue;
+        }
         for (std::size_t i = 1; i <= channels; ++i) {
-            names.push_back("Data" + std::to_string(i));
+            add(std::string(described.name).replace(mark, 1, std::to_string(i)), type, 1);
         }
     }
-    if (names.empty()) {
-        names.emplace_back("data");
-    } else {
-        channels = 1;
+    if (fields.empty()) {
+        add("data", nullptr, channels);
     }
-    std::vector<Field> described;
-    described.reserve(names.size());
-    for (const std::string& name : names) {
-        described.push_back({name, &elementType(type.empty() ? "double" : type), channels, {}});
-    }
-    return described;
+    return fields;
 }
 
 } // namespace

@@ -11,18 +11,22 @@ _brenix() {
         -o | --option)
             # The options of the device, which stands right behind the command.
             words=$(brenix plugins "${COMP_WORDS[2]}" 2>/dev/null |
-                awk '/^  properties:/ { exit } /^  / { print $1 "=" }')
+                awk '/^  (properties|(in|out)put fields):$|^  command / { exit } /^  / { print $1 "=" }')
             compopt -o nospace
             ;;
         -c | --converter) words=$(_brenix_plugins converter) files=1 ;;
         -f | --filter) words=$(_brenix_plugins filter) files=1 ;;
+        --field)
+            words=$(brenix plugins "${COMP_WORDS[2]}" 2>/dev/null |
+                sed -nE '/^  input fields:$/,/^  [^ ]/ s/^    ([^ #]+) .*/\1/p')
+            ;;
         -t | --type)
             words='double float int8 int16 int32 int64 uint8 uint16 uint32 uint64 logical'
             ;;
         --format) words=$(brenix read --help | sed -nE 's/.*--format[^{]*\{([^}]*)\}.*/\1/p' | tr , ' ') ;;
         -w | --to | -i | --from | --png | --emit-c | =) files=1 ;; # = as in FileName=
         -[nsrbp] | --counts | --seconds | --rate | --block | --property | --limit | --window | \
-            --field | --open-option) ;;
+            --open-option) ;;
         *)
             if [[ $word == -* ]]; then
                 words=$(brenix "$command" --help 2>/dev/null | grep -oE '^  -[^ ]+' | tr ',' ' ')

@@ -97,7 +97,7 @@ void addExtent(CLI::App& command, Settings& settings)
 void addFields(CLI::App& command, Settings& settings)
 {
     addList(command, "--field", settings.fields,
-            "Field to read (default: Data1, Data2... or data, or the first)", "NAME");
+            "Field to read (default: those that the plug-ins describe)", "NAME");
 }
 
 void addFile(CLI::App& command, Settings& settings, const char* name, const char* help)

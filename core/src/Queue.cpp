@@ -120,8 +120,12 @@ bool Queue::bring(Lock& lock, plugin::Packet&& packet, double period)
         numbered += queued.counts();
         if (overflow == Overflow::Wait) {
             losses.endAtEnd();
-            pending = std::move(queued);
-            refill();
+            if (fits(queued.counts())) {
+                enqueue(std::move(queued));
+            } else {
+                pending = std::move(queued);
+                refill();
+            }
         } else {
             if (pending) { // since an opening that waited
                 dropFor(*std::exchange(pending, std::nullopt));
@@ -159,17 +163,22 @@ void Queue::dropFor(QueuedPacket&& packet)
         const bool divides = room > 0 && (brought > limit || wanted > present);
         if (divides) {
             losses.endAtEnd();
-            packets.pushBack(packet.part(room));
-            change(room);
+            enqueue(packet.part(room));
         }
         losses.addAtEnd(brought - (divides ? room : 0), reason);
         return;
     }
     losses.endAtEnd();
     if (packet.counts() > 0) {
-        change(packet.counts());
-        packets.pushBack(std::move(packet));
+        enqueue(std::move(packet));
     }
+}
+
+void Queue::enqueue(QueuedPacket&& packet)
+{
+    packets.reserve(1 + held);
+    change(packet.counts());
+    packets.pushBack(std::move(packet));
 }
 
 void Queue::dropOldest(std::uint64_t count)
@@ -248,18 +257,17 @@ void Queue::refill()
             }
             part = limit - present;
         }
-        packets.reserve(1 + held);
+        packets.reserve(1 + held); // or a packet could be lost that is on its way
         if (part == pending->packet.counts) {
-            packets.pushBack(*std::move(pending));
+            enqueue(*std::move(pending));
             pending.reset();
         } else {
-            packets.pushBack(pending->part(part));
+            enqueue(pending->part(part));
             pending->taken += part;
             if (pending->counts() == 0) {
                 pending.reset();
             }
         }
-        change(part);
     }
 }
 

@@ -165,6 +165,8 @@ private:
     /// Moves from `pending` to `packets` what has room. When it throws, the rest stays.
     void refill();
 
+    void enqueue(QueuedPacket&& packet);
+
     /// Queues a packet as the policy has it. The part for which there is no room is lost.
     void dropFor(QueuedPacket&& packet);
 

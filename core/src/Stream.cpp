@@ -270,15 +270,17 @@ unsigned long OwningOutputStream::takeBuffers(std::vector<void*>& dataList)
         outgoing.reserve(dataList.size());
         std::uint64_t written = 0;
         for (const void* buffer : dataList) {
-            written += countsOf(*static_cast<const PropertyMap*>(buffer));
+            plugin::Packet packet{plugin::Fields(nullptr)};
+            packet.counts = countsOf(*static_cast<const PropertyMap*>(buffer));
+            written += packet.counts;
+            outgoing.emplace_back(std::move(packet));
         }
         impl->queue.awaitRoom(written); // the buffers are the caller's until here
-        for (void*& buffer : dataList) {
-            plugin::Packet packet{plugin::Fields(brenixplugin::OwnedDataBuffer(
-                static_cast<PropertyMap*>(std::exchange(buffer, nullptr))))};
-            packet.counts = countsOf(*packet.fields);
-            packet.fields.setChecked(true);
-            outgoing.emplace_back(std::move(packet));
+        for (std::size_t i = 0; i < dataList.size(); ++i) {
+            plugin::Fields& fields = outgoing[i].packet.fields;
+            fields = plugin::Fields(brenixplugin::OwnedDataBuffer(
+                static_cast<PropertyMap*>(std::exchange(dataList[i], nullptr))));
+            fields.setChecked(true);
         }
         impl->send(outgoing, begin);
         return written;

@@ -2,6 +2,7 @@
 // numbers after it. The converter makes of a first number 20 how many packets of output it has seen. The
 // filter also multiplies, by a factor that can be tuned, where 0 leaves no counts, and repeats the numbers.
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
@@ -97,5 +98,8 @@ private:
 #ifdef FILTER
 BRENIXCORE_EXPORT_FILTER(PickyFilter)
 #else
+constexpr FieldInfo fields[] = {
+    {dataField, "", "", "the numbers"}, {"Stamp", "double", "s", "one for each packet"}, {}};
 BRENIXCORE_EXPORT_CONVERTER(PickyConverter)
+BRENIXCORE_DESCRIBE_FIELDS(fields, noFields)
 #endif
