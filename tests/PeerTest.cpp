@@ -295,23 +295,20 @@ TEST(TcpTest, ClosingTellsWhatFindsNoRoom)
     const int number = acceptor.local_endpoint().port();
     const std::string name = host + ":" + std::to_string(number);
     Channel channel("tcp", 10);
-    ASSERT_EQ(channel.init({{"Host", host}, {"Port", number}, {"BlockSize", 10}}), 1);
-    ASSERT_EQ(channel.open(), 1);
+    channel.start({{"Host", host}, {"Port", number}, {"BlockSize", 10}, {"ElementType", "double"}});
     auto socket = acceptor.accept();
-    std::string bytes(250, '\0');
-    std::iota(bytes.begin(), bytes.end(), '\0');
-    asio::write(socket, asio::buffer(bytes));
+    asio::write(socket, asio::buffer(range(0, 250)));
     socket.shutdown(socket.shutdown_send);
-    ASSERT_EQ(writeBytes(channel, "x"), 1);
+    Channel::waitUntil(
+        [&] { return channel.ask(coderStreamGetSpaceAvailable, channel.input) == 0; });
+    ASSERT_EQ(channel.write({1}), 1);
     ASSERT_EQ(channel.close(), 1); // waits for the end of the input
-    int taken = 0;
-    while (channel.ask(coderStreamGetDataAvailable, channel.input) > 0) {
-        EXPECT_EQ(coderInputStreamReadBuffers(channel.input, 1, 1), 1);
-        ++taken;
+    double next = 0;
+    while (readOn(channel, next)) {
     }
-    EXPECT_GE(taken, 10);
-    EXPECT_EQ(channel.asyncError(), lost + std::to_string(250 - taken) + " elements from " + name +
-                                        " found no room while the channel closed.");
+    EXPECT_GE(next, 10);
+    EXPECT_EQ(channel.asyncError(), lost + std::to_string(250 - int(next)) + " elements from " +
+                                        name + " found no room while the channel closed.");
 }
 
 TEST(TcpTest, TheExampleStreams)
