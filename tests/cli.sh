@@ -31,6 +31,11 @@ printf '1e400\n1\n' >range.csv
 printf 'a,b\n1\n' >header.csv
 printf '1\n\e[31m\xc2\x9b\xc3\xa4\xff\n' >escapes.csv
 seq 50000 >many.csv
+seq -s , 3000 >wide.csv
+# Three channels of 8 bits: a frame and the byte that makes the length even, and two bytes of a frame.
+wav='RIFFxxxxWAVEfmt \x10\0\0\0\1\0\3\0\x40\x1F\0\0\xC0\x5D\0\0\3\0\x8\0data'
+printf '%b' "$wav\3\0\0\0abc\0" >padded.wav
+printf '%b' "$wav\5\0\0\0abcde\0" >incomplete.wav
 mkdir folder
 
 # exit code | text in the output | arguments
@@ -73,6 +78,8 @@ done <<END
 1|letters.csv: line 2: not a number of type double: x|write loopback -i letters.csv
 1|range.csv: line 1: not a number of type double: 1e400|write loopback -i range.csv
 1|fraction.csv: line 1: not a number of type int16: 1.5|write loopback -i fraction.csv -t int16
+1|fraction.csv: line 1: not a number of type uint8: 1.5|write udp -o Host=127.0.0.1 -o Port=9 -i fraction.csv
+1|fraction.csv: line 1: not a number of type int64: 1.5|write udp -o Host=127.0.0.1 -o Port=9 -o ElementType=int64 -i fraction.csv
 1|header.csv: line 2: 1 values instead of 2|write loopback -i header.csv
 1|folder: cannot be read|write loopback -i folder
 1|folder: cannot be read|write loopback -i folder --format raw
@@ -96,13 +103,23 @@ done <<END
 1|line 2: not a number of type double: \x1b[31m\xc2\x9bä\xff|write loopback -i escapes.csv
 1|brenix:Device:failed: failed in run; also: |write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
 1|brenix:InputStream:couldNotConvertInputData: 13 is refused|read $plugins/probe.so -c $plugins/pickyConverter.so -o Packets:int32=5,15 -w refused.csv
+0|wrote 1 counts|write audiofile -o FileName=padded.au -o Mode=write -o Channels=3 -i padded.wav
+1|incomplete.wav: the last frame has 2 of 3 bytes|write loopback -i incomplete.wav -n 5
+2|--block: 1048576 counts of 3000 columns are more than|write loopback -i wide.csv -b 1048576
+2|x.foo: the ending .foo names no format|read signal -n 1 -w x.foo
+2|x.foo: the ending .foo names no format|write loopback -i x.foo
+1|short.flac: 2 samples beyond full scale were cut off|read signal -n 8 -o Amplitude=1.1 -o Frequency=6000 -w short.flac
+0|"counts":8,|read audiofile -o FileName=short.flac --json -w short.TXT
+0|read 0 counts|read $plugins/probe.so -w none.csv
+0|read 0 counts|read $plugins/probe.so -w none.flac -r 8000
+0|read 0 counts|read audiofile -o FileName=none.flac --field left --field right -w names.csv
 1|Field none has no elements|read $plugins/probe.so -o Packets:int32=2,3,-4 -w kept.csv
 2|--counts: 1.5 is not a whole number of at least 1|read signal -n 1.5
 2|--limit: 0.5 is not a whole number of at least 1|read signal -n 1 --limit 0.5
 2|--limit: inf is not a whole number|read signal -n 2 --limit inf
 2|--seconds: nan is not a number above 0|read signal -s nan
 2|--rate: 0 is not a number above 0|read signal -n 1 -r 0
-1|a WAV file needs a whole number as sample rate|read signal -n 1 -r 44100.5 -w rate.wav
+1|a sound file needs a whole number as sample rate|read signal -n 1 -r 44100.5 -w rate.wav
 1|does not load|plugins nosuch
 0|command set: from the next block on|plugins signal
 1|brenix: nosuch: notFound|plugins --names signal nosuch
@@ -113,12 +130,19 @@ done <<END
 1|the data has no field Foo; it has data|read signal -n 1 --field Foo
 0|RMS 0.7071|scope signal -o Pace=fast -n 4800 --png picture.png
 END
-[[ $(tr '\n' ' ' <kept.csv) == 'data 0 1 2 3 4 ' ]] || fail "what came before a device's error is lost"
-for command in "info signal" plugins "check signal" "scope signal -n 10"; do
-    read -ra words <<<"$command"
-    if brenix "${words[@]}" 2>errors >/dev/full || ! grep -q 'standard output: cannot' errors; then
-        fail "brenix $command to a full device"
-    fi
+if [[ $(tr '\n' ' ' <kept.csv) != 'data 0 1 2 3 4 ' ]] || ! cut -d, -f1 refused.csv | cmp - kept.csv; then
+    fail "what came before an error of a device or a converter is lost"
+fi
+[[ $(cat none.csv names.csv) == $'data\nleft,right' ]] || fail "names of nothing: $(cat none.csv names.csv)"
+for command in "info signal" plugins "check signal" "scope signal -n 10" \
+    "read signal -n 10 --format "{csv,raw,wav,flac,ogg}; do
+    for output in '>/dev/full' '>&-' '-w /dev/full'; do
+        [[ $output != -w* || $command == read* ]] || continue
+        if eval "brenix $command 2>errors $output" ||
+            ! grep -qE '(standard output|/dev/full): (cannot|No space|Bad)' errors; then
+            fail "brenix $command $output: $(cat errors)"
+        fi
+    done
 done
 got=0
 PATH=$build/bin brenix scope signal -o Pace=fast -o Channels=4 -n 48000 --png none.png >out 2>&1 || got=$?
@@ -156,12 +180,27 @@ timeout -s INT 1 brenix read signal -w part.raw 2>summary <&- || got=$?
     fail "an interrupted read: $(cat summary)"
 got=$(timeout -s KILL 0.5 brenix read signal -o SampleRate=500 -o BlockSize=10 -o Frequency=100 --format raw | wc -c) || true
 [[ $got -gt 0 ]] || fail "raw samples do not come at once"
+# It ends at the first interrupt, whatever it waits for: the other side of a FIFO, its samples, a reader.
 write=(brenix write audiofile -o Mode=write -o SampleFormat=DOUBLE -q)
+for command in "read signal -w pipe --format "{csv,wav} "write loopback -i pipe --format "{csv,raw,wav}; do
+    read -ra words <<<"$command"
+    got=0
+    timeout --preserve-status -s INT -k 5 0.3 brenix "${words[@]}" 2>summary || got=$?
+    [[ $got -eq 130 && $(cat summary) =~ ^(read|wrote)\ 0\ counts.*interrupted ]] ||
+        fail "brenix $command, interrupted: exit code $got, $(cat summary)"
+done
+{
+    got=0
+    timeout --preserve-status -s INT -k 5 0.5 brenix read signal -o Pace=fast --format raw 2>summary || got=$?
+    echo "$got" >code
+} | { sleep 1 && wc -c >size; }
+[[ $(cat code size) == $'130\n'$(($(awk '{ print $2 * 8 }' summary))) ]] ||
+    fail "an interrupted read to a full pipe: exit code and size $(cat code size), $(cat summary)"
 exec 3<>pipe
 for format in csv raw; do
     got=0
     if [[ $format == csv ]]; then printf '0.5\n0.25\n0.' >&3; else head -c 19 /dev/zero >&3; fi
-    timeout --preserve-status -s INT -k 5 0.5 "${write[@]}" -o FileName=cut.wav --format $format <&3 || got=$?
+    timeout --preserve-status -s INT -k 5 0.5 "${write[@]}" -o FileName=cut.wav --format $format -i pipe || got=$?
     brenix read audiofile -o FileName=cut.wav -q >cut.csv
     [[ $got -eq 130 && $(tr '\n' ' ' <cut.csv) =~ ^'data 0.5 0.25 '$|^'data 0 0 '$ ]] ||
         fail "an interrupted write that waits for its input: exit code $got, $(cat cut.csv)"
@@ -186,6 +225,7 @@ read loopback -o ''|
 read loopback --field ''|data
 write loopback -t u|uint8 uint16 uint32 uint64
 check co|columns
+read signal --format w|wav w64
 END
 
 # Documented options and properties are those that the plug-ins describe.
@@ -239,22 +279,51 @@ emitted - info "$plugins/probe.so" -c "$plugins/pickyConverter.so"
 emitted - read "$plugins/probe.so" -c "$plugins/pickyConverter.so" -o Packets:int32=1,3 -q
 [[ $(tail -n 2 second | tr '\n' ' ') == '2,4 3,4 ' ]] || fail "a stamp of each packet: $(cat second)"
 emitted - info signal -o Channels=1 -o Channels=2 -p Channels:uint32
-emitted './*.raw' read "${signal[@]}" -n 100 -w './*.raw' -f 'scale Gain=-0 Offset=12345678901234567890'
+name=$'./*\\\n/*??/\n/*.raw' # it would end a comment
+mkdir -p "${name%/*}"
+emitted "$name" read "${signal[@]}" -n 100 -w "$name" -f 'scale Gain=-0 Offset=12345678901234567890'
 emitted samples.raw read "${signal[@]}" -o Frames=10000 -w samples.raw
 emitted - read "${signal[@]}" -q -s 0.1 -c columns -f 'scale Gain:float=0.1 Offset=100' -n 1000
 emitted a.wav read "${signal[@]}" -c columns -n 5000 -w a.wav
+emitted a.flac read "${signal[@]}" -o Amplitude=0.9 -n 5000 -w a.flac
+sed -i 's/0\.9/1.1/' program.c
+compile
+while IFS='|' read -r file message; do
+    if ./program "$file" 2>errors || ! grep -qE "^$file: $message" errors; then
+        fail "the program of $file: $(cat errors)"
+    fi
+done <<'END'
+loud.flac|[0-9]+ samples beyond full scale
+/dev/full|cannot be written
+/dev/stdout|Illegal seek
+END
+# FLAC writes these 4000 samples only when it is closed.
+noise=(brenix read signal -o Waveform=noise -o Pace=fast -n 4000 -q -w full.flac)
+"${noise[@]}" --emit-c program.c
+compile
+for command in "${noise[*]}" "./program full.flac"; do
+    if (trap '' XFSZ && ulimit -f 4 && $command) 2>errors || ! grep -q 'full.flac: ' errors; then
+        fail "$command on a full disk: $(cat errors)"
+    fi
+done
+emitted b.flac write audiofile -o FileName=b.flac -o Mode=write -o Channels=2 -i a.flac
+grep -q 'static double elements' program.c || fail "the type that audiofile takes is not written"
 emitted b.au write audiofile -o FileName=b.au -o Mode=write -o Channels=2 -o SampleFormat=DOUBLE -i a.wav
 emitted c.wav write audiofile -o FileName=c.wav -o Mode=write -o Channels=2 -i samples.csv -f 'scale Gain=0.1'
 emitted d.wav write audiofile -o FileName=d.wav -o Mode=write -o Channels=2 --format raw -i samples.raw -n 3000
 
-# Both write what comes before bad input.
-{ seq 1500 && echo x; } >torn.csv
+# Both write what comes before bad input, and take a number in quotes for one.
+{ echo ' "1" ' && seq 2 1500 && echo x; } >torn.csv
 head -c 12003 /dev/zero >torn.raw
-for format in csv raw; do
-    "${write[@]}" -o FileName=good.wav --format $format -i /dev/null --emit-c program.c
+brenix read signal -o Pace=fast -n 1501 -q -w whole.wav
+head -c -3 whole.wav >torn.wav
+for format in csv raw wav; do
+    input=/dev/null
+    [[ $format != wav ]] || input=whole.wav
+    "${write[@]}" -o FileName=good.wav --format $format -i $input --emit-c program.c
     compile
     for command in "${write[*]} -o FileName=good.wav -i" ./program; do
-        if $command torn.$format 2>errors || ! grep -qE 'line 1501: not|last element' errors ||
+        if $command torn.$format 2>errors || ! grep -qE 'line 1501: not|last element|ends after 1500 ' errors ||
             [[ $(brenix read audiofile -o FileName=good.wav -q | wc -l) -ne 1501 ]]; then
             fail "good.wav of $command torn.$format: $(cat errors)"
         fi
@@ -263,14 +332,16 @@ done
 
 # Floating-point WAV has the levels of integers, from the command and from its program.
 printf '0.5\n-0.25\n1.5\n' | "${write[@]}" -o FileName=loud.wav
-timeout 20 brenix read udp -o ElementType=int16 -n 6 -w levels.csv 2>told &
+timeout 20 brenix read udp -o ElementType=int16 -n 6 -w levels.flac -r 8000 2>told &
 while kill -0 $! && ! grep -qs LocalPort told; do sleep 0.02; done
 brenix write udp -o Host=127.0.0.1 -o "Port=$(sed -n 's/^udp: LocalPort //p' told)" -o ElementType=int16 -t int16 \
     -i loud.wav -q --emit-c program.c
 compile
 ./program
 wait $! || true
-[[ $(tr '\n' ' ' <levels.csv) == 'data 16384 -8192 32767 16384 -8192 32767 ' ]] || fail "levels: $(cat told levels.csv)"
+brenix read audiofile -o FileName=levels.flac -q >levels.csv
+[[ $(tr '\n' ' ' <levels.csv) == 'data 0.5 -0.25 0.999969482421875 0.5 -0.25 0.999969482421875 ' ]] ||
+    fail "levels: $(cat told levels.csv)"
 
 # They tell what is wrong in their input, and keep what came before an error of the device.
 brenix write loopback -q -t int8 -i samples.csv --emit-c program.c
@@ -282,7 +353,7 @@ for row in 300,1 1 1,2,3 1,x; do
         fail "the program of $row: $(cat errors)"
     fi
 done
-for row in '0x10,a' 'nan ,inf'; do
+for row in '0x10,a' 'nan ,inf' '"1,5",2' '"1,x'; do
     echo "$row" >first.csv
     for command in "brenix write loopback -q -t int8 -i" ./program; do
         if $command first.csv 2>errors || ! grep -q 'first.csv: line 1: not' errors; then
@@ -291,8 +362,36 @@ for row in '0x10,a' 'nan ,inf'; do
     done
 done
 printf '\xEF\xBB\xBF1,2\n' >marked.csv
-printf '\xEF\xBB\xBF\na,info\n1,2\n' >names.csv
-for file in marked.csv names.csv; do ./program $file || fail "the program of $file"; done
+printf '\xEF\xBB\xBF\n"a, 5",info\n1,2\n' >names.csv
+for file in marked.csv names.csv; do
+    for command in "brenix write loopback -q -i" ./program; do
+        $command $file || fail "$command $file"
+    done
+done
+
+# Both take the same numbers.
+while IFS='|' read -r type numbers others; do
+    echo 1 >number.csv
+    brenix write loopback -q -t "$type" -i number.csv --emit-c program.c
+    compile
+    for number in $numbers $others; do
+        wanted=$([[ " $others " == *" $number "* ]]; echo $((1 - $?)))
+        echo "1
+$number" >number.csv
+        for command in "brenix write loopback -q -t $type -i" ./program; do
+            got=0
+            $command number.csv 2>errors || got=$?
+            [[ $got -eq $wanted ]] || fail "$number as $type: exit code $got of $command: $(cat errors)"
+        done
+    done
+done <<'END'
+double|1e-400 -1e-400 1e308 -0 +1 .5 5. inf -Infinity nan "1"|1e400 -1e400 0x10 0X1p3 +-1 1" "1
+float|1e-50 1e38|1e39 0x1
+int8|-0 +1 -128 127 007|128 -129 0x1 1.5 1e1 +-1
+uint8|-0 255|256 -1
+uint64|-0 18446744073709551615|18446744073709551616 -1
+logical|-0 +1 true false|2 -1 0x1 True
+END
 while read -r converter last message; do
     brenix read "$plugins/probe.so" -c "$converter" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c
     sed -i "s/{2, 3, 4}/{2, 3, $last}/" program.c
@@ -305,15 +404,20 @@ identity -4 brenix:Device:failed: Field none
 $plugins/pickyConverter.so 9 couldNotConvertInputData: 13 is refused
 END
 
-# Samples arrive as they were: a file of each format, through pipes.
+# Samples arrive as they were, as far as the format holds them: a file of each format, through pipes.
 brenix read "${signal[@]}" -n 3000 --format raw -q >samples.raw
-for format in csv raw wav; do
-    brenix read "${signal[@]}" -n 3000 --format "$format" -q >"one.$format"
+for format in $(brenix read signal --format none 2>&1 | grep -oP '\{\K[^}]+' | tr ',' ' '); do
+    brenix read "${signal[@]}" -n 3000 --format "$format" -q | cat >"one.$format"
     rm -f copy.wav
-    brenix write audiofile -o FileName=copy.wav -o Mode=write -o SampleFormat=DOUBLE \
-        -o Channels=2 -q --format "$format" <"one.$format"
-    brenix read audiofile -o FileName=copy.wav --format raw -q | cmp - samples.raw ||
-         fail "$format through pipes"
+    # shellcheck disable=SC2002 # a pipe is what is tested
+    cat "one.$format" | brenix write audiofile -o FileName=copy.wav -o Mode=write \
+        -o SampleFormat=DOUBLE -o Channels=2 -q --format "$format"
+    brenix read audiofile -o FileName=copy.wav --format raw -q >copy.raw
+    if [[ ' avr flac mp3 oga ogg opus pvf sf voc ' == *" $format "* ]]; then
+        [[ $(stat -c %s copy.raw) -eq 48000 ]]
+    else
+        cmp copy.raw samples.raw
+    fi || fail "$format through pipes"
 done
 
 exit $((failures > 0))

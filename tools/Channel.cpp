@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cstddef>
 #include <cstring>
 #include <string_view>
 #include <tuple>
@@ -241,13 +242,19 @@ bool Channel::isDone(void* stream)
 
 double Channel::nextBuffer(double most)
 {
-    double total = 0;
-    double counts = 0;
-    double buffers = 1;
-    check(coderInputStreamPeek(input, &total, &counts, &buffers, most));
-    if (buffers == 0) {
-        return 0;
+    if (buffer == bufferCounts.size()) {
+        double total = 0;
+        double buffers = 4096;
+        bufferCounts.resize(4096);
+        buffer = 0;
+        const int peeked = coderInputStreamPeek(input, &total, bufferCounts.data(), &buffers, most);
+        bufferCounts.resize(peeked == 0 ? 0 : static_cast<std::size_t>(buffers));
+        check(peeked);
+        if (bufferCounts.empty()) {
+            return 0;
+        }
     }
+    const double counts = bufferCounts[buffer++];
     check(coderInputStreamReadBuffers(input, counts, 1));
     return counts;
 }
@@ -258,6 +265,13 @@ bool Channel::readAll(const ElementType& type, const Copy& copy, std::size_t gue
 {
     std::size_t enough = guess;
     elements.resize(enough * type.size);
+    const auto last = elements.end() - static_cast<std::ptrdiff_t>(type.size);
+    constexpr unsigned char mark = 0xA5;
+    std::fill(last, elements.end(), mark);
+    if (copy(guess, elements.data()) != 0 &&
+        std::any_of(last, elements.end(), [](unsigned char byte) { return byte != mark; })) {
+        return true; // mostly: not too small, and the last element was written
+    }
     while (copy(enough, elements.data()) == 0) {
         if (std::string_view(lastError().what()).rfind("Property value: ", 0) != 0) {
             return false; // it is not that the capacity is too small
@@ -266,7 +280,7 @@ bool Channel::readAll(const ElementType& type, const Copy& copy, std::size_t gue
         elements.resize(enough * type.size);
     }
     std::size_t tooSmall = enough / 2;
-    if (enough == guess) { // mostly it is right
+    if (enough == guess) {
         tooSmall = copy(guess - 1, elements.data()) == 0 ? guess - 1 : 0;
     }
     while (enough - tooSmall > 1) {

@@ -122,6 +122,8 @@ private:
     void* handle = nullptr;
     void* input = nullptr;
     void* output = nullptr;
+    std::vector<double> bufferCounts;     ///< that the last peek told
+    std::size_t buffer = 0;               ///< so many of them were taken
     std::vector<std::string> inputFields; ///< that the plug-ins describe; "#" is any number from 1
 };
 

@@ -36,7 +36,7 @@ struct Settings {
 
     SampleFile file;
     std::vector<std::string> fields;
-    std::string type = "double";
+    std::string type; ///< empty: as the plug-ins or the file tell
     double counts = std::numeric_limits<double>::infinity();
     double seconds = std::numeric_limits<double>::infinity();
     std::size_t block = 1024;
@@ -80,6 +80,9 @@ void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInp
 /// From here on SIGINT or SIGTERM ends what is under way in good order, the third one at once.
 void catchInterrupts();
 bool isInterrupted();
+
+/// Puts the end of a file in the place of the standard input, also for a read that waits.
+void endInput();
 
 double secondsSince(std::chrono::steady_clock::time_point start);
 

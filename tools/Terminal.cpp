@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cmath>
 #include <csignal>
 #include <cstdio>
@@ -24,10 +25,13 @@ volatile std::sig_atomic_t interrupted = 0;
 
 void catchInterrupts()
 {
-    if (::fcntl(STDIN_FILENO, F_GETFD) ==
-        -1) { // closed: else the handler takes a file that is there
-        ::open("/dev/null", O_RDONLY);
+    // A file or a socket that is opened later must not take the place of one that is closed. What is then
+    // written to the standard output fails.
+    int opened = 0;
+    while (opened >= 0 && opened <= STDERR_FILENO) {
+        opened = ::open("/dev/null", O_RDONLY);
     }
+    ::close(opened);
     struct sigaction action {
     };
     action.sa_handler = [](int /*signal*/) {
@@ -36,12 +40,20 @@ void catchInterrupts()
             leaveScreen();
             _exit(Interrupted);
         }
-        const int nothing = ::open("/dev/null", O_RDONLY); // a read that waits comes to its end
-        ::dup2(nothing, STDIN_FILENO);
-        ::close(nothing);
+        endInput();
     };
+    action.sa_flags = SA_RESTART; // a write to a pipe that is full goes on, a read finds the end
     sigaction(SIGINT, &action, nullptr);
     sigaction(SIGTERM, &action, nullptr);
+}
+
+void endInput()
+{
+    const int error = errno;
+    const int nothing = ::open("/dev/null", O_RDONLY);
+    ::dup2(nothing, STDIN_FILENO);
+    ::close(nothing);
+    errno = error;
 }
 
 bool isInterrupted()

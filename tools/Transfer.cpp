@@ -1,6 +1,7 @@
 // The commands read and write.
 
 #include "Commands.hpp"
+#include "Described.hpp"
 #include "brenixcoder/coder.h"
 
 #include <algorithm>
@@ -16,6 +17,9 @@ namespace brenix
 
 namespace
 {
+
+/// Of a buffer, which has them in one piece.
+constexpr std::size_t mostBlockElements = 1 << 27;
 
 /// What of the two limits is there: counts if the rate tells how many, or else time.
 std::pair<double, double> extent(const Settings& settings, double rate)
@@ -37,6 +41,64 @@ void summarise(const Settings& settings, const char* verb, double counts, double
         std::fprintf(stderr, "%s %.0f counts in %.3g s%s\n", verb, counts, seconds,
                      isInterrupted() ? ", interrupted" : "");
     }
+}
+
+/// Null for a name that is none.
+const ElementType* typeNamed(const std::string& name)
+{
+    const auto& types = elementTypes();
+    const auto type = std::find_if(types.begin(), types.end(),
+                                   [&](const ElementType& known) { return known.name == name; });
+    return type == types.end() ? nullptr : &*type;
+}
+
+/// The element type that is asked for or that the plug-ins take; null when nobody tells one.
+const ElementType* typeToWrite(const Settings& settings)
+{
+    if (!settings.type.empty()) {
+        return &elementType(settings.type);
+    }
+    for (const DescribedValue& field : describe(settings.channel).outputFields) {
+        if (field.name == "data") {
+            return typeNamed(field.type);
+        }
+    }
+    return nullptr;
+}
+
+/// The fields of a device that was done before it delivered any, as far as it tells.
+std::vector<Field> describedFields(Channel& channel, const Settings& settings)
+{
+    const auto channels =
+        static_cast<std::size_t>(channel.number("Channels", "uint32").value_or(1));
+    std::vector<Field> fields;
+    const auto add = [&](const std::string& name, const ElementType* type, std::size_t perCount) {
+        Field& field = fields.emplace_back();
+        field.name = name;
+        field.type = type != nullptr ? type : &elementType("double");
+        field.perCount = perCount;
+    };
+    if (!settings.fields.empty()) {
+        for (const std::string& name : settings.fields) {
+            add(name, nullptr, 1);
+        }
+        return fields;
+    }
+    for (const DescribedValue& described : describe(settings.channel).inputFields) {
+        const ElementType* const type = typeNamed(described.type);
+        const std::size_t mark = described.name.find('#');
+        if (mark == std::string::npos) {
+            add(described.name, type, described.name == "data" ? channels : 1);
+            continue;
+        }
+        for (std::size_t i = 1; i <= channels; ++i) {
+            add(std::string(described.name).replace(mark, 1, std::to_string(i)), type, 1);
+        }
+    }
+    if (fields.empty()) {
+        add("data", nullptr, channels);
+    }
+    return fields;
 }
 
 } // namespace
@@ -112,14 +174,19 @@ ExitCode readSamples(const Settings& given)
     Progress progress(std::min(most, channel.number("Frames", "int64").value_or(INFINITY)),
                       settings.quiet);
     std::unique_ptr<SampleWriter> writer;
+    double written = 0;
     const auto failure = caught([&] {
         while (!reading.isOver()) {
             if (const std::size_t counts = reading.next(); counts > 0) {
                 if (!writer) {
                     writer = openWriter(settings.file, reading.getFields());
                 }
+                if (!writer) {
+                    break; // an interruption, before somebody read the FIFO
+                }
                 writer->write(reading.getFields(), counts);
-                progress.update(reading.getCounts());
+                written = reading.getCounts();
+                progress.update(written);
             }
             if (channel.hasDeviceError()) { // finish() throws it
                 reading.endWithAvailable();
@@ -128,19 +195,21 @@ ExitCode readSamples(const Settings& given)
     });
     progress.finish();
     const double seconds = reading.getSeconds();
+    std::vector<Field> fields = reading.getFields();
     const auto unwritten = caught([&] {
+        if (!writer && !failure && !isInterrupted() && !channel.hasDeviceError()) {
+            fields = describedFields(channel, settings);
+            writer = openWriter(settings.file, fields); // it is empty, and a file
+        }
         if (writer) {
             writer->finish(); // what came before a failure is kept
         }
     });
     channel.finish(failure ? failure : unwritten);
-    if (!writer && !isInterrupted()) {
-        throw Failure("", "the device delivered nothing");
-    }
     if (writer && !settings.emitC.empty()) {
-        emitRead(settings, reading.getFields(), most, reading.getMostSeconds());
+        emitRead(settings, fields, most, reading.getMostSeconds());
     }
-    summarise(settings, "read", reading.getCounts(), seconds);
+    summarise(settings, "read", written, seconds);
     return isInterrupted() ? Interrupted : Success;
 }
 
@@ -148,9 +217,14 @@ ExitCode writeSamples(const Settings& given)
 {
     Settings settings = given;
     settleFormat(settings.file);
-    const ElementType& type = elementType(settings.type);
-    const auto reader = openReader(settings.file, type);
+    const auto reader = openReader(settings.file, typeToWrite(settings));
+    const ElementType& type = reader->getType();
     const std::size_t columns = reader->getColumns();
+    if (settings.block * columns > mostBlockElements) {
+        throw std::invalid_argument("--block: " + std::to_string(settings.block) + " counts of " +
+                                    std::to_string(columns) + " columns are more than " +
+                                    std::to_string(mostBlockElements) + " elements");
+    }
     // What the device delivers is thrown away: it must not wait for room.
     settings.channel.inputLimit = INFINITY;
     settings.channel.outputLimit =

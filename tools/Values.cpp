@@ -3,9 +3,13 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <cmath>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
 #include <stdexcept>
+#include <system_error>
+#include <type_traits>
 
 namespace brenix
 {
@@ -19,6 +23,31 @@ T load(const unsigned char* element)
     T value{};
     std::memcpy(&value, element, sizeof value);
     return value;
+}
+
+/// Decimal, with a sign or without. What is too small for a floating-point type is the nearest that it has.
+template <typename T>
+bool parseNumber(std::string_view text, T& value)
+{
+    const bool isNegative = text.substr(0, 1) == "-";
+    if (text.substr(0, 1) == "+" || (isNegative && std::is_unsigned_v<T>)) {
+        text.remove_prefix(1);
+        if (text.substr(0, 1) == "-") {
+            return false;
+        }
+    }
+    const auto* const end = text.data() + text.size();
+    const auto result = std::from_chars(text.data(), end, value);
+    if constexpr (std::is_floating_point_v<T>) {
+        if (result.ec == std::errc::result_out_of_range && result.ptr == end) {
+            const std::string number(text);
+            value = std::is_same_v<T, float> ? std::strtof(number.c_str(), nullptr)
+                                             : static_cast<T>(std::strtod(number.c_str(), nullptr));
+            return std::isfinite(value);
+        }
+    }
+    return result.ec == std::errc() && result.ptr == end &&
+           !(isNegative && std::is_unsigned_v<T> && value != 0);
 }
 
 template <typename T>
@@ -35,14 +64,10 @@ constexpr ElementType number(const char* name, const char* cName, const char* cF
                 text.append(digits.data(), end.ptr);
             },
             [](std::string_view text, unsigned char* element) {
-                if (text.substr(0, 1) == "+") {
-                    text.remove_prefix(1);
-                }
                 T value{};
-                const auto* const end = text.data() + text.size();
-                const auto result = std::from_chars(text.data(), end, value);
+                const bool isNumber = parseNumber(text, value);
                 std::memcpy(element, &value, sizeof value);
-                return result.ec == std::errc() && result.ptr == end;
+                return isNumber;
             },
             [](const unsigned char* element) { return static_cast<double>(load<T>(element)); }};
 }
@@ -51,8 +76,11 @@ constexpr ElementType logical()
 {
     ElementType type = number<std::uint8_t>("logical", "uint8_t", "%hhu");
     type.parse = [](std::string_view text, unsigned char* element) {
-        *element = text == "1" || text == "true" ? 1 : 0;
-        return *element == 1 || text == "0" || text == "false";
+        if (text == "true" || text == "false") {
+            *element = text == "true" ? 1 : 0;
+            return true;
+        }
+        return parseNumber(text, *element) && *element <= 1;
     };
     return type;
 }
@@ -64,22 +92,32 @@ constexpr ElementType text()
     return type;
 }
 
-/// The parts of a text between commas, without the spaces around them.
-template <typename Take>
-void splitCommas(std::string_view list, Take take)
+std::string_view trimmed(std::string_view text)
 {
-    for (;;) {
-        const std::size_t comma = list.find(',');
-        std::string_view part = list.substr(0, comma);
-        const std::size_t first = part.find_first_not_of(" \t\r");
-        part = first == std::string_view::npos
-                   ? std::string_view()
-                   : part.substr(first, part.find_last_not_of(" \t\r") - first + 1);
-        take(part);
-        if (comma == std::string_view::npos) {
-            return;
+    const std::size_t first = text.find_first_not_of(" \t\r");
+    return first == std::string_view::npos
+               ? std::string_view()
+               : text.substr(first, text.find_last_not_of(" \t\r") - first + 1);
+}
+
+/// The parts of a text between commas, without the spaces around them. As a row of CSV they may stand in
+/// quotes, with commas between them.
+template <typename Take>
+void splitCommas(std::string_view list, bool isCsv, Take take)
+{
+    bool isQuoted = false;
+    std::size_t begin = 0;
+    for (std::size_t i = 0; i <= list.size(); ++i) {
+        if (i == list.size() || (list[i] == ',' && !isQuoted)) {
+            std::string_view part = trimmed(list.substr(begin, i - begin));
+            if (isCsv && part.size() > 1 && part.front() == '"' && part.back() == '"') {
+                part = trimmed(part.substr(1, part.size() - 2));
+            }
+            take(part);
+            begin = i + 1;
+        } else if (isCsv && list[i] == '"') {
+            isQuoted = !isQuoted;
         }
-        list.remove_prefix(comma + 1);
     }
 }
 
@@ -116,10 +154,11 @@ const ElementType& elementType(std::string_view name)
     throw std::invalid_argument("no such type: " + std::string(name) + "; there are " + names);
 }
 
-bool parseRow(const ElementType& type, std::string_view list, Bytes& elements, std::string& wrong)
+bool parseRow(const ElementType& type, std::string_view list, Bytes& elements, std::string& wrong,
+              bool isCsv)
 {
     bool ok = true;
-    splitCommas(list, [&](std::string_view part) {
+    splitCommas(list, isCsv, [&](std::string_view part) {
         elements.resize(elements.size() + type.size);
         if (ok && !type.parse(part, &elements[elements.size() - type.size])) {
             ok = false;
@@ -133,8 +172,10 @@ bool hasNumber(std::string_view list)
 {
     const ElementType& type = elementType("double");
     bool found = false;
-    splitCommas(list, [&](std::string_view part) {
+    splitCommas(list, true, [&](std::string_view part) {
         double value = 0;
+        part.remove_prefix(
+            std::min(part.find_first_not_of('"'), part.size())); // one without an end
         found = found || part.find_first_of("+-.0123456789") == 0 ||
                 type.parse(part, reinterpret_cast<unsigned char*>(&value));
     });

@@ -29,10 +29,12 @@ const std::vector<ElementType>& elementTypes();
 /// Throws std::invalid_argument for a name that is none.
 const ElementType& elementType(std::string_view name);
 
-/// Appends the elements of a list with commas. On false `wrong` is the first that is not of the type.
-bool parseRow(const ElementType& type, std::string_view list, Bytes& elements, std::string& wrong);
+/// Appends the elements of a list with commas; in CSV they may stand in quotes. On false `wrong` is the
+/// first that is not of the type.
+bool parseRow(const ElementType& type, std::string_view list, Bytes& elements, std::string& wrong,
+              bool isCsv = false);
 
-/// Whether an element of a list with commas is a number, of whatever type, or begins like one.
+/// Whether an element of a row of CSV is a number, of whatever type, or begins like one.
 bool hasNumber(std::string_view list);
 
 /// Elements as text: a char array as it stands up to its NUL, all others with commas.

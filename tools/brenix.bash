@@ -23,7 +23,7 @@ _brenix() {
         -t | --type)
             words='double float int8 int16 int32 int64 uint8 uint16 uint32 uint64 logical'
             ;;
-        --format) words='csv raw wav' ;;
+        --format) words=$(brenix read --help | sed -nE 's/.*--format[^{]*\{([^}]*)\}.*/\1/p' | tr , ' ') ;;
         -w | --to | -i | --from | --png | --emit-c | =) files=1 ;; # = as in FileName=
         -[nsrbp] | --counts | --seconds | --rate | --block | --property | --limit | --window | \
             --open-option) ;;

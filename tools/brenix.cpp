@@ -106,8 +106,10 @@ void addFile(CLI::App& command, Settings& settings, const char* name, const char
     command
         .add_option(
             "--format", settings.file.format,
-            "csv, raw or wav (default: as the file's ending .csv, .raw, .bin or .wav has it)")
-        ->check(CLI::IsMember({"csv", "raw", "wav"}));
+            "csv, raw, or wav, flac and so on for sound files (default: as the file's ending "
+            "has it)")
+        ->type_name("FORMAT")
+        ->check(CLI::IsMember(formatNames()));
     command.add_flag("-q,--quiet", settings.quiet, "No progress and no summary");
 }
 
@@ -158,7 +160,8 @@ ExitCode run(Settings& settings, int count, char** arguments)
     addChannel(*command, settings.channel, settings.channel.outputLimit);
     addExtent(*command, settings);
     addFile(*command, settings, "-i,--from", "File of the samples (default: standard input)");
-    command->add_option("-t,--type", settings.type, "Element type to write")->capture_default_str();
+    command->add_option("-t,--type", settings.type,
+                        "Element type to write (default: as the plug-ins or the file tell)");
     addNumber(*command, "-b,--block", settings.block, "Counts of one buffer", "COUNTS", 1 << 20)
         ->capture_default_str();
     addEmit(*command, settings);
