@@ -139,7 +139,7 @@ void Channel::Impl::tellLost(std::uint64_t counts, const char* reason)
 {
     if (input && counts > 0) {
         const bool isNamed = reason != nullptr && *reason != '\0';
-        input->impl->queue.lose(counts, isNamed ? reason : "the device lost them");
+        input->impl->queue.lose(counts, isNamed ? reason : lostByDevice);
         updateLostCounts();
     }
 }

@@ -9,6 +9,9 @@
 namespace brenixcore
 {
 
+/// The reason where a device gives none.
+constexpr const char* lostByDevice = "the device lost them";
+
 /// Counts that were lost in one place of a stream.
 struct Gap {
     std::uint64_t counts = 0;

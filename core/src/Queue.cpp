@@ -109,7 +109,7 @@ bool Queue::bring(Lock& lock, plugin::Packet&& packet, double period)
         losses.endAtFront();
     }
     if (const std::uint64_t lost = std::exchange(packet.lost, 0); lost > 0) {
-        losses.addAtEnd(lost, "the device lost them");
+        losses.addAtEnd(lost, lostByDevice);
         numbered += lost;
     }
     if (packet.counts > 0) {
