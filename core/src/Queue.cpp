@@ -251,7 +251,13 @@ std::optional<std::vector<Gap>> Queue::takeNews(bool atEnd)
         losses.endAtFront();
         losses.endAtEnd();
     }
-    return losses.hasNews() ? std::optional(losses.takeNews()) : std::nullopt;
+    return atEnd || losses.hasNews() ? std::optional(losses.takeNews()) : std::nullopt;
+}
+
+void Queue::forgetGap()
+{
+    const std::lock_guard guard(mutex);
+    losses.forgetGap();
 }
 
 std::optional<plugin::Packet> Queue::pull(bool waits)

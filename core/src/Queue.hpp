@@ -88,8 +88,12 @@ public:
     /// What is lost of the packets taken last, and told otherwise.
     void loseTaken(std::uint64_t count);
 
-    /// The gaps that ended, at the end of the device all; nothing when there is no news of losses.
+    /// The gaps that ended and are to be told, at the end of the device all; nothing when there is no news of
+    /// losses.
     std::optional<std::vector<Gap>> takeNews(bool atEnd);
+
+    /// The first of them is told.
+    void forgetGap();
 
     /// Lost since open.
     std::uint64_t getLost() const;

@@ -60,9 +60,10 @@ void Stream::Impl::tellLosses(bool atEnd)
     reporter.updateLostCounts();
     for (const Gap& gap : *gaps) {
         const std::string message = std::to_string(gap.counts) +
-                                    " counts were lost: " + gap.reason + "; " +
+                                    " counts were lost: " + gap.reason.data() + "; " +
                                     std::to_string(gap.sum) + " since open.";
         reporter.raise("error", "brenix:Stream:dataLost", message.c_str());
+        queue.forgetGap();
     }
 }
 
