@@ -2,6 +2,7 @@
 #ifndef BRENIXCODER_TESTS_HANDED_HPP
 #define BRENIXCODER_TESTS_HANDED_HPP
 
+#include "Allocations.hpp"
 #include "brenixcore/Channel.hpp"
 #include "brenixcore/Converter.hpp"
 #include "brenixcore/Exceptions.hpp"
@@ -17,6 +18,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstdint>
+#include <cstdio>
 #include <cstdlib>
 #include <functional>
 #include <memory>
@@ -136,6 +138,7 @@ class Log : public brenixcore::Channel::IEventHandler
 public:
     void onCustomEvent(brenixcore::CustomEvent& event) override
     {
+        const allocations::Allowed allowed;
         const std::lock_guard lock(mutex);
         if (std::string(event.getEventName()) == "error") {
             errors.push_back(event.getIdentifier() + std::string("|") + event.getMessage());
@@ -264,6 +267,20 @@ struct Rig {
     brenixcore::InputStream* input = nullptr;
     PropertyMap properties;
 };
+
+/// What an error says of a gap; no counts when it is another one.
+struct Loss {
+    std::uint64_t counts = 0;
+    std::uint64_t sum = 0;
+};
+inline Loss lossOf(const std::string& error)
+{
+    Loss loss;
+    const int found = std::sscanf(
+        error.c_str(), "brenix:Stream:dataLost|%lu counts were lost: %*[^;]; %lu since open.",
+        &loss.counts, &loss.sum);
+    return found == 2 ? loss : Loss();
+}
 
 /// Gives a packet its counts, numbered from `first` on.
 inline void number(Packet& packet, std::uint64_t first, std::uint64_t counts)

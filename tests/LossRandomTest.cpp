@@ -4,7 +4,6 @@
 #include "Handed.hpp"
 #include "Soak.hpp"
 
-#include <cstdio>
 #include <numeric>
 #include <thread>
 
@@ -169,6 +168,8 @@ private:
         explicit Picky(Sequence& sequence) : s(sequence) {}
         void convertInput(Packet& packet) override
         {
+            EXPECT_EQ(packet.fields->count("Seen"), 0);
+            setField(packet, makeScalar("Seen", true));
             const std::size_t way = s.pick(30);
             if (way < 3) {
                 s.toldOtherwise += packet.counts;
@@ -215,7 +216,6 @@ private:
 
     void close()
     {
-        resting = false;
         rig->channel.close();
         balance();
         EXPECT_EQ(told + toldOtherwise, rig->log.getLostCounts());
@@ -337,15 +337,10 @@ private:
 
     void learn(const std::string& error)
     {
-        unsigned long counts = 0;
-        unsigned long sum = 0;
-        char reason[32] = "";
-        if (std::sscanf(error.c_str(),
-                        "brenix:Stream:dataLost|%lu counts were lost: %31[^;]; %lu since open.",
-                        &counts, reason, &sum) == 3) {
-            told += counts;
-            EXPECT_GE(sum, told);
-            EXPECT_LE(sum, rig->log.getLostCounts());
+        if (const Loss loss = lossOf(error); loss.counts > 0) {
+            told += loss.counts;
+            EXPECT_GE(loss.sum, told);
+            EXPECT_LE(loss.sum, rig->log.getLostCounts());
         } else {
             EXPECT_TRUE(error == "brenix:Stream:filterFailed|refused" ||
                         error == "brenix:Device:failed|the end")
