@@ -2,15 +2,11 @@
 // from one call to the next: the error records, the handles, the stored buffers, the properties, and
 // which property objects are alive. What a call makes of its arguments is in the tables of the other
 // tests.
-//
-// BRENIX_SEED is the seed of the first sequence; the next has the next one, so that a sequence that
-// failed can be run first. BRENIX_SOAK_SECONDS is how long to go on.
 
 #include "Calls.hpp"
+#include "Soak.hpp"
 #include "scripted/ChannelFixture.hpp"
 
-#include <chrono>
-#include <iostream>
 #include <optional>
 #include <random>
 
@@ -481,26 +477,9 @@ private:
     uint64_t calls = 0;
 };
 
-uint64_t environment(const char* name, uint64_t otherwise)
-{
-    const char* const text = std::getenv(name);
-    return text == nullptr ? otherwise : std::stoull(text);
-}
-
 } // namespace
 
 TEST(RandomTest, EveryCallDoesWhatTheModelSays)
 {
-    using Clock = std::chrono::steady_clock;
-    const auto end = Clock::now() + std::chrono::seconds(environment("BRENIX_SOAK_SECONDS", 3));
-    const uint64_t seed = environment("BRENIX_SEED", std::random_device()());
-    std::cout << "BRENIX_SEED=" << seed << std::endl;
-    uint64_t sequences = 0;
-    uint64_t calls = 0;
-    do {
-        SCOPED_TRACE("BRENIX_SEED=" + std::to_string(seed + sequences));
-        calls += Sequence(seed + sequences).run();
-        ++sequences;
-    } while (!HasFailure() && Clock::now() < end);
-    std::cout << sequences << " sequences, " << calls << " calls" << std::endl;
+    soak(3, [](uint64_t seed) { return Sequence(seed).run(); });
 }

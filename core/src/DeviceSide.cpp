@@ -138,7 +138,8 @@ void Channel::Impl::endInput()
 void Channel::Impl::tellLost(std::uint64_t counts, const char* reason)
 {
     if (input && counts > 0) {
-        input->impl->queue.lose(counts, reason);
+        input->impl->queue.lose(counts,
+                                reason != nullptr && *reason == '\0' ? lostByDevice : reason);
         updateLostCounts();
     }
 }

@@ -1,24 +1,27 @@
 #ifndef BRENIXCORE_SRC_LOSSES_HPP
 #define BRENIXCORE_SRC_LOSSES_HPP
 
+#include <array>
 #include <cstdint>
-#include <string>
-#include <utility>
+#include <cstdio>
 #include <vector>
 
 namespace brenixcore
 {
 
-/// Counts that were lost in one place of a stream.
+/// The reason where a device gives none.
+constexpr const char* lostByDevice = "the device lost them";
+
+/// Counts that were lost in one place of a stream. Needs no memory, with which they would not be counted.
 struct Gap {
     std::uint64_t counts = 0;
-    std::string reason;
-    std::uint64_t sum = 0; ///< lost since open, with these
+    std::array<char, 256> reason{}; ///< of the first of them, cut where it is longer
+    std::uint64_t sum = 0;          ///< lost since open, with these
 
-    void add(std::uint64_t more, const char* why)
+    void add(std::uint64_t more, const char* why) noexcept
     {
         if (counts == 0) {
-            reason = why;
+            std::snprintf(reason.data(), reason.size(), "%s", why);
         }
         counts += more;
     }
@@ -30,7 +33,7 @@ class Losses
 {
 public:
     std::uint64_t getSum() const { return sum; }
-    bool hasNews() const { return news; }
+    bool hasNews() const { return news || !ended.empty(); }
 
     void clear() { *this = Losses(); }
 
@@ -63,12 +66,15 @@ public:
         news = true;
     }
 
-    /// The gaps that ended; then there is nothing new.
-    std::vector<Gap> takeNews()
+    /// The gaps that ended and are not told yet; then there is nothing new but them.
+    const std::vector<Gap>& takeNews()
     {
         news = false;
-        return std::exchange(ended, {});
+        return ended;
     }
+
+    /// The first of them is told.
+    void forgetGap() { ended.erase(ended.begin()); }
 
 private:
     void add(Gap& gap, std::uint64_t counts, const char* reason)
@@ -81,8 +87,8 @@ private:
     {
         if (gap.counts > 0) {
             gap.sum = sum;
-            ended.push_back(std::exchange(gap, {}));
-            news = true;
+            ended.push_back(gap); // or it goes on
+            gap = {};
         }
     }
 

@@ -105,32 +105,33 @@ bool Queue::awaitTurn(Lock& lock, bool waits)
 
 bool Queue::bring(Lock& lock, plugin::Packet&& packet, double period)
 {
+    // Whatever throws does so before the packet is taken, or leaves it in `pending`.
+    packets.reserve(1 + held);
     if (losses.isFrontPassed()) {
         losses.endAtFront();
     }
-    if (const std::uint64_t lost = std::exchange(packet.lost, 0); lost > 0) {
-        losses.addAtEnd(lost, "the device lost them");
-        numbered += lost;
+    if (pending && overflow != Overflow::Wait) { // since an opening that waited
+        dropPending();
+    }
+    if (packet.lost > 0) {
+        losses.addAtEnd(packet.lost, lostByDevice);
+        numbered += std::exchange(packet.lost, 0);
     }
     if (packet.counts > 0) {
+        const bool hasRoom = fits(packet.counts);
+        if (hasRoom || overflow == Overflow::Wait) {
+            losses.endAtEnd();
+        }
         QueuedPacket queued(std::move(packet));
         queued.index = numbered;
         queued.opening = opening;
         queued.period = period;
         numbered += queued.counts();
-        if (overflow == Overflow::Wait) {
-            losses.endAtEnd();
-            if (fits(queued.counts())) {
-                enqueue(std::move(queued));
-            } else {
-                pending = std::move(queued);
-                refill();
-            }
+        if (hasRoom) {
+            enqueue(std::move(queued));
         } else {
-            if (pending) { // since an opening that waited
-                dropFor(*std::exchange(pending, std::nullopt));
-            }
-            dropFor(std::move(queued));
+            pending = std::move(queued);
+            overflow == Overflow::Wait ? refill() : dropPending();
         }
     }
     const bool ends = wanted > 0 && getCounts() >= wanted; // the wait of a read
@@ -142,65 +143,74 @@ bool Queue::bring(Lock& lock, plugin::Packet&& packet, double period)
     return isNews;
 }
 
-void Queue::dropFor(QueuedPacket&& packet)
+void Queue::enqueue(QueuedPacket&& packet) noexcept
 {
-    constexpr const char* reason = "the input stream was full";
-    packets.reserve(1 + held);
-    const std::uint64_t present = getCounts();
-    const std::uint64_t brought = packet.counts();
-    if (overflow == Overflow::DropOldest) {
-        const std::uint64_t beyond = brought > limit ? brought - limit : 0; // of this packet
-        if (!fits(brought)) {
-            dropOldest(std::min(present, present + (brought - beyond) - limit));
-        }
-        if (beyond > 0) {
-            losses.addAtFront(beyond, reason);
-            packet.taken += beyond;
-        }
-    } else if (!fits(brought)) {
-        // A part has room where the whole never would: beyond the limit, or for a read that waits.
-        const std::uint64_t room = limit - std::min(limit, present);
-        const bool divides = room > 0 && (brought > limit || wanted > present);
-        if (divides) {
-            losses.endAtEnd();
-            enqueue(packet.part(room));
-        }
-        losses.addAtEnd(brought - (divides ? room : 0), reason);
-        return;
-    }
-    losses.endAtEnd();
-    if (packet.counts() > 0) {
-        enqueue(std::move(packet));
-    }
-}
-
-void Queue::enqueue(QueuedPacket&& packet)
-{
-    packets.reserve(1 + held);
     change(packet.counts());
     packets.pushBack(std::move(packet));
 }
 
-void Queue::dropOldest(std::uint64_t count)
+void Queue::refill()
 {
-    losses.addAtFront(count, "the input stream was full");
-    change(-count);
-    while (count > 0) {
-        QueuedPacket& front = packets[0];
-        const std::uint64_t part = std::min(count, front.counts());
-        front.taken += part;
-        if (front.counts() == 0) {
-            packets.popFront();
+    while (pending) {
+        std::uint64_t part = pending->counts();
+        if (!fits(part)) {
+            // Room for a part is used only where waiting for more would never end: by a packet
+            // beyond the limit, or while a read waits for more counts than are there.
+            const std::uint64_t present = getCounts();
+            if (present >= limit || (present > 0 && wanted <= present)) {
+                return;
+            }
+            part = limit - present;
         }
-        count -= part;
+        packets.reserve(1 + held);
+        if (part == pending->counts()) {
+            enqueue(*std::move(pending));
+            pending.reset();
+        } else {
+            enqueue(pending->part(part));
+            pending->taken += part;
+        }
+    }
+}
+
+void Queue::dropPending()
+{
+    constexpr const char* reason = "the input stream was full";
+    const std::uint64_t brought = pending->counts();
+    if (overflow == Overflow::DropOldest && !fits(brought)) {
+        std::uint64_t more = getCounts() + brought - limit;
+        losses.addAtFront(more, reason);
+        while (more > 0 && !packets.empty()) {
+            QueuedPacket& front = packets[0];
+            const std::uint64_t part = std::min(more, front.counts());
+            front.taken += part;
+            if (front.counts() == 0) {
+                packets.popFront();
+            }
+            change(-part);
+            more -= part;
+        }
+        pending->taken += more;
+        if (pending->counts() == 0) { // where nothing has room
+            pending.reset();
+            return;
+        }
+    }
+    refill();
+    if (!pending || pending->taken > 0) {
+        losses.endAtEnd();
+    }
+    if (pending) {
+        losses.addAtEnd(pending->counts(), reason);
+        pending.reset();
     }
 }
 
 std::uint64_t Queue::takenCounts() const
 {
     const std::lock_guard guard(mutex);
-    if (inHand != none) {
-        return inHand;
+    if (const std::uint64_t first = inHand; first != none) {
+        return first;
     }
     const QueuedPacket* const next = !packets.empty() ? &packets[0] : pending ? &*pending : nullptr;
     return next == nullptr ? numbered : positionOf(*next);
@@ -241,34 +251,13 @@ std::optional<std::vector<Gap>> Queue::takeNews(bool atEnd)
         losses.endAtFront();
         losses.endAtEnd();
     }
-    return losses.hasNews() ? std::optional(losses.takeNews()) : std::nullopt;
+    return atEnd || losses.hasNews() ? std::optional(losses.takeNews()) : std::nullopt;
 }
 
-void Queue::refill()
+void Queue::forgetGap()
 {
-    while (pending) {
-        std::uint64_t part = pending->counts();
-        if (!fits(part)) {
-            // Room for a part is used only where waiting for more would never end: by a packet
-            // beyond the limit, or while a read waits for more counts than are there.
-            const std::uint64_t present = getCounts();
-            if (present >= limit || (present > 0 && wanted <= present)) {
-                return;
-            }
-            part = limit - present;
-        }
-        packets.reserve(1 + held); // or a packet could be lost that is on its way
-        if (part == pending->packet.counts) {
-            enqueue(*std::move(pending));
-            pending.reset();
-        } else {
-            enqueue(pending->part(part));
-            pending->taken += part;
-            if (pending->counts() == 0) {
-                pending.reset();
-            }
-        }
-    }
+    const std::lock_guard guard(mutex);
+    losses.forgetGap();
 }
 
 std::optional<plugin::Packet> Queue::pull(bool waits)

@@ -88,8 +88,12 @@ public:
     /// What is lost of the packets taken last, and told otherwise.
     void loseTaken(std::uint64_t count);
 
-    /// The gaps that ended, at the end of the device all; nothing when there is no news of losses.
+    /// The gaps that ended and are to be told, at the end of the device all; nothing when there is no news of
+    /// losses.
     std::optional<std::vector<Gap>> takeNews(bool atEnd);
+
+    /// The first of them is told.
+    void forgetGap();
 
     /// Lost since open.
     std::uint64_t getLost() const;
@@ -165,13 +169,12 @@ private:
     /// Moves from `pending` to `packets` what has room. When it throws, the rest stays.
     void refill();
 
-    void enqueue(QueuedPacket&& packet);
+    /// Adds a packet for which `packets` has a place.
+    void enqueue(QueuedPacket&& packet) noexcept;
 
-    /// Queues a packet as the policy has it. The part for which there is no room is lost.
-    void dropFor(QueuedPacket&& packet);
-
-    /// Loses the oldest counts.
-    void dropOldest(std::uint64_t count);
+    /// Queues what has room of `pending`, in DropOldest after the oldest counts were lost for it. The rest is
+    /// lost. When it throws, it stays.
+    void dropPending();
 
     /// Tells both sides of a change that the caller's made. Unlocks the mutex first, so that who
     /// wakes finds it free.

@@ -24,15 +24,20 @@ bool Stream::Impl::push(plugin::Packet& packet, bool waits)
     const std::uint64_t brought = packet.counts;
     if (!filters.empty()) {
         lock.unlock();
+        const std::uint64_t lost = packet.lost; // which filters may look at, but not change
         try {
             filters.apply(packet);
         } catch (...) { // without this packet
+            queue.lose(brought, nullptr);
+            if (lost > 0) {
+                queue.lose(lost, lostByDevice);
+            }
             const std::string reason = currentExceptionText();
-            queue.lose(packet.lost + brought, nullptr);
             tellLosses(false);
             reporter.raise("error", "brenix:Stream:filterFailed", reason.c_str());
             return true;
         }
+        packet.lost = lost;
         lock.lock();
     }
     double period = 0;
@@ -55,9 +60,10 @@ void Stream::Impl::tellLosses(bool atEnd)
     reporter.updateLostCounts();
     for (const Gap& gap : *gaps) {
         const std::string message = std::to_string(gap.counts) +
-                                    " counts were lost: " + gap.reason + "; " +
+                                    " counts were lost: " + gap.reason.data() + "; " +
                                     std::to_string(gap.sum) + " since open.";
         reporter.raise("error", "brenix:Stream:dataLost", message.c_str());
+        queue.forgetGap();
     }
 }
 
@@ -198,12 +204,14 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
             if (current->converted) {
                 continue;
             }
+            const std::uint64_t counts = current->counts(); // which the converter may change
             try {
                 stream.convert(current->packet, &plugin::Converter::convertInput);
                 current->converted = true;
             } catch (...) {
+                current->packet.counts = counts;
                 const std::string reason = currentExceptionText();
-                stream.queue.loseTaken(current->counts());
+                stream.queue.loseTaken(counts);
                 taken.packets.erase(current);
                 stream.reporter.updateLostCounts();
                 throw CouldNotConvertInputData(reason);

@@ -75,16 +75,20 @@ public:
     /// True or false: "logical", or the number 1 or 0.
     std::optional<bool> logical(const std::string& name)
     {
-        const auto* const scalar =
-            dynamic_cast<brenixplugin::kit::device::TScalarProperty<bool>*>(find(name));
-        if (scalar != nullptr) {
+        auto* const property = find(name);
+        if (property == nullptr) {
+            return std::nullopt;
+        }
+        if (const auto* const scalar =
+                dynamic_cast<brenixplugin::kit::device::TScalarProperty<bool>*>(property)) {
             return scalar->value;
         }
-        const std::optional<double> value = number(name);
-        if (value && *value != 0 && *value != 1) {
+        ReadScalar reader;
+        visitNumbers(property, reader);
+        if (reader.value != 0.0 && reader.value != 1.0) {
             fail(name, "must be true or false");
         }
-        return value ? std::optional(*value == 1) : std::nullopt;
+        return *reader.value == 1;
     }
 
     /// Refuses options that were not asked for.

@@ -1,0 +1,413 @@
+// What is lost where, how it is told, and how what is left is numbered and dated.
+
+#include "Handed.hpp"
+
+#include <cctype>
+#include <sstream>
+
+using namespace handed;
+
+namespace
+{
+
+const StreamInfo stream{};
+
+/// "I:C" for each buffer: the index of its first count and the number of its counts, which must say the same.
+std::string indicesOf(const std::vector<Buffer>& buffers)
+{
+    std::string text;
+    for (const Buffer& buffer : buffers) {
+        EXPECT_EQ(buffer.index, buffer.data.at(0));
+        text += std::to_string(*buffer.index) + ":" + std::to_string(buffer.data.size()) + " ";
+    }
+    return text;
+}
+
+std::string timesOf(const std::vector<Buffer>& buffers)
+{
+    std::string text;
+    for (const Buffer& buffer : buffers) {
+        text += std::to_string(buffer.time.value()) + " ";
+    }
+    return text;
+}
+
+/// Refuses packets that begin with one of its numbers.
+struct Refusing : Identity {
+    explicit Refusing(Counts firstNumbers) : firsts(std::move(firstNumbers)) {}
+    void convertInput(Packet& packet) override
+    {
+        const auto& data = dynamic_cast<TPointerProperty<std::uint64_t>&>(
+            *brenixplugin::asProperty(packet.fields->at(dataField)));
+        for (const std::uint64_t first : firsts) {
+            if (*data.data == first) {
+                packet.counts = 1000; // which makes no difference
+                throw std::runtime_error("refused");
+            }
+        }
+    }
+    Counts firsts;
+};
+
+/// Does a script: pN pushes N counts, lN says that N were lost before the next packet, tN tells a loss of N,
+/// rN reads N counts, f flushes. Returns what was read, and then what is left.
+class Script
+{
+public:
+    Script(Rig& theRig, Worker& theDevice) : rig(theRig), device(theDevice) {}
+
+    std::string run(const std::string& script)
+    {
+        std::istringstream words(script);
+        std::vector<Buffer> all;
+        const auto read = [&](std::uint64_t count) {
+            for (Buffer& buffer : rig.read(count)) {
+                all.push_back(std::move(buffer));
+            }
+        };
+        char what = 0;
+        for (std::uint64_t count = 0; words >> what >> count;) {
+            if (what == 'r') {
+                read(count);
+            } else if (what == 'f') {
+                rig.input->flush();
+            } else {
+                device.perform([&](DeviceStreams& streams) { bring(streams, what, count); });
+            }
+        }
+        rig.channel.close();
+        while (rig.available() > 0) {
+            read(rig.available());
+        }
+        return indicesOf(all);
+    }
+
+private:
+    void bring(DeviceStreams& streams, char what, std::uint64_t count)
+    {
+        if (what == 'p') {
+            Packet packet;
+            packet.lost = std::exchange(lost, 0);
+            next += packet.lost;
+            number(packet, next, count);
+            next += count;
+            EXPECT_TRUE(streams.push(std::move(packet)));
+        } else if (what == 'l') {
+            lost = count;
+        } else {
+            streams.tellLost(count, "it was told");
+            next += count;
+        }
+    }
+
+    Rig& rig;
+    Worker& device;
+    std::uint64_t next = 0, lost = 0;
+};
+
+} // namespace
+
+TEST(LossTest, EachPolicyKeepsWhatItSaysAndTellsEachGapOnce)
+{
+    const std::string full = "the input stream was full";
+    const std::string device = "the device lost them";
+    const struct {
+        const char* overflow;
+        std::uint64_t limit;
+        const char* script;
+        const char* left;
+        std::vector<std::pair<Counts, std::string>> gaps; ///< counts and sum, and reason
+    } rows[] = {
+        {"dropNewest", 7, "p3 p3 p5", "0:3 3:3 ", {{{5, 5}, full}}},
+        {"dropNewest", 7, "p3 p5 p5 r3 p2", "0:3 13:2 ", {{{10, 10}, full}}}, // one gap
+        {"dropNewest", 7, "p5 p3 r5 p1 p7", "0:5 8:1 ", {{{3, 3}, full}, {{7, 10}, full}}},
+        {"dropNewest", 7, "p9", "0:7 ", {{{2, 2}, full}}}, // beyond the limit
+        {"dropNewest", 7, "t2 p9", "2:7 ", {{{2, 2}, "it was told"}, {{2, 4}, full}}},
+        {"dropNewest", 0, "p9 p1", "", {{{10, 10}, full}}},
+        {"dropOldest", 7, "p3 p3 p5", "4:2 6:5 ", {{{4, 4}, full}}},
+        {"dropOldest", 7, "p3 p3 p3 p3 p3", "8:1 9:3 12:3 ", {{{8, 8}, full}}}, // one gap
+        {"dropOldest", 7, "p7 p1 r2 p4", "1:2 5:2 7:1 8:4 ", {{{1, 1}, full}, {{2, 3}, full}}},
+        {"dropOldest", 7, "p7 p1 f0 p8", "9:7 ", {{{1, 1}, full}, {{1, 2}, full}}},
+        {"dropOldest", 7, "p3 p20", "16:7 ", {{{16, 16}, full}}},
+        {"dropOldest", 0, "p9 p1", "", {{{10, 10}, full}}},
+        {"wait", 7, "l2 p3 p1", "2:3 5:1 ", {{{2, 2}, device}}},
+        {"wait", 7, "p3 t4 t1 l2 p1", "0:3 10:1 ", {{{7, 7}, "it was told"}}}, // one gap
+        {"wait", 7, "p3 t4 p1 l2", "0:3 7:1 ", {{{4, 4}, "it was told"}}},
+        {"wait", 7, "p3 t4", "0:3 ", {{{4, 4}, "it was told"}}},
+        {"wait", 7, "p5 l3 p5 r5 p1", "0:5 8:5 13:1 ", {{{3, 3}, device}}}, // one waits beside
+        {"wait", UINT64_MAX, "p5 f0 p5", "5:5 ", {}},
+        {"", 4, "p3 p9 r4 r4", "0:3 3:1 4:4 8:4 ", {}},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(std::string(row.overflow) + ": " + row.script);
+        auto* const worker = new Worker({stream, std::nullopt});
+        Rig rig(worker, row.limit);
+        rig.init(Rig::options("", true));
+        rig.open(row.overflow);
+        EXPECT_EQ(Script(rig, *worker).run(row.script), row.left);
+        std::vector<std::string> errors;
+        std::uint64_t sum = 0;
+        for (const auto& [counts, reason] : row.gaps) {
+            sum = counts[1];
+            errors.push_back("brenix:Stream:dataLost|" + std::to_string(counts[0]) +
+                             " counts were lost: " + reason + "; " + std::to_string(sum) +
+                             " since open.");
+        }
+        EXPECT_EQ(rig.log.takeErrors(), errors);
+        EXPECT_EQ(rig.log.getLostCounts(), sum);
+    }
+}
+
+TEST(LossTest, AGapIsToldAsSoonAsItCannotGrow)
+{
+    const std::pair<const char*, Counts> rows[] = {
+        {"dropNewest", {0, 0, 0, 1}}, // errors after each of: push, push, read, push
+        {"dropOldest", {0, 0, 0, 1}}};
+    for (const auto& [overflow, errors] : rows) {
+        SCOPED_TRACE(overflow);
+        auto* const device = new Worker({stream, std::nullopt});
+        Rig rig(device, 4);
+        rig.init(Rig::options(overflow));
+        rig.open();
+        std::uint64_t told = 0;
+        for (std::size_t i = 0; i < errors.size(); ++i) {
+            if (i == 2) {
+                rig.read(3);
+            } else {
+                device->perform([](DeviceStreams& streams) {
+                    Packet packet;
+                    number(packet, 0, 3);
+                    streams.push(std::move(packet));
+                });
+            }
+            told += rig.log.takeErrors().size();
+            EXPECT_EQ(told, errors[i]) << i;
+            EXPECT_EQ(rig.log.getLostCounts(), i == 0 ? 0 : overflow[4] == 'N' ? 3 : 2) << i;
+        }
+    }
+}
+
+TEST(LossTest, ReadersThatWaitGetTheirCountsInEveryMode)
+{
+    for (const char* const overflow : {"wait", "dropOldest", "dropNewest"}) {
+        SCOPED_TRACE(overflow);
+        auto* const device = new Worker({stream, std::nullopt});
+        Rig rig(device, 10);
+        rig.init(Rig::options(overflow));
+        rig.open();
+        std::atomic<bool> enough = false;
+        device->start([&](DeviceStreams& streams) { // packets of which the limit is no multiple
+            while (!enough) {
+                Packet packet;
+                number(packet, 0, 4);
+                streams.push(std::move(packet));
+            }
+        });
+        for (int i = 0; i < 20; ++i) {
+            EXPECT_EQ(rig.read(9).empty(), false);
+            EXPECT_EQ(rig.read(10).empty(), false);
+        }
+        enough = true;
+        rig.input->flush();
+        rig.channel.close();
+    }
+}
+
+TEST(LossTest, PartsOfPacketsHaveTheirOwnTimes)
+{
+    struct Halving : Filter {
+        void tune(Options& /*options*/) override {}
+        void apply(Packet& packet) override { number(packet, 0, packet.counts / 2); }
+    };
+    const struct {
+        double rate;
+        std::int64_t time; ///< of a packet of 8
+        bool isHalved;
+        const char* overflow;
+        Counts reads;
+        const char* times;
+    } rows[] = {{4, 1000, false, "wait", {1, 3, 4}, "1000 250001000 1000001000 "},
+                {3, 1000, false, "wait", {1, 1, 6}, "1000 333334333 666667667 "}, // rounded
+                {0, 1000, false, "wait", {1, 7}, "1000 1000 "},
+                {4, 0, false, "wait", {1, 7}, "0 0 "},
+                {4, -7, false, "wait", {2, 6}, "-7 499999993 "},
+                {4, 1000, true, "wait", {1, 3}, "1000 500001000 "},
+                {4, 1000, false, "dropOldest", {1, 4}, "750001000 1000001000 "}};
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.times);
+        auto* const device = new Worker({StreamInfo{1, row.rate}, std::nullopt});
+        Rig rig(device, row.overflow[0] == 'd' ? 5 : 8);
+        rig.init(Rig::options(row.overflow, true));
+        if (row.isHalved) {
+            rig.addFilter(new Halving);
+        }
+        rig.open();
+        device->perform([&](DeviceStreams& streams) {
+            Packet packet;
+            number(packet, 0, 8);
+            packet.time = row.time;
+            streams.push(std::move(packet));
+        });
+        std::string times;
+        for (const std::uint64_t count : row.reads) {
+            times += timesOf(rig.read(count));
+        }
+        EXPECT_EQ(times, row.times);
+        rig.channel.close();
+    }
+}
+
+TEST(LossTest, ThePositionNeverPassesWhatIsPutBack)
+{
+    // 10 packets of 2 counts, of which those with 4 and 12 cannot be converted.
+    auto* const device = new Worker({stream, std::nullopt});
+    Rig rig(device, 30, new Refusing({4, 12}));
+    rig.init();
+    rig.open("", 0);
+    std::atomic<std::uint64_t> position = 0;
+    std::atomic<std::uint64_t> asked = 0;
+    device->start([&](DeviceStreams& streams) {
+        for (std::uint64_t first = 0; first < 20; first += 2) {
+            Packet packet;
+            number(packet, first, 2);
+            streams.push(std::move(packet));
+        }
+        streams.tellLost(5, "");
+        while (!streams.isClosing()) { // and is woken for each change
+            const unsigned wakes = device->wakes;
+            position = streams.takenCounts();
+            ++asked;
+            device->await([&] { return device->wakes != wakes; });
+        }
+    });
+    const auto positionIs = [&](std::uint64_t expected) {
+        for (int i = 0; i < 5000 && position != expected; ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        }
+        EXPECT_EQ(position, expected);
+    };
+    while (asked == 0) {
+        std::this_thread::yield();
+    }
+    rig.read(1);
+    positionIs(1);
+    EXPECT_THROW(rig.read(6), brenixcore::CouldNotConvertInputData);
+    positionIs(1); // 1 to 3 were put back
+    EXPECT_EQ(rig.available(), 17);
+    rig.read(3);
+    positionIs(6);
+    EXPECT_THROW(rig.read(30), brenixcore::SynchronousInputNotPossible);
+    EXPECT_THROW(rig.read(14), brenixcore::CouldNotConvertInputData);
+    positionIs(6);
+    rig.input->flush();
+    positionIs(25);
+    EXPECT_EQ(rig.log.getLostCounts(), 9);
+    rig.channel.close();
+    EXPECT_EQ(rig.log.takeErrors(),
+              std::vector<std::string>{"brenix:Stream:dataLost|5 counts were lost: the device lost "
+                                       "them; 9 since open."});
+}
+
+TEST(LossTest, ReopeningStartsTheCountsAgainAndKeepsTheData)
+{
+    auto* const device = new Worker({stream, std::nullopt});
+    Rig rig(device, 4);
+    rig.init(Rig::options("wait", true));
+    const auto push = [&](std::uint64_t first, std::uint64_t lost, std::uint64_t taken) {
+        device->perform([&](DeviceStreams& streams) {
+            Packet packet;
+            packet.lost = lost;
+            number(packet, first, 3);
+            EXPECT_TRUE(streams.push(std::move(packet)));
+            EXPECT_EQ(streams.takenCounts(), taken);
+        });
+    };
+    rig.open();
+    push(0, 0, 0);
+    push(4, 1, 0); // waits beside the queue, also while the channel is closed
+    EXPECT_EQ(rig.log.getLostCounts(), 1);
+    rig.channel.close();
+    EXPECT_EQ(rig.available(), 3);
+    rig.open("dropNewest");
+    EXPECT_EQ(rig.log.getLostCounts(), 0);
+    push(2, 2, 0); // finds the queue full, as does what waited
+    EXPECT_EQ(rig.log.getLostCounts(), 8);
+    EXPECT_EQ(indicesOf(rig.read(2)), "0:2 ");
+    push(7, 2, 0);
+    EXPECT_EQ(indicesOf(rig.read(2)), "2:1 7:1 ");
+    device->perform([](DeviceStreams& streams) { EXPECT_EQ(streams.takenCounts(), 8); });
+    rig.channel.close();
+    EXPECT_EQ(indicesOf(rig.read(2)), "8:2 ");
+    EXPECT_EQ(rig.log.takeErrors().size(), 2);
+}
+
+TEST(LossTest, WithoutMemoryNothingIsLostUncounted)
+{
+    for (const char* const overflow : {"wait", "dropOldest", "dropNewest"}) {
+        SCOPED_TRACE(overflow);
+        allocations::sweep([&](long which, bool lasts) {
+            auto* const device = new Worker({stream, std::nullopt});
+            Rig rig(device, 4);
+            rig.init(Rig::options(overflow, true));
+            rig.open("", 0);
+            std::uint64_t counted = 0;
+            std::uint64_t numbered = 0;
+            bool failed = false;
+            device->perform([&](DeviceStreams& streams) {
+                std::vector<Packet> packets(4);
+                for (Packet& packet : packets) {
+                    packet.lost = 2;
+                    number(packet, 0, 3);
+                }
+                packets[3].lost = 0;
+                allocations::Failing failing(which, lasts);
+                for (Packet& packet : packets) {
+                    try {
+                        streams.tryPush(packet);
+                    } catch (const std::bad_alloc&) {
+                    }
+                }
+                failed = allocations::Failing::end();
+                streams.tellLost(1, "the last");
+            });
+            while (rig.available() > 0) {
+                for (const Buffer& buffer : rig.read(rig.available())) {
+                    counted += buffer.data.size();
+                }
+            }
+            device->perform([&](DeviceStreams& streams) { numbered = streams.takenCounts(); });
+            EXPECT_EQ(counted + rig.log.getLostCounts(), numbered);
+            rig.channel.close();
+            std::uint64_t told = 0;
+            for (const std::string& error : rig.log.takeErrors()) {
+                told += lossOf(error).counts;
+            }
+            EXPECT_EQ(told, rig.log.getLostCounts());
+            return failed;
+        });
+    }
+}
+
+TEST(LossTest, BadOptionsAreNamed)
+{
+    Rig rig(new Worker({stream, std::nullopt}), 4);
+    rig.init();
+    const auto scalar = [](const char* name, auto value) {
+        return PropertyMap{{name, makeScalar(name, value).release()}};
+    };
+    const std::pair<PropertyMap, std::string> rows[] = {
+        {scalar("Overflow", std::u16string(u"x")),
+         "Overflow: must be wait, dropOldest or dropNewest, not x."},
+        {scalar("Overflow", 1.0), "Overflow: must be a text."},
+        {scalar("Stamps", 2), "Stamps: must be true or false."},
+        {scalar("Stamps", std::u16string(u"true")), "Stamps: must be true or false."},
+    };
+    for (const auto& [options, error] : rows) {
+        try {
+            rig.channel.open(options);
+            ADD_FAILURE() << error;
+        } catch (const std::exception& exception) {
+            EXPECT_EQ(exception.what(), "Option " + error);
+        }
+    }
+}
