@@ -115,9 +115,12 @@ private:
         if (streams.tryPush(*device.waiting)) {
             device.waiting.reset();
         } else if (closing && !isDatagrams) {
-            // Nobody makes room now, but the other side may have to send in order to receive.
-            losses.noRoom += counts;
-            streams.tellLost(counts, nullptr);
+            // Nobody makes room now, but the other side may have to send in order to receive. Who only reads has
+            // seen enough; but to who writes it may be the answer.
+            if (sent > 0) {
+                losses.noRoom += counts;
+                streams.tellLost(counts, nullptr);
+            }
             device.waiting.reset();
         }
     }

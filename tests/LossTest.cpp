@@ -50,7 +50,7 @@ struct Refusing : Identity {
 };
 
 /// Does a script: pN pushes N counts, lN says that N were lost before the next packet, tN tells a loss of N,
-/// rN reads N counts, f flushes. Returns what was read, and then what is left.
+/// kN lists N counts, rN reads N counts, f flushes. Returns what was read, and then what is left.
 class Script
 {
 public:
@@ -69,6 +69,11 @@ public:
         for (std::uint64_t count = 0; words >> what >> count;) {
             if (what == 'r') {
                 read(count);
+            } else if (what == 'k') {
+                std::uint64_t total = 0;
+                std::vector<unsigned long> counts;
+                rig.input->peekCounts(count, total, counts);
+                EXPECT_EQ(total, count);
             } else if (what == 'f') {
                 rig.input->flush();
             } else {
@@ -130,6 +135,10 @@ TEST(LossTest, EachPolicyKeepsWhatItSaysAndTellsEachGapOnce)
         {"dropOldest", 7, "p7 p1 f0 p8", "9:7 ", {{{1, 1}, full}, {{1, 2}, full}}},
         {"dropOldest", 7, "p3 p20", "16:7 ", {{{16, 16}, full}}},
         {"dropOldest", 0, "p9 p1", "", {{{10, 10}, full}}},
+        {"dropOldest", 7, "p3 p3 k3 p5 r3", "0:3 7:4 ", {{{4, 4}, full}}}, // listed is kept
+        {"dropOldest", 7, "p3 p3 k4 p5", "0:3 3:3 10:1 ", {{{4, 4}, full}}},
+        {"dropOldest", 7, "p7 k7 p3 r7 p7 p1", "0:7 11:6 17:1 ", {{{4, 4}, full}}}, // one gap
+        {"dropOldest", 7, "p3 p3 k3 p5 k4 p2", "0:3 7:4 ", {{{4, 4}, full}, {{2, 6}, full}}},
         {"wait", 7, "l2 p3 p1", "2:3 5:1 ", {{{2, 2}, device}}},
         {"wait", 7, "p3 t4 t1 l2 p1", "0:3 10:1 ", {{{7, 7}, "it was told"}}}, // one gap
         {"wait", 7, "p3 t4 p1 l2", "0:3 7:1 ", {{{4, 4}, "it was told"}}},

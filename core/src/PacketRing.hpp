@@ -87,6 +87,14 @@ public:
         return packet;
     }
 
+    void erase(std::size_t i) noexcept
+    {
+        for (; i > 0; --i) {
+            slot(i) = std::move(slot(i - 1));
+        }
+        popFront();
+    }
+
 private:
     using Slot = std::optional<QueuedPacket>;
 

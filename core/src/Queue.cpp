@@ -178,19 +178,24 @@ void Queue::dropPending()
     constexpr const char* reason = "the input stream was full";
     const std::uint64_t brought = pending->counts();
     if (overflow == Overflow::DropOldest && !fits(brought)) {
-        std::uint64_t more = getCounts() + brought - limit;
-        losses.addAtFront(more, reason);
-        while (more > 0 && !packets.empty()) {
-            QueuedPacket& front = packets[0];
-            const std::uint64_t part = std::min(more, front.counts());
-            front.taken += part;
-            if (front.counts() == 0) {
-                packets.popFront();
+        const std::uint64_t more = getCounts() + brought - limit;
+        std::uint64_t lost = 0;
+        const auto loseFrom = [&](QueuedPacket& packet) {
+            const std::uint64_t part = std::min(more - lost, packet.counts());
+            packet.taken += part;
+            lost += part;
+            return part;
+        };
+        const std::size_t oldest = behindListed();
+        while (lost < more && oldest < packets.size()) {
+            change(-loseFrom(packets[oldest]));
+            if (packets[oldest].counts() == 0) {
+                packets.erase(oldest);
             }
-            change(-part);
-            more -= part;
         }
-        pending->taken += more;
+        loseFrom(*pending);
+        losses.addAtFront(lost, reason);
+        gapEnd = positionOf(oldest < packets.size() ? packets[oldest] : *pending);
         if (pending->counts() == 0) { // where nothing has room
             pending.reset();
             return;
@@ -203,6 +208,22 @@ void Queue::dropPending()
     if (pending) {
         losses.addAtEnd(pending->counts(), reason);
         pending.reset();
+    }
+}
+
+std::size_t Queue::behindListed() const
+{
+    std::size_t i = 0;
+    for (std::uint64_t seen = 0; seen < listed && i < packets.size(); ++i) {
+        seen += packets[i].counts();
+    }
+    return i;
+}
+
+void Queue::passGap(const QueuedPacket& packet, std::uint64_t count)
+{
+    if (positionOf(packet) + count > gapEnd) {
+        losses.passFront();
     }
 }
 
@@ -323,7 +344,8 @@ Queue::Packets Queue::take(std::uint64_t count)
     }
     if (!taken.empty()) {
         inHand = positionOf(taken[0]);
-        losses.passFront();
+        passGap(taken.back(), taken.back().counts());
+        listed -= std::min(listed, count);
     }
     lock.unlock();
     changed.notify_all(); // settle() wakes the device
@@ -394,7 +416,11 @@ void Queue::list(std::uint64_t most, std::uint64_t& total, std::vector<unsigned 
     for (std::size_t i = 0; i < packets.size() && total < most; ++i) {
         each.push_back(std::min(most - total, packets[i].counts()));
         total += each.back();
+        if (overflow == Overflow::DropOldest) {
+            passGap(packets[i], each.back());
+        }
     }
+    listed = total;
 }
 
 // --- The caller's side, output ---
@@ -454,6 +480,7 @@ void Queue::flush()
     last.swap(pending);
     held = 0;
     counts = 0;
+    listed = 0;
     losses.passFront();
     notifyDevice(lock);
 }
