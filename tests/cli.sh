@@ -121,6 +121,8 @@ done <<END
 2|--rate: 0 is not a number above 0|read signal -n 1 -r 0
 1|a sound file needs a whole number as sample rate|read signal -n 1 -r 44100.5 -w rate.wav
 1|does not load|plugins nosuch
+0|  data  int16: |info udp -o ElementType=int16
+0|  data  as ElementType says: |plugins udp
 0|command set: from the next block on|plugins signal
 1|brenix: nosuch: notFound|plugins --names signal nosuch
 0|  Stamp  double in s: one for each packet|plugins $plugins/pickyConverter.so
@@ -353,9 +355,9 @@ brenix read audiofile -o FileName=levels.flac -q >levels.csv
 # They tell what is wrong in their input, and keep what came before an error of the device.
 brenix write loopback -q -t int8 -i samples.csv --emit-c program.c
 compile
-for row in 300,1 1 1,2,3 1,x; do
+for row in 300,1 1 1,2,3 1,x $'1,\e'; do
     printf 'a,b\n1,2\n%s\n' "$row" >bad.csv
-    if ./program bad.csv 2>errors || [[ $(cat errors; echo .) != "bad.csv: line 3: not 2 values of type int8: $row
+    if ./program bad.csv 2>errors || [[ $(cat errors; echo .) != "bad.csv: line 3: not 2 values of type int8: ${row/$'\e'/\\x1b}
 ." ]]; then
         fail "the program of $row: $(cat errors)"
     fi

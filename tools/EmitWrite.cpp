@@ -132,8 +132,11 @@ constexpr std::string_view readCsv = R"(    static char* text = NULL;
             continue; /* the names of the columns */
         }
         if (next != text + length) {
-            fprintf(stderr, "%s: line %ld: not %d values of type @TYPENAME@: %.*s\n", name, line, COLUMNS,
-                    (int)strcspn(begin, "\r\n"), begin);
+            fprintf(stderr, "%s: line %ld: not %d values of type @TYPENAME@: ", name, line, COLUMNS);
+            for (next = begin; strchr("\r\n", *next) == NULL; ++next) {
+                fprintf(stderr, *next >= ' ' && *next <= '~' ? "%c" : "\\x%02x", (unsigned char)*next);
+            }
+            fputs("\n", stderr);
             inputOk = 0;
             break;
         }
