@@ -134,7 +134,8 @@ if [[ $(tr '\n' ' ' <kept.csv) != 'data 0 1 2 3 4 ' ]] || ! cut -d, -f1 refused.
     fail "what came before an error of a device or a converter is lost"
 fi
 [[ $(cat none.csv names.csv) == $'data\nleft,right' ]] || fail "names of nothing: $(cat none.csv names.csv)"
-for command in "info signal" plugins "check signal" "scope signal -n 10" \
+for command in "info signal" "info audiofile --open -o Mode=write -o FileName=closed.wav" plugins \
+    "check signal" "scope signal -n 10" \
     "read signal -n 10 --format "{csv,raw,wav,flac,ogg}; do
     for output in '>/dev/full' '>&-' '-w /dev/full'; do
         [[ $output != -w* || $command == read* ]] || continue
@@ -308,6 +309,8 @@ for command in "${noise[*]}" "./program full.flac"; do
 done
 emitted b.flac write audiofile -o FileName=b.flac -o Mode=write -o Channels=2 -i a.flac
 grep -q 'static double elements' program.c || fail "the type that audiofile takes is not written"
+brenix write loopback -q -i a.flac --emit-c program.c
+grep -q 'static int32_t elements' program.c || fail "the type of a.flac is not written"
 emitted b.au write audiofile -o FileName=b.au -o Mode=write -o Channels=2 -o SampleFormat=DOUBLE -i a.wav
 emitted c.wav write audiofile -o FileName=c.wav -o Mode=write -o Channels=2 -i samples.csv -f 'scale Gain=0.1'
 emitted d.wav write audiofile -o FileName=d.wav -o Mode=write -o Channels=2 --format raw -i samples.raw -n 3000
