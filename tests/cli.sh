@@ -134,8 +134,7 @@ if [[ $(tr '\n' ' ' <kept.csv) != 'data 0 1 2 3 4 ' ]] || ! cut -d, -f1 refused.
     fail "what came before an error of a device or a converter is lost"
 fi
 [[ $(cat none.csv names.csv) == $'data\nleft,right' ]] || fail "names of nothing: $(cat none.csv names.csv)"
-for command in "info signal" "info audiofile --open -o Mode=write -o FileName=closed.wav" plugins \
-    "check signal" "scope signal -n 10" \
+for command in "info signal" plugins "check signal" "scope signal -n 10" \
     "read signal -n 10 --format "{csv,raw,wav,flac,ogg}; do
     for output in '>/dev/full' '>&-' '-w /dev/full'; do
         [[ $output != -w* || $command == read* ]] || continue
@@ -345,6 +344,15 @@ wait $! || true
 brenix read audiofile -o FileName=levels.flac -q >levels.csv
 [[ $(tr '\n' ' ' <levels.csv) == 'data 0.5 -0.25 0.999969482421875 0.5 -0.25 0.999969482421875 ' ]] ||
     fail "levels: $(cat told levels.csv)"
+
+# Nothing of the device is taken for a standard output that is closed, such as what takes 8 bytes of anybody.
+rm told
+timeout 20 brenix read udp -o ElementType=int64 -n 1 --format raw 2>told >&- &
+while kill -0 $! && ! grep -qs LocalPort told; do sleep 0.02; done
+echo 1 | brenix write udp -o Host=127.0.0.1 -o "Port=$(sed -n 's/^udp: LocalPort //p' told)" -o ElementType=int64 -q
+if wait $! || ! grep -q 'standard output: Bad' told; then
+    fail "what goes to a closed output: $(cat told)"
+fi
 
 # They tell what is wrong in their input, and keep what came before an error of the device.
 brenix write loopback -q -t int8 -i samples.csv --emit-c program.c
