@@ -289,7 +289,7 @@ emitted a.flac read "${signal[@]}" -o Amplitude=0.9 -n 5000 -w a.flac
 sed -i 's/0\.9/1.1/' program.c
 compile
 while IFS='|' read -r file message; do
-    if ./program "$file" 2>errors || ! grep -qE "^$file: $message" errors; then
+    if ./program "$file" 2>errors | cat >out || ! grep -qE "^$file: $message" errors; then
         fail "the program of $file: $(cat errors)"
     fi
 done <<'END'
