@@ -5,6 +5,7 @@
 #include "brenixcoder/coder.h"
 
 #include <stdio.h>
+#include <string.h>
 
 /*
  * Returns the result of a call. When that is 0, prints why: the last error or, when it is empty,
@@ -28,6 +29,9 @@ static int check(void* channel, const char* call, int result)
     return 0;
 }
 
+/* Whether data that was lost is a failure like any other error, or is only printed. */
+static int lossIsFailure = 1;
+
 /* Returns 0, after printing it, if a plug-in has raised an error between the calls. */
 static int checkDevice(void* channel)
 {
@@ -43,7 +47,7 @@ static int checkDevice(void* channel)
     }
     (void)coderChannelGetLastAsyncError(channel, id, message);
     fprintf(stderr, "device: %s: %s\n", id, message);
-    return 0;
+    return !lossIsFailure && strstr(id, ":dataLost") != NULL;
 }
 
 /* Makes a channel; prints why when it returns NULL. */

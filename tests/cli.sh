@@ -126,6 +126,9 @@ done <<END
 0|  Stamp  double in s: one for each packet|plugins $plugins/pickyConverter.so
 0|  Stamp  double in s: one for each packet|info $plugins/probe.so -c $plugins/pickyConverter.so
 1|the data has no field Foo; it has data, Stamp|read $plugins/probe.so -c $plugins/pickyConverter.so -o Packets:int32=3,4 --field Foo
+0|6 counts were lost: the input stream was full; 6 since open.|read signal -o Pace=fast -o Frames=10 -o BlockSize=10 -o Overflow=dropNewest --limit 4
+0|"counts":4,"lost":6,|read signal -o Pace=fast -o Frames=10 -o BlockSize=10 -o Overflow=dropNewest --limit 4 --json
+1|read 4 counts in|read signal -o Pace=fast -o Frames=10 -o BlockSize=10 -o Overflow=dropNewest --limit 4 --fail-on-loss
 1|field Odd has no fixed number of elements|scope $plugins/probe.so -o Packets:int32=10,10,5 --field Odd
 1|the data has no field Foo; it has data|read signal -n 1 --field Foo
 0|RMS 0.7071|scope signal -o Pace=fast -n 4800 --png picture.png
@@ -278,6 +281,10 @@ emitted - info "${signal[@]}" --open -p Channels:uint32
 emitted - info "$plugins/probe.so" -c "$plugins/pickyConverter.so"
 emitted - read "$plugins/probe.so" -c "$plugins/pickyConverter.so" -o Packets:int32=1,3 -q
 [[ $(tail -n 2 second | tr '\n' ' ') == '2,4 3,4 ' ]] || fail "a stamp of each packet: $(cat second)"
+emitted - read "${signal[@]}" -q --time -o Frames=6 -o BlockSize=6 -o Overflow=dropNewest --limit 4
+[[ $(cut -d, -f1,2 second | tr '\n' ' ') == 'Index,Time 0,0 1,0 2,0 3,0 ' ]] || fail "numbers and times: $(cat second)"
+[[ $(brenix read signal -q -o BlockSize=3 -n 3 --time | awk -F, '{ time = substr($2, 6) } NR > 2 { print time - last } { last = time }' | tr '\n' ' ') =~ ^2083[0-9]\ 2083[0-9]\ $ ]] ||
+    fail "the times of three samples"
 emitted - info signal -o Channels=1 -o Channels=2 -p Channels:uint32
 name=$'./*\\\n/*??/\n/*.raw' # it would end a comment
 mkdir -p "${name%/*}"

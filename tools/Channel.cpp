@@ -65,8 +65,15 @@ Failure explained(const std::string& id, std::string message, const ChannelSetti
 void requireFixedNumber(Field& field, std::size_t rows)
 {
     if (!field.type->isText && field.elements.size() == field.type->size && field.perCount < 2) {
-        const Bytes one = field.elements;
+        Bytes one = field.elements;
+        std::int64_t first = 0;
+        std::memcpy(&first, one.data(), std::min(one.size(), sizeof first));
         for (std::size_t row = 1; row < rows; ++row) {
+            if (field.step > 0 && (first != 0 || field.name != "Time")) { // 0 is no time
+                const std::int64_t value =
+                    first + static_cast<std::int64_t>(static_cast<double>(row) * field.step + 0.5);
+                std::memcpy(one.data(), &value, one.size());
+            }
             field.elements.insert(field.elements.end(), one.begin(), one.end());
         }
         field.isRepeated = field.isRepeated || rows > 1;
@@ -151,12 +158,12 @@ void Channel::open(const ChannelSettings& settings)
                           [&](auto... list) { return coderChannelOpen(handle, list...); }));
 }
 
-void Channel::finish(const std::optional<Failure>& failure)
+void Channel::finish(const std::optional<Failure>& failure, std::vector<Failure>* losses)
 {
     std::vector<Failure> failures;
     const auto add = [&](const std::optional<Failure>& one) {
         if (one) {
-            failures.push_back(*one);
+            (losses != nullptr && one->isLoss() ? *losses : failures).push_back(*one);
         }
     };
     add(deviceError());

@@ -25,6 +25,9 @@ public:
     }
     const std::string& getId() const { return id; }
 
+    /// Whether it tells that data was lost and nothing else is wrong.
+    bool isLoss() const { return id.find(":dataLost") != std::string::npos; }
+
     /// Identifier and message, as far as there are both.
     std::string text() const
     {
@@ -60,6 +63,7 @@ struct Field {
     std::size_t perCount = 0; ///< elements of each count
     Bytes elements;           ///< of the buffer that was read last
     bool isRepeated = false;  ///< a buffer had one element, which is now in each row
+    double step = 0;          ///< by which an integer that is repeated grows from row to row
 };
 
 class Channel
@@ -76,7 +80,8 @@ public:
 
     /// Closes, when it is open, and terminates. Throws what fails, or the failure that ended a
     /// transfer, behind the device's errors if there are any: mostly they are the reason.
-    void finish(const std::optional<Failure>& failure = {});
+    /// Losses of data are no failures where a list takes them.
+    void finish(const std::optional<Failure>& failure = {}, std::vector<Failure>* losses = nullptr);
 
     /// Throws the error of a call that returned 0.
     void check(int result);

@@ -41,6 +41,9 @@ struct Settings {
     double seconds = std::numeric_limits<double>::infinity();
     std::size_t block = 1024;
 
+    bool time = false;       ///< columns of the number and the time of each count
+    bool failOnLoss = false; ///< lost data is an error
+
     std::size_t window = 1024; ///< counts that the scope shows
     std::string png;
     std::string emitC;
@@ -129,8 +132,12 @@ public:
     double getSeconds() const { return secondsSince(start); }
 
 private:
+    void findFields(double ready);
+
     Channel& channel;
     const std::vector<std::string>& fieldNames;
+    const bool hasTime;
+    const double rate;
     double mostCounts;
     double mostSeconds;
     double counts = 0;

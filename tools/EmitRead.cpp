@@ -70,7 +70,7 @@ constexpr std::string_view readField = R"(!check(channel, "coderInputStreamReadB
                 )";
 
 constexpr std::string_view repeatField = R"(    for (int row = 1; row < counts; ++row) {
-        @ARRAY@[row] = @ARRAY@[0];
+        @ARRAY@[row] = @ARRAY@[0]@STEP@;
     }
 )";
 
@@ -196,7 +196,13 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
                                            {"TIMES", times},
                                            {"ARRAY", array}});
         if (fields[f].isRepeated) { // a buffer has one for all its counts
-            values["REPEAT"] += fill(repeatField, {{"ARRAY", array}});
+            std::string step;
+            if (fields[f].step > 0) { // as the command has it; 0 is no time
+                step = std::string(" + (") + type.cName + ")(" +
+                       (fields[f].name == "Time" ? "(" + array + "[0] != 0) * " : "") + "row * " +
+                       constant(fields[f].step) + " + 0.5)";
+            }
+            values["REPEAT"] += fill(repeatField, {{"ARRAY", array}, {"STEP", step}});
         }
     }
     values["FIELDS"] += "\n";
@@ -215,6 +221,9 @@ void emitRead(const Settings& settings, const std::vector<Field>& fields, double
         if (format == "csv") {
             values["START"] = "    fputs(" + quote(csvHeader(fields)) + " \"\\n\", file);\n";
         }
+    }
+    if (!settings.failOnLoss) {
+        values["START"] += "    lossIsFailure = 0; /* it is told, and the rest is read */\n";
     }
     addFile(settings, true, soundFormat, values);
     saveTransfer(settings, readProgram, mostCounts, mostSeconds, std::move(values));

@@ -31,15 +31,24 @@ std::pair<double, double> extent(const Settings& settings, double rate)
     return {settings.counts, settings.seconds};
 }
 
-void summarise(const Settings& settings, const char* verb, double counts, double seconds)
+/// Losses are those of an input stream.
+void summarise(const Settings& settings, const char* verb, double counts, double seconds,
+               std::optional<double> lost = {})
 {
     if (settings.json) {
-        printJson(std::cerr, {{"counts", static_cast<std::int64_t>(counts)},
-                              {"seconds", seconds},
-                              {"interrupted", isInterrupted()}});
+        Json summary = {{"counts", static_cast<std::int64_t>(counts)}};
+        if (lost) {
+            summary["lost"] = static_cast<std::int64_t>(*lost);
+        }
+        summary["seconds"] = seconds;
+        summary["interrupted"] = isInterrupted();
+        printJson(std::cerr, summary);
     } else if (!settings.quiet) {
-        std::fprintf(stderr, "%s %.0f counts in %.3g s%s\n", verb, counts, seconds,
-                     isInterrupted() ? ", interrupted" : "");
+        std::fprintf(stderr, "%s %.0f counts in %.3g s", verb, counts, seconds);
+        if (lost.value_or(0) > 0) {
+            std::fprintf(stderr, ", lost %.0f", *lost);
+        }
+        std::fputs(isInterrupted() ? ", interrupted\n" : "\n", stderr);
     }
 }
 
@@ -78,6 +87,10 @@ std::vector<Field> describedFields(Channel& channel, const Settings& settings)
         field.type = type != nullptr ? type : &elementType("double");
         field.perCount = perCount;
     };
+    if (settings.time) {
+        add("Index", &elementType("uint64"), 1);
+        add("Time", &elementType("int64"), 1);
+    }
     if (!settings.fields.empty()) {
         for (const std::string& name : settings.fields) {
             add(name, nullptr, 1);
@@ -128,8 +141,8 @@ void tellPort(Channel& channel, const Settings& settings)
     }
 }
 
-Reading::Reading(Channel& openChannel, const Settings& settings, double rate)
-    : channel(openChannel), fieldNames(settings.fields)
+Reading::Reading(Channel& openChannel, const Settings& settings, double signalRate)
+    : channel(openChannel), fieldNames(settings.fields), hasTime(settings.time), rate(signalRate)
 {
     std::tie(mostCounts, mostSeconds) = extent(settings, rate);
 }
@@ -152,7 +165,7 @@ std::size_t Reading::next()
         return 0;
     }
     if (fields.empty()) {
-        fields = channel.findFields(fieldNames, ready);
+        findFields(ready);
     }
     for (Field& field : fields) {
         channel.readField(field, ready);
@@ -161,9 +174,26 @@ std::size_t Reading::next()
     return static_cast<std::size_t>(ready);
 }
 
+void Reading::findFields(double ready)
+{
+    if (hasTime) {
+        fields = channel.findFields({"Index", "Time"}, ready);
+        fields[0].step = 1;
+        fields[1].step = rate > 0 ? 1e9 / rate : 0;
+        for (Field& field : fields) {
+            field.isRepeated = true; // also if the first buffer has one count
+        }
+    }
+    const std::vector<Field> others = channel.findFields(fieldNames, ready);
+    fields.insert(fields.end(), others.begin(), others.end());
+}
+
 ExitCode readSamples(const Settings& given)
 {
     Settings settings = given;
+    if (settings.time) {
+        settings.channel.options.emplace_back("Stamps:logical=1");
+    }
     settleFormat(settings.file);
     Channel channel(settings.channel, Use::Read);
     settings.file.rate = countRate(channel, settings.file);
@@ -175,6 +205,8 @@ ExitCode readSamples(const Settings& given)
                       settings.quiet);
     std::unique_ptr<SampleWriter> writer;
     double written = 0;
+    bool isLossTold = false;
+    std::optional<Failure> ended; // the device's error, after which what came before it is read
     const auto failure = caught([&] {
         while (!reading.isOver()) {
             if (const std::size_t counts = reading.next(); counts > 0) {
@@ -188,9 +220,17 @@ ExitCode readSamples(const Settings& given)
                 written = reading.getCounts();
                 progress.update(written);
             }
-            if (channel.hasDeviceError()) { // finish() throws it
+            if (const auto error = channel.deviceError(); error && error->isLoss()) {
+                progress.finish();
+                report(settings, *error);
+                isLossTold = true;
+            } else if (error) {
+                ended = error;
                 reading.endWithAvailable();
             }
+        }
+        if (ended) {
+            throw Failure(*ended);
         }
     });
     progress.finish();
@@ -205,11 +245,20 @@ ExitCode readSamples(const Settings& given)
             writer->finish(); // what came before a failure is kept
         }
     });
-    channel.finish(failure ? failure : unwritten);
+    std::vector<Failure> losses;
+    channel.finish(failure ? failure : unwritten, &losses);
+    for (const Failure& loss : losses) {
+        report(settings, loss);
+        isLossTold = true;
+    }
+    const double lost = channel.number("LostCounts", "uint64").value_or(0);
     if (writer && !settings.emitC.empty()) {
         emitRead(settings, fields, most, reading.getMostSeconds());
     }
-    summarise(settings, "read", written, seconds);
+    summarise(settings, "read", written, seconds, lost);
+    if (settings.failOnLoss && (isLossTold || lost > 0)) {
+        return Failed;
+    }
     return isInterrupted() ? Interrupted : Success;
 }
 

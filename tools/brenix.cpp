@@ -154,6 +154,11 @@ ExitCode run(Settings& settings, int count, char** arguments)
     addExtent(*command, settings);
     addFields(*command, settings);
     addFile(*command, settings, "-w,--to", "File for the samples (default: standard output)");
+    command->add_flag("--time", settings.time,
+                      "Columns with the number of each count since open and its time, in "
+                      "nanoseconds since 1970 or 0");
+    command->add_flag("--fail-on-loss", settings.failOnLoss,
+                      "End with exit code 1 when the device or the stream loses data");
     addEmit(*command, settings);
 
     command = add("write", "Write samples to a device", writeSamples);
