@@ -298,7 +298,7 @@ emitted a.flac read "${signal[@]}" -o Amplitude=0.9 -n 5000 -w a.flac
 sed -i 's/0\.9/1.1/' program.c
 compile
 while IFS='|' read -r file message; do
-    if ./program "$file" 2>errors || ! grep -qE "^$file: $message" errors; then
+    if ./program "$file" 2>errors | cat >out || ! grep -qE "^$file: $message" errors; then
         fail "the program of $file: $(cat errors)"
     fi
 done <<'END'
@@ -317,6 +317,8 @@ for command in "${noise[*]}" "./program full.flac"; do
 done
 emitted b.flac write audiofile -o FileName=b.flac -o Mode=write -o Channels=2 -i a.flac
 grep -q 'static double elements' program.c || fail "the type that audiofile takes is not written"
+brenix write loopback -q -i a.flac --emit-c program.c
+grep -q 'static int32_t elements' program.c || fail "the type of a.flac is not written"
 emitted b.au write audiofile -o FileName=b.au -o Mode=write -o Channels=2 -o SampleFormat=DOUBLE -i a.wav
 emitted c.wav write audiofile -o FileName=c.wav -o Mode=write -o Channels=2 -i samples.csv -f 'scale Gain=0.1'
 emitted d.wav write audiofile -o FileName=d.wav -o Mode=write -o Channels=2 --format raw -i samples.raw -n 3000
@@ -351,6 +353,15 @@ wait $! || true
 brenix read audiofile -o FileName=levels.flac -q >levels.csv
 [[ $(tr '\n' ' ' <levels.csv) == 'data 0.5 -0.25 0.999969482421875 0.5 -0.25 0.999969482421875 ' ]] ||
     fail "levels: $(cat told levels.csv)"
+
+# Nothing of the device is taken for a standard output that is closed, such as what takes 8 bytes of anybody.
+rm told
+timeout 20 brenix read udp -o ElementType=int64 -n 1 --format raw 2>told >&- &
+while kill -0 $! && ! grep -qs LocalPort told; do sleep 0.02; done
+echo 1 | brenix write udp -o Host=127.0.0.1 -o "Port=$(sed -n 's/^udp: LocalPort //p' told)" -o ElementType=int64 -q
+if wait $! || ! grep -q 'standard output: Bad' told; then
+    fail "what goes to a closed output: $(cat told)"
+fi
 
 # They tell what is wrong in their input, and keep what came before an error of the device.
 brenix write loopback -q -t int8 -i samples.csv --emit-c program.c

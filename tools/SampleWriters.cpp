@@ -159,9 +159,10 @@ public:
             fail(name, sound->error());
         }
         sf_command(sound->get(), SFC_SET_CLIPPING, nullptr, SF_TRUE); // the scale of PCM is 2^n
-        sf_command(sound->get(), SFC_SET_ADD_PEAK_CHUNK, nullptr,
-                   SF_FALSE);           // it has the time in it
-        if (startsWithHeader(format)) { // then a file of no frames is one, too
+        // It has the time in it.
+        sf_command(sound->get(), SFC_SET_ADD_PEAK_CHUNK, nullptr, SF_FALSE);
+        if (startsWithHeader(format)) {
+            // A file of no frames is one, too.
             sf_command(sound->get(), SFC_UPDATE_HEADER_NOW, nullptr, 0);
         }
         if (format.encoding.value == 0 && format.container.value != SF_FORMAT_FLAC) {
@@ -185,7 +186,7 @@ public:
         const auto items = static_cast<sf_count_t>(rows.size() / type.size);
         const sf_count_t written = soundOf.write(sound->get(), rows.data(), items);
         if (const std::string error = sound->error(); written != items || !error.empty()) {
-            fail(name, error);
+            fail(name, error.empty() ? "cannot be written" : error);
         }
     }
 
