@@ -31,8 +31,8 @@ function(brenix_install_docs)
         PATTERN man EXCLUDE)
     install(DIRECTORY examples DESTINATION ${folder} FILES_MATCHING PATTERN *.c PATTERN *.h)
     install(DIRECTORY plugins/template DESTINATION ${folder}/plugins)
-    install(FILES plugins/loopback.cpp plugins/ByteDevice.hpp plugins/Elements.hpp plugins/Losses.hpp
-        plugins/Transfer.hpp plugins/Waits.hpp DESTINATION ${folder}/plugins)
+    install(FILES plugins/loopback.cpp plugins/signal.cpp plugins/ByteDevice.hpp plugins/Elements.hpp
+        plugins/Losses.hpp plugins/Transfer.hpp plugins/Waits.hpp DESTINATION ${folder}/plugins)
     install(FILES docs/man/brenixcoder.3 DESTINATION ${CMAKE_INSTALL_MANDIR}/man3)
     foreach(headers include/brenixcoder include/brenixplugin core/include/brenixcore)
         cmake_path(GET headers PARENT_PATH parent)

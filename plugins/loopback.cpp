@@ -39,6 +39,7 @@ public:
             }
         }
         if (lost > 0) {
+            streams.tellLost(lost, nullptr); // which the error below tells
             const std::string message = std::to_string(lost) +
                                         " counts were lost: the channel closed and its input "
                                         "stream was full.";

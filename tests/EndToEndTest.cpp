@@ -260,6 +260,7 @@ TEST(StreamTest, LoopbackCountsWhatItLoses)
     EXPECT_EQ(channel.close(), 1);
     EXPECT_EQ(channel.asyncError(), "brenix:Device:dataLost|4 counts were lost: the channel closed "
                                     "and its input stream was full.");
+    EXPECT_EQ(channel.property<std::uint64_t>("LostCounts", "uint64"), 4);
 }
 
 TEST(EventTest, AFailureOfTheDevicesThreadIsAnError)

@@ -94,6 +94,8 @@ done <<END
 2|brenix: option Frequency: not a number: 1x|info signal -o Frequency=1x
 2|option Gain: not a number: nothing|read signal -f 'scale Gain='
 2|option Timeout: not a number: long|read signal --open-option Timeout=long
+2|option Stamps: not a logical: maybe|read signal -o Stamps=maybe
+2|--time needs csv, not wav|read signal --time -n 1 -w time.wav
 0|read 1200 counts|read signal -o Pace=fast -n 1.2k -r 1M --limit 4Ki -w kilo.csv
 2|--block: 2Mi is not a whole number from 1 to 1048576|write loopback -b 2Mi
 2|foo is no command: there are plugins, check, info, read, write, scope|foo

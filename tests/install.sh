@@ -61,10 +61,11 @@ for language in c:99 c++:17; do
     expect '1.5 2.5 3.5' env -i ./first
     expect 'tone.wav: 48000 samples at 48000 Hz' env -i ./generated
 done
-for example in levels echo stream; do
+for example in levels echo gaps stream; do
     "$CC" "${warnings[@]}" programs/$example.c "${flags[@]}" -o $example
 done
 expect '*char *: the same' env -i ./echo
+expect '*gap: * counts from * on*the core says *[0-9]' env -i ./gaps
 expect '1.000 s, 48000 Hz*Overall *1.000000 *0.707*' env -i ./levels tone.wav
 
 echo "== with CMake, as C and as C++"

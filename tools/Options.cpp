@@ -23,6 +23,8 @@ std::vector<DescribedValue> describedOptions(const std::string& plugin)
         described = brenixcore::plugin::inspectPlugin(plugin).options;
     }
     described.push_back({"Timeout", "number", "", "", ""});
+    described.push_back({"Overflow", "text", "", "", ""});
+    described.push_back({"Stamps", "logical", "", "", ""});
     return described;
 }
 
@@ -73,8 +75,12 @@ Option parseOption(const std::string& text, const std::vector<DescribedValue>& d
                          [&](const DescribedValue& known) { return known.name == option.name; });
         const std::string kind = row == described.end() ? "" : row->type;
         const bool isNumber = kind == "number" || kind == "whole number";
-        ok = (kind != "text" && parse(isNumber ? quantityType() : elementType("double"))) ||
-             (!isNumber && parse(elementType("char")));
+        if (kind == "logical") {
+            ok = parse(elementType(kind));
+        } else {
+            ok = (kind != "text" && parse(isNumber ? quantityType() : elementType("double"))) ||
+                 (!isNumber && parse(elementType("char")));
+        }
         wanted = kind;
     }
     if (!ok) {

@@ -195,6 +195,9 @@ ExitCode readSamples(const Settings& given)
         settings.channel.options.emplace_back("Stamps:logical=1");
     }
     settleFormat(settings.file);
+    if (settings.time && settings.file.format != "csv") { // it has columns of several types
+        throw std::invalid_argument("--time needs csv, not " + settings.file.format);
+    }
     Channel channel(settings.channel, Use::Read);
     settings.file.rate = countRate(channel, settings.file);
     channel.open(settings.channel);

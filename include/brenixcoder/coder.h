@@ -26,7 +26,9 @@
  * holds an error when its identifier is not empty.
  *
  * - The last error: why the last call on this channel or one of its streams failed. The next call
- *   clears it. Failures of the core have an identifier of their own and an empty message:
+ *   clears it. Failures of the core have an identifier of their own and an empty message; the
+ *   included core tells the reason in the channel's property Reason ("char"), which is asked for
+ *   after the error:
  *
  *   | identifier | meaning |
  *   |---|---|
@@ -148,7 +150,7 @@ extern "C" {
  * @return a channel handle, to be released with coderChannelDestroy(); NULL on failure
  *
  * Errors, in the two buffers: the four load and create failures with an empty message, whose reason
- * `brenix check PLUGIN` finds; brenix:Channel:unexpectedException for anything else, such as a null
+ * `brenix check PLUGIN` finds, since there is no channel that could tell it; brenix:Channel:unexpectedException for anything else, such as a null
  * path.
  */
 CODER_API void* coderChannelCreate(const char* devicePath, const char* converterPath, char* errorId,

@@ -17,7 +17,7 @@ namespace brenixcore::plugin
 /// One option. Tables end with a null name; no other text of theirs is null.
 struct OptionInfo {
     const char* name;         ///< under which it is given
-    const char* type;         ///< what it must be: "text", "number", "whole number"
+    const char* type;         ///< what it must be: "text", "number", "whole number", "logical"
     const char* unit;         ///< empty when it has none
     const char* defaultValue; ///< "(required)" when it must be given
     const char* meaning;      ///< in a few words

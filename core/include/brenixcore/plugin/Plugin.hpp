@@ -34,8 +34,9 @@ class BRENIXCORE_PLUGIN_SHARED DeviceHost
 {
 public:
     /// Raises an event. `name` is "error", "warning" or "trace"; the last two are seen only where the
-    /// environment's BRENIX_TRACE says. An event without an identifier has brenix:Device:failed. On the thread that is inside an operation of the channel, an error throws,
-    /// and the exception must pass through the device.
+    /// environment's BRENIX_TRACE says. An event without an identifier has brenix:Device:failed. On the
+    /// thread that is inside an operation of the channel, an error throws, and the exception must pass
+    /// through the device.
     virtual void raise(const char* name, const char* identifier, const char* message) = 0;
 
     /// Gives a property that init() delivered a new value.
@@ -127,8 +128,8 @@ public:
     /// returns nothing, any other device returns when push() is false.
     virtual void run(DeviceStreams& streams) = 0;
 
-    /// Called on the channel's thread, while run() may be busy, when tryPush(), tryPull() or
-    /// isClosing() may have a new answer. Must neither wait nor throw.
+    /// Called on the channel's thread, while run() may be busy, when tryPush(), tryPull(), isClosing() or
+    /// takenCounts() may have a new answer. Must neither wait nor throw.
     virtual void wake() noexcept {}
 
     /// Runs a command, possibly while run() is busy.
