@@ -34,8 +34,9 @@ class BRENIXCORE_PLUGIN_SHARED DeviceHost
 {
 public:
     /// Raises an event. `name` is "error", "warning" or "trace"; the last two are seen only where the
-    /// environment's BRENIX_TRACE says. An event without an identifier has brenix:Device:failed. On the thread that is inside an operation of the channel, an error throws,
-    /// and the exception must pass through the device.
+    /// environment's BRENIX_TRACE says. An event without an identifier has brenix:Device:failed. On the
+    /// thread that is inside an operation of the channel, an error throws, and the exception must pass
+    /// through the device.
     virtual void raise(const char* name, const char* identifier, const char* message) = 0;
 
     /// Gives a property that init() delivered a new value.
@@ -77,8 +78,8 @@ public:
     /// stream is discarded at close, and told.
     virtual void refuseOutput() = 0;
 
-    /// Says that the device pushes nothing more, while it may go on with its output: its reader is told
-    /// that the device is done, and one that waits ends.
+    /// Says that the device pushes nothing more, while it may go on with its output: what was lost is told,
+    /// and its reader that the device is done; one that waits ends.
     virtual void endInput() = 0;
 
     /// Says that the device lost counts behind those that it pushed last, and why, in a few words: where no
