@@ -18,7 +18,6 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstdint>
-#include <cstdio>
 #include <cstdlib>
 #include <functional>
 #include <memory>
@@ -275,11 +274,12 @@ struct Loss {
 };
 inline Loss lossOf(const std::string& error)
 {
-    Loss loss;
-    const int found = std::sscanf(
-        error.c_str(), "brenix:Stream:dataLost|%lu counts were lost: %*[^;]; %lu since open.",
-        &loss.counts, &loss.sum);
-    return found == 2 ? loss : Loss();
+    const std::string start = "brenix:Stream:dataLost|";
+    const std::size_t sum = error.rfind("; ");
+    if (error.rfind(start, 0) != 0 || sum == std::string::npos) {
+        return {};
+    }
+    return {std::stoull(error.substr(start.size())), std::stoull(error.substr(sum + 2))};
 }
 
 /// Gives a packet its counts, numbered from `first` on.

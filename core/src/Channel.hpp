@@ -103,9 +103,9 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : Reporter, plugin::DeviceStreams
     IEventHandler* handler;  ///< null once the channel is being destroyed
     std::set<std::string, std::less<>> propertyNames; ///< that init delivered
 
-    // Used on the caller's thread.
-    bool keepsLost = false;    ///< once init has delivered the property, as below
-    bool keepsReason = false;  ///< once init has delivered the property
+    // Of the caller's thread; what the device's thread uses of it stays while the channel is open.
+    bool keepsLost = false;    ///< once init has delivered the property of lost counts
+    bool keepsReason = false;  ///< and that of the reason
     std::exception_ptr raised; ///< by which the device's error leaves the operation that runs
     State state = State::Created;
     std::unique_ptr<InputStream> input;

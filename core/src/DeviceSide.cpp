@@ -66,6 +66,20 @@ void Channel::Impl::updateProperty(OwnedProperty property)
     }
 }
 
+template <typename Tell>
+void Channel::Impl::tellLoss(const Tell& tell) noexcept
+{
+    try {
+        try {
+            tell();
+        } catch (const std::bad_alloc&) {
+            raise("error", "brenix:Stream:dataLost",
+                  "Counts were lost, and there is no memory to tell how many.");
+        }
+    } catch (...) { // the handler threw
+    }
+}
+
 // --- Data ---
 
 bool Channel::Impl::push(plugin::Packet packet)
@@ -131,6 +145,7 @@ void Channel::Impl::refuseOutput()
 void Channel::Impl::endInput()
 {
     if (input) {
+        tellLoss([&] { input->impl->tellLosses(true); });
         input->impl->queue.setDeviceDone();
     }
 }
@@ -163,12 +178,8 @@ void Channel::Impl::runDevice() noexcept
         }
     } catch (...) { // the handler threw on a thread where it must not, or memory is out
     }
-    tellLoss([&] {
-        if (input) {
-            input->impl->tellLosses(true);
-        }
-    });
-    forEachStream([](Stream::Impl& stream) { stream.queue.setDeviceDone(); });
+    endInput();
+    refuseOutput();
     const std::uint64_t left = output ? output->impl->queue.discardRest() : 0;
     if (left > 0) {
         tellLoss([&] {
@@ -177,20 +188,6 @@ void Channel::Impl::runDevice() noexcept
                                         (failure.empty() ? "." : ": " + failure);
             raise("error", "brenix:Stream:dataLost", message.c_str());
         });
-    }
-}
-
-template <typename Tell>
-void Channel::Impl::tellLoss(const Tell& tell) noexcept
-{
-    try {
-        try {
-            tell();
-        } catch (const std::bad_alloc&) {
-            raise("error", "brenix:Stream:dataLost",
-                  "Counts were lost, and there is no memory to tell how many.");
-        }
-    } catch (...) { // the handler threw
     }
 }
 

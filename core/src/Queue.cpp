@@ -395,11 +395,10 @@ Queue::Packets Queue::takeAvailable(std::uint64_t count)
 
 void Queue::putBackLocked(Packets& taken) noexcept
 {
-    for (auto packet = taken.rbegin(); packet != taken.rend(); ++packet) {
-        change(packet->counts());
-        packets.pushFront(std::move(*packet));
+    for (; !taken.empty(); taken.pop_back()) {
+        change(taken.back().counts());
+        packets.pushFront(std::move(taken.back()));
     }
-    taken.clear();
 }
 
 void Queue::putBack(Packets& taken) noexcept
@@ -448,26 +447,25 @@ void Queue::awaitRoom(std::uint64_t more)
     }
 }
 
-void Queue::add(Packets& more, std::chrono::steady_clock::time_point begin)
+void Queue::add(Packets& added, std::chrono::steady_clock::time_point begin)
 {
-    std::uint64_t added = 0;
-    for (const QueuedPacket& packet : more) {
-        added += packet.counts();
+    std::uint64_t more = 0;
+    for (const QueuedPacket& packet : added) {
+        more += packet.counts();
     }
     Lock lock(mutex);
-    packets.reserve(more.size());
-    if (!fits(added)) {
+    packets.reserve(added.size());
+    if (!fits(more)) {
         std::optional<Duration> left = timeout;
         if (left) {
             *left -= std::chrono::steady_clock::now() - begin;
         }
         waitUntil(
-            lock, [&] { return fits(added) || !isFlowing(); }, left);
+            lock, [&] { return fits(more) || !isFlowing(); }, left);
     }
-    for (QueuedPacket& packet : more) {
-        packets.pushBack(std::move(packet));
+    for (QueuedPacket& packet : added) {
+        enqueue(std::move(packet));
     }
-    change(added);
     notifyDevice(lock);
 }
 

@@ -88,7 +88,7 @@ public:
     /// What is lost of the packets taken last, and told otherwise.
     void loseTaken(std::uint64_t count);
 
-    /// The gaps that ended and are to be told, at the end of the device all; nothing when there is no news of
+    /// The gaps that ended and are to be told, at the end of its input all; nothing when there is no news of
     /// losses.
     std::optional<std::vector<Gap>> takeNews(bool atEnd);
 
@@ -123,7 +123,7 @@ public:
 
     /// Adds packets for which awaitRoom() was called. Where filters made more of them, it waits for room for
     /// that, too, but not beyond the caller's time since `begin`; then they are queued all the same.
-    void add(Packets& packets, std::chrono::steady_clock::time_point begin);
+    void add(Packets& added, std::chrono::steady_clock::time_point begin);
 
     /// Discards all.
     void flush();

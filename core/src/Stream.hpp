@@ -41,7 +41,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     bool push(plugin::Packet& packet, bool waits);
 
     /// On the device's thread: tells the gaps that ended, by events, and the sum of what was lost. At the end
-    /// of the device, all gaps.
+    /// of its input, all gaps.
     void tellLosses(bool atEnd);
 
     /// Runs an operation of the converter. Throws when it does, or leaves the packet as it must not.
@@ -53,8 +53,7 @@ struct BRENIXCORE_INTERNAL Stream::Impl {
     plugin::Converter& converter;
     Reporter& reporter;
     const plugin::StreamInfo info;
-    bool stamps =
-        false; ///< whether what is read has the fields Index and Time; the caller's thread's
+    bool stamps = false; ///< what is read has the fields Index and Time; for the caller's thread
     Queue queue;
     FilterChain filters;
 };

@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
+#include <new>
 #include <string_view>
 #include <system_error>
 #include <utility>
@@ -39,11 +40,18 @@ Trace::~Trace()
     }
 }
 
-void Trace::write(const char* event, const char* identifier, const char* message) const
+void Trace::write(const char* event, const char* identifier, const char* message) const noexcept
 {
-    if (file == -1) {
-        return;
+    if (file != -1) {
+        try {
+            writeLine(event, identifier, message);
+        } catch (const std::bad_alloc&) {
+        }
     }
+}
+
+void Trace::writeLine(const char* event, const char* identifier, const char* message) const
+{
     using std::chrono::system_clock;
     const auto now = system_clock::now();
     const std::time_t seconds = system_clock::to_time_t(now);

@@ -17,10 +17,13 @@ public:
     Trace& operator=(const Trace&) = delete;
     ~Trace();
 
-    /// One line, at once: time, device, thread and the three texts. No text is null.
-    void write(const char* event, const char* identifier, const char* message) const;
+    /// One line, at once: time, device, thread and the three texts. No text is null. Without memory there is
+    /// no line, which is no reason for the event not to arrive.
+    void write(const char* event, const char* identifier, const char* message) const noexcept;
 
 private:
+    void writeLine(const char* event, const char* identifier, const char* message) const;
+
     std::string device;
     int file = -1;
 };

@@ -78,8 +78,8 @@ public:
     /// stream is discarded at close, and told.
     virtual void refuseOutput() = 0;
 
-    /// Says that the device pushes nothing more, while it may go on with its output: its reader is told
-    /// that the device is done, and one that waits ends.
+    /// Says that the device pushes nothing more, while it may go on with its output: what was lost is told,
+    /// and its reader that the device is done; one that waits ends.
     virtual void endInput() = 0;
 
     /// Says that the device lost counts behind those that it pushed last, and why, in a few words: where no
