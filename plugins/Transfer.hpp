@@ -115,12 +115,8 @@ private:
         if (streams.tryPush(*device.waiting)) {
             device.waiting.reset();
         } else if (closing && !isDatagrams) {
-            // Nobody makes room now, but the other side may have to send in order to receive. Who only reads has
-            // seen enough; but to who writes it may be the answer.
-            if (sent > 0) {
-                losses.noRoom += counts;
-                streams.tellLost(counts, nullptr);
-            }
+            // Nobody makes room now, but the other side may have to send in order to receive.
+            noRoom += counts;
             device.waiting.reset();
         }
     }
@@ -257,6 +253,10 @@ private:
         }
         deliver();
         losses.partial += assembler.dropRest();
+        if (sent > 0) { // it may be the answer; who only reads has seen enough
+            losses.noRoom = noRoom;
+            streams.tellLost(noRoom, nullptr);
+        }
         if (!outputEnded) {
             losses.addUnsent(unsent.size() + device.queuedBySystem(),
                              failure ? "" : "the other side does not take them");
@@ -276,7 +276,8 @@ private:
     asio::error_code failure;
 
     Assembler assembler;
-    std::size_t late = 0; ///< bytes that arrived when all was over
+    std::uint64_t noRoom = 0; ///< elements that arrived while the channel closed
+    std::size_t late = 0;     ///< bytes that arrived when all was over
 
     OwnedProperty outgoing;
     asio::const_buffer unsent; ///< of `outgoing`

@@ -183,6 +183,27 @@ TEST(LossTest, EachPolicyKeepsWhatItSaysAndTellsEachGapOnce)
     }
 }
 
+TEST(LossTest, TheFailureThatEndsADeviceIsToldAfterWhatWasLost)
+{
+    auto* const device = new Worker({stream, std::nullopt});
+    Rig rig(device, 4);
+    rig.init(Rig::options("dropNewest"));
+    rig.open();
+    device->start([](DeviceStreams& streams) {
+        Packet packet;
+        number(packet, 0, 9);
+        streams.push(std::move(packet));
+        throw std::runtime_error("it broke");
+    });
+    for (int i = 0; i < 5000 && !rig.input->isDeviceDone(); ++i) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    EXPECT_EQ(rig.log.takeErrors(),
+              (std::vector<std::string>{"brenix:Stream:dataLost|5 counts were lost: the input "
+                                        "stream was full; 5 since open.",
+                                        "brenix:Device:failed|it broke"}));
+}
+
 TEST(LossTest, ReadersThatWaitGetTheirCountsInEveryMode)
 {
     for (const char* const overflow : {"wait", "dropOldest", "dropNewest"}) {

@@ -65,6 +65,7 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : Reporter, plugin::DeviceStreams
     void runDevice() noexcept;
     template <typename Tell>
     void tellLoss(const Tell& tell) noexcept;
+    void tellInputLosses() noexcept; ///< all of them, since no gap grows any more
 
     /// Refuses an operation in a state in which it has no meaning.
     void require(bool allowed, const char* operation) const;

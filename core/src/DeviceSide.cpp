@@ -145,7 +145,7 @@ void Channel::Impl::refuseOutput()
 void Channel::Impl::endInput()
 {
     if (input) {
-        tellLoss([&] { input->impl->tellLosses(true); });
+        tellInputLosses();
         input->impl->queue.setDeviceDone();
     }
 }
@@ -166,6 +166,15 @@ std::uint64_t Channel::Impl::takenCounts() const
 
 // --- The device's thread ---
 
+void Channel::Impl::tellInputLosses() noexcept
+{
+    tellLoss([&] {
+        if (input) {
+            input->impl->tellLosses(true);
+        }
+    });
+}
+
 void Channel::Impl::runDevice() noexcept
 {
     std::string failure;
@@ -174,6 +183,7 @@ void Channel::Impl::runDevice() noexcept
             device.object->run(*this);
         } catch (...) {
             failure = currentExceptionText();
+            tellInputLosses(); // before the failure, which is to be the last error
             raise("error", "brenix:Device:failed", failure.c_str());
         }
     } catch (...) { // the handler threw on a thread where it must not, or memory is out
