@@ -8,7 +8,6 @@
 
 #include <asio.hpp>
 
-#include <algorithm>
 #include <chrono>
 #include <cstdint>
 #include <optional>
@@ -274,16 +273,13 @@ private:
     const bool isDatagrams = device.isDatagrams;
     DeviceStreams& streams;
     asio::error_code failure;
-
     Assembler assembler;
     std::uint64_t noRoom = 0; ///< elements that arrived while the channel closed
     std::size_t late = 0;     ///< bytes that arrived when all was over
-
     OwnedProperty outgoing;
     asio::const_buffer unsent; ///< of `outgoing`
     std::size_t sent = 0;      ///< bytes, of all packets
     Losses losses;
-
     Ticker endTicker{device.context};
     Patience patience; ///< with the other side, while the device waits to end
     Ticker lossTicker{device.context};
@@ -291,7 +287,6 @@ private:
     // Under way:
     bool receiving = false;
     bool sending = false;
-
     bool closing = false;
     bool inputEnded = false;
     bool inputDoneTold = false;

@@ -17,10 +17,6 @@ using brenixplugin::PropertyMap;
 namespace
 {
 
-// The core's own properties.
-constexpr const char* reasonName = "Reason";   ///< why the last operation that failed did so
-constexpr const char* lostName = "LostCounts"; ///< of the input stream, since open
-
 Overflow overflowOf(const std::string& policy)
 {
     constexpr std::pair<std::string_view, Overflow> policies[] = {
@@ -213,37 +209,6 @@ Channel::Impl::~Impl()
             terminateDevice();
         }
     } catch (...) { // nor of this
-    }
-}
-
-void Channel::Impl::updateLostCounts()
-{
-    const std::lock_guard lock(handlerMutex);
-    if (handler != nullptr &&
-        keepsLost) { // the sum under the lock, or an older one could come later
-        auto property = plugin::makeScalar(lostName, input->impl->queue.getLost());
-        handler->onPropertyUpdate(property.get());
-        property.release();
-    }
-}
-
-void Channel::Impl::keepReason(const std::string& reason) noexcept
-{
-    if (std::exchange(raised, nullptr) == std::current_exception()) {
-        return; // it is kept already
-    }
-    if (!keepsReason) {
-        return;
-    }
-    try {
-        constexpr std::size_t most = 1023; // what a buffer for the message of an error takes
-        auto property = plugin::makeScalar(reasonName, std::string(reason.c_str()).substr(0, most));
-        const std::lock_guard lock(handlerMutex);
-        if (handler != nullptr) {
-            handler->onPropertyUpdate(property.get());
-            property.release();
-        }
-    } catch (...) { // memory is out, which needs no further reason
     }
 }
 

@@ -22,6 +22,10 @@
 namespace brenixcore
 {
 
+// The core's own properties.
+constexpr const char* reasonName = "Reason";   ///< why the last operation that failed did so
+constexpr const char* lostName = "LostCounts"; ///< of the input stream, since open
+
 /// The core's own options; what is not given is nothing.
 struct CoreOptions {
     /// Takes them out of the map.

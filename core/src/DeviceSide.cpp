@@ -2,6 +2,7 @@
 
 #include "Channel.hpp"
 #include "Packets.hpp"
+#include "brenixcore/plugin/Make.hpp"
 
 #include <stdexcept>
 #include <utility>
@@ -77,6 +78,37 @@ void Channel::Impl::tellLoss(const Tell& tell) noexcept
                   "Counts were lost, and there is no memory to tell how many.");
         }
     } catch (...) { // the handler threw
+    }
+}
+
+void Channel::Impl::updateLostCounts()
+{
+    const std::lock_guard lock(handlerMutex);
+    if (handler != nullptr &&
+        keepsLost) { // the sum under the lock, or an older one could come later
+        auto property = plugin::makeScalar(lostName, input->impl->queue.getLost());
+        handler->onPropertyUpdate(property.get());
+        property.release();
+    }
+}
+
+void Channel::Impl::keepReason(const std::string& reason) noexcept
+{
+    if (std::exchange(raised, nullptr) == std::current_exception()) {
+        return; // it is kept already
+    }
+    if (!keepsReason) {
+        return;
+    }
+    try {
+        constexpr std::size_t most = 1023; // what a buffer for the message of an error takes
+        auto property = plugin::makeScalar(reasonName, std::string(reason.c_str()).substr(0, most));
+        const std::lock_guard lock(handlerMutex);
+        if (handler != nullptr) {
+            handler->onPropertyUpdate(property.get());
+            property.release();
+        }
+    } catch (...) { // memory is out, which needs no further reason
     }
 }
 

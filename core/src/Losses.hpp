@@ -66,12 +66,11 @@ public:
         news = true;
     }
 
-    /// The gaps that ended and are not told yet; then there is nothing new but them.
-    const std::vector<Gap>& takeNews()
-    {
-        news = false;
-        return ended;
-    }
+    /// The gaps that ended and are not told yet.
+    const std::vector<Gap>& getEnded() const { return ended; }
+
+    /// Whether the sum is to be told.
+    void setNews(bool isNew) { news = isNew; }
 
     /// The first of them is told.
     void forgetGap() { ended.erase(ended.begin()); }

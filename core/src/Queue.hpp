@@ -92,7 +92,10 @@ public:
     /// losses.
     std::optional<std::vector<Gap>> takeNews(bool atEnd);
 
-    /// The first of them is told.
+    /// The sum could not be told.
+    void keepNews();
+
+    /// The first of the gaps is told.
     void forgetGap();
 
     /// Lost since open.

@@ -57,7 +57,12 @@ void Stream::Impl::tellLosses(bool atEnd)
     if (!gaps) {
         return;
     }
-    reporter.updateLostCounts();
+    try {
+        reporter.updateLostCounts();
+    } catch (...) {
+        queue.keepNews();
+        throw;
+    }
     for (const Gap& gap : *gaps) {
         const std::string message = std::to_string(gap.counts) +
                                     " counts were lost: " + gap.reason.data() + "; " +
