@@ -3,7 +3,7 @@
 #include <cstdlib>
 #include <new>
 
-std::size_t allocations = 0;
+thread_local std::size_t allocations = 0;
 
 // NOLINTBEGIN(cppcoreguidelines-no-malloc): these are the allocation functions
 // Not inline: GCC would see memory of operator new go to free.

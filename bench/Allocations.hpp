@@ -4,6 +4,6 @@
 
 #include <cstddef>
 
-extern std::size_t allocations; ///< calls of operator new so far
+extern thread_local std::size_t allocations; ///< calls of operator new so far, of this thread
 
 #endif

@@ -1,6 +1,7 @@
 // Data through the whole library, and through its peers, side by side. Run it on one processor and on
 // two: what two threads on two processors take depends on where the machine has put them.
 
+#include "Allocations.hpp"
 #include "Peers.hpp"
 
 #include <benchmark/benchmark.h>
@@ -69,6 +70,27 @@ void addPeers(const std::string& row, std::size_t elements, std::size_t inFlight
     add<Pipe>(row + "/pipe", elements, inFlight);
 }
 
+/// What the library and the core together allocate for a written buffer.
+void writeAllocations(State& state)
+{
+    const OpenChannel channel;
+    coderChannelClose(channel.handle); // so that nobody takes it
+    void* const output = coderChannelGetOutputStream(channel.handle);
+    const double element = 1;
+    const auto write = [&] {
+        double written = 0;
+        require(coderOutputStreamWriteTypedDataOld(output, &written, 1, "double",
+                                                   CODER_BUFFER(1, &element)) == 1,
+                "loopback: no room");
+    };
+    write(); // makes room for some
+    for (auto _ : state) {
+        const std::size_t before = allocations;
+        write();
+        state.counters["allocations"] = static_cast<double>(allocations - before);
+    }
+}
+
 /// Pages of the process that are in memory.
 double residentBytes()
 {
@@ -115,6 +137,7 @@ int main(int argc, char** argv)
     constexpr std::size_t batch = 64;
     add<Loopback<batch>>("echo/64x64/ours", 64 / sizeof(double), 16, batch);
     addPeers("echo/64x64", 64 / sizeof(double), 16 * batch);
+    benchmark::RegisterBenchmark("write/allocations", writeAllocations)->Iterations(1);
     benchmark::RegisterBenchmark("channel/cycle", cycle)->UseRealTime();
     benchmark::RegisterBenchmark("channel/idle", idle)->UseRealTime()->Iterations(1);
 

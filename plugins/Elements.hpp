@@ -148,8 +148,8 @@ inline Format readFormat(Options& options)
     return {found, isBig != (std::endian::native == std::endian::big)};
 }
 
-/// Makes packets of whole elements from bytes that arrive in pieces. They arrive in the array that is delivered,
-/// unless that would be mostly empty.
+/// Makes packets of whole elements from bytes that arrive in pieces. They arrive in the array that is
+/// delivered, unless that would be mostly empty.
 class Assembler
 {
 public:

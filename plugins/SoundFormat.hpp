@@ -93,8 +93,8 @@ inline int containerOf(const std::string& fileName)
     return 0;
 }
 
-/// The options SampleRate, Channels and SampleFormat as the format of a file whose ending names its container.
-/// They have defaults, or else must be given. Throws what Options does.
+/// The options SampleRate, Channels and SampleFormat as the format of a file whose ending names its
+/// container. They have defaults, or else must be given. Throws what Options does.
 inline SF_INFO formatOptions(brenixcore::plugin::Options& options, const std::string& fileName,
                              bool hasDefaults)
 {

@@ -202,8 +202,7 @@ TEST(StreamTest, EveryWaitEnds)
     EXPECT_EQ(slow.asyncError(), "brenix:Device:failed|failed in run");
     EXPECT_EQ(slow.close(), 1);
     EXPECT_EQ(slow.asyncError(),
-              "brenix:Stream:dataLost|The device ended and did not take 3 counts: "
-              "failed in run");
+              "brenix:Device:failed|The device ended and did not take 3 counts: failed in run");
     EXPECT_EQ(slow.ask(coderStreamGetDataAvailable, slow.output), 0);
 
     Channel full(probe, 1); // the device waits for room, and close ends it

@@ -154,6 +154,11 @@ TEST(LossTest, EachPolicyKeepsWhatItSaysAndTellsEachGapOnce)
         {"dropOldest", 7, "p3 p3 k4 p5", "0:3 3:3 10:1 ", {{{4, 4}, full}}},
         {"dropOldest", 7, "p7 k7 p3 r7 p7 p1", "0:7 11:6 17:1 ", {{{4, 4}, full}}}, // one gap
         {"dropOldest", 7, "p3 p3 k3 p5 k4 p2", "0:3 7:4 ", {{{4, 4}, full}, {{2, 6}, full}}},
+        {"dropOldest",
+         7,
+         "p1 p1 p1 p1 p1 p1 p1 k3 p1 p1 p1 p1 p1 p1 p1 p1 p1 p1 p1 p1 p1 r1 k3 p1 p1",
+         "0:1 1:1 2:1 16:1 18:1 19:1 20:1 21:1 ",
+         {{{13, 13}, full}, {{1, 14}, full}}},
         {"wait", 7, "l2 p3 p1", "2:3 5:1 ", {{{2, 2}, device}}},
         {"wait", 7, "p3 t4 t1 l2 p1", "0:3 10:1 ", {{{7, 7}, "it was told"}}}, // one gap
         {"wait", 7, "p3 t4 p1 l2", "0:3 7:1 ", {{{4, 4}, "it was told"}}},

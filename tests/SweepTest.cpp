@@ -37,6 +37,7 @@ bool isOutOfMemory(const std::string& error)
         "brenix:Stream:filterFailed|std::bad_alloc",
     };
     return std::find(std::begin(errors), std::end(errors), error) != std::end(errors) ||
+           error.rfind("brenix:Device:failed|The device ended and did not take ", 0) == 0 ||
            error.rfind("brenix:Stream:dataLost|", 0) == 0; // of a device that failed so
 }
 

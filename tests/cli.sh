@@ -169,7 +169,7 @@ while IFS='|' read -r columns keys shown arguments; do
     {
         while ! grep -qs $'\e\[J' terminal; do sleep 0.1; done
         printf '%b' "$keys"
-    } | timeout -k 5 20 script -qefc "stty rows 24 cols $columns; stty -g >before
+    } | timeout -k 5 20 script -qefc "trap : INT; stty rows 24 cols $columns; stty -g >before
         brenix scope signal $arguments && stty -g | cmp before -" terminal >/dev/null || got=$?
     if [[ $got -ne 0 ]] || ! grep -qF "$shown" terminal || grep -qE 'xy|\^C' terminal ||
         ! awk 'BEGIN { RS = "\033\\[J" } lines > 24 { exit 1 } { lines = gsub("\n", "") }' terminal; then

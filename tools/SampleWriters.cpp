@@ -56,6 +56,9 @@ OwnedFile openOutput(const SampleFile& file)
 /// The elements of all fields, row by row.
 Bytes interleave(const std::vector<Field>& fields, std::size_t counts)
 {
+    if (fields.size() == 1) {
+        return fields[0].elements;
+    }
     Bytes rows(rowSize(fields) * counts);
     unsigned char* next = rows.data();
     for (std::size_t row = 0; row < counts; ++row) {
@@ -94,7 +97,9 @@ public:
     void write(const std::vector<Field>& fields, std::size_t counts) override
     {
         if (!csv) {
-            const Bytes rows = interleave(fields, counts);
+            Bytes several;
+            const Bytes& rows =
+                fields.size() == 1 ? fields[0].elements : several = interleave(fields, counts);
             put(rows.data(), rows.size());
             return;
         }

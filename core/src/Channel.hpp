@@ -104,14 +104,14 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : Reporter, plugin::DeviceStreams
     LoadedPlugin<plugin::Device> device;
     const Trace trace;
 
-    std::mutex handlerMutex; ///< held during each call of the handler; guards these two
+    std::mutex handlerMutex; ///< held during each call of the handler; guards these three
     IEventHandler* handler;  ///< null once the channel is being destroyed
     std::set<std::string, std::less<>> propertyNames; ///< that init delivered
+    std::exception_ptr raised; ///< by which the device's error leaves the operation that runs
 
     // Of the caller's thread; what the device's thread uses of it stays while the channel is open.
-    bool keepsLost = false;    ///< once init has delivered the property of lost counts
-    bool keepsReason = false;  ///< and that of the reason
-    std::exception_ptr raised; ///< by which the device's error leaves the operation that runs
+    bool keepsLost = false;   ///< once init has delivered the property of lost counts
+    bool keepsReason = false; ///< and that of the reason
     State state = State::Created;
     std::unique_ptr<InputStream> input;
     std::unique_ptr<OutputStream> output;

@@ -53,6 +53,7 @@ void Channel::Impl::raise(const char* name, const char* identifier, const char* 
         }
     } catch (...) { // it is to leave the operation that runs on this thread
         keepReason(message);
+        const std::lock_guard lock(handlerMutex);
         raised = std::current_exception();
         throw;
     }
@@ -94,13 +95,16 @@ void Channel::Impl::updateLostCounts()
 
 void Channel::Impl::keepReason(const std::string& reason) noexcept
 {
-    if (std::exchange(raised, nullptr) == std::current_exception()) {
-        return; // it is kept already
-    }
-    if (!keepsReason) {
-        return;
-    }
     try {
+        {
+            const std::lock_guard lock(handlerMutex);
+            if (std::exchange(raised, nullptr) == std::current_exception()) {
+                return; // it is kept already
+            }
+        }
+        if (!keepsReason) {
+            return;
+        }
         constexpr std::size_t most = 1023; // what a buffer for the message of an error takes
         auto property = plugin::makeScalar(reasonName, std::string(reason.c_str()).substr(0, most));
         const std::lock_guard lock(handlerMutex);
@@ -224,11 +228,13 @@ void Channel::Impl::runDevice() noexcept
     refuseOutput();
     const std::uint64_t left = output ? output->impl->queue.discardRest() : 0;
     if (left > 0) {
+        // cppcheck-suppress throwInNoexceptFunction ; tellLoss() catches it
         tellLoss([&] {
             const std::string message = "The device ended and did not take " +
                                         std::to_string(left) + " counts" +
                                         (failure.empty() ? "." : ": " + failure);
-            raise("error", "brenix:Stream:dataLost", message.c_str());
+            raise("error", failure.empty() ? "brenix:Stream:dataLost" : "brenix:Device:failed",
+                  message.c_str());
         });
     }
 }

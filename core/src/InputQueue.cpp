@@ -99,7 +99,7 @@ void Queue::dropPending()
             lost += part;
             return part;
         };
-        const std::size_t oldest = behindListed();
+        const std::size_t oldest = listed; // those the caller will want to read as it saw them
         while (lost < more && oldest < packets.size()) {
             change(-loseFrom(packets[oldest]));
             if (packets[oldest].counts() == 0) {
@@ -122,15 +122,6 @@ void Queue::dropPending()
         losses.addAtEnd(pending->counts(), reason);
         pending.reset();
     }
-}
-
-std::size_t Queue::behindListed() const
-{
-    std::size_t i = 0;
-    for (std::uint64_t seen = 0; seen < listed && i < packets.size(); ++i) {
-        seen += packets[i].counts();
-    }
-    return i;
 }
 
 void Queue::passGap(const QueuedPacket& packet, std::uint64_t count)
@@ -192,7 +183,6 @@ Queue::Packets Queue::take(std::uint64_t count)
     if (!taken.empty()) {
         inHand = positionOf(taken[0]);
         passGap(taken.back(), taken.back().counts());
-        listed -= std::min(listed, count);
     }
     lock.unlock();
     changed.notify_all(); // settle() wakes the device
@@ -217,6 +207,7 @@ Queue::Packets Queue::takeAvailable(std::uint64_t count)
     result.reserve(length);
     packets.reserve(2); // for both ends are put back even where they were divided
     held = length;
+    const std::size_t before = packets.size();
     try {
         for (std::uint64_t missing = count; missing > 0;) {
             QueuedPacket& front = packets[0];
@@ -237,6 +228,7 @@ Queue::Packets Queue::takeAvailable(std::uint64_t count)
         putBackLocked(result);
         throw;
     }
+    listed -= std::min(listed, before - packets.size());
     return result;
 }
 
@@ -259,14 +251,15 @@ void Queue::list(std::uint64_t most, std::uint64_t& total, std::vector<unsigned 
     const std::lock_guard guard(mutex);
     total = 0;
     each.reserve(std::min<std::uint64_t>(packets.size(), most));
-    for (std::size_t i = 0; i < packets.size() && total < most; ++i) {
+    std::size_t i = 0;
+    for (; i < packets.size() && total < most; ++i) {
         each.push_back(std::min(most - total, packets[i].counts()));
         total += each.back();
         if (overflow == Overflow::DropOldest) {
             passGap(packets[i], each.back());
         }
     }
-    listed = total;
+    listed = i;
 }
 
 } // namespace brenixcore

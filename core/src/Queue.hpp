@@ -116,8 +116,8 @@ public:
     /// What was taken last is delivered or put back, and may be asked for by takenCounts().
     void settle() noexcept;
 
-    /// The counts of the packets that take() of `most` counts, or of all there are, would return. What was listed
-    /// last is not dropped before it is read.
+    /// The counts of the packets that take() of `most` counts, or of all there are, would return. What was
+    /// listed last is not dropped before it is read.
     void list(std::uint64_t most, std::uint64_t& total, std::vector<unsigned long>& each);
 
     /// Waits until there is room for so many counts, or throws SynchronousOutputNotPossible. Nobody but
@@ -180,9 +180,6 @@ private:
     /// lost. When it throws, it stays.
     void dropPending();
 
-    /// The first packet behind those that the caller has listed, and will want to read as it saw them.
-    std::size_t behindListed() const;
-
     /// The caller goes as far as to the end of so many counts of a packet.
     void passGap(const QueuedPacket& packet, std::uint64_t count);
 
@@ -211,10 +208,10 @@ private:
     std::size_t held = 0;                ///< places for packets that may be put back
     std::optional<QueuedPacket> pending; ///< brought by the device, which then waits for room
     std::uint64_t wanted = 0;            ///< counts that a read is waiting for
-    std::uint64_t listed = 0;            ///< counts that were listed and not read since
-    std::uint64_t gapEnd = 0;            ///< the position behind what was dropped last
-    unsigned sleeps = 0;                 ///< so many waits to come do not give way
-    unsigned caution = 16;               ///< and so many after the next time that this takes long
+    std::size_t listed = 0;   ///< packets at the front that were listed and not read since
+    std::uint64_t gapEnd = 0; ///< the position behind what was dropped last
+    unsigned sleeps = 0;      ///< so many waits to come do not give way
+    unsigned caution = 16;    ///< and so many after the next time that this takes long
 
     std::uint32_t opening = 0;  ///< the number of this one
     std::uint64_t numbered = 0; ///< counts since open, lost ones included
