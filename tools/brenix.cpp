@@ -6,6 +6,8 @@
 #include <CLI/CLI.hpp>
 #include <nlohmann/json.hpp>
 
+#include <malloc.h>
+
 #include <algorithm>
 #include <array>
 #include <cmath>
@@ -240,6 +242,11 @@ int main(int count, char** arguments)
         std::find(arguments, arguments + count, std::string_view("--json")) != arguments + count;
     try {
         catchInterrupts();
+        // Blocks are allocated in one thread and freed in another: what is free stays at hand.
+        // NOLINTBEGIN(concurrency-mt-unsafe): there is one thread yet
+        mallopt(M_MMAP_THRESHOLD, 32 << 20);
+        mallopt(M_TRIM_THRESHOLD, 64 << 20);
+        // NOLINTEND(concurrency-mt-unsafe)
         std::ios::sync_with_stdio(false);
         return run(settings, count, arguments);
     } catch (const std::invalid_argument& error) {
