@@ -50,6 +50,7 @@ OwnedFile openOutput(const SampleFile& file)
         errno = descriptor == -1 ? errno : EBADF; // it is closed, or for input
         failAsErrno(file.outputName());
     }
+    std::setvbuf(output.get(), nullptr, _IONBF, 0); // what is written is large
     return output;
 }
 

@@ -156,7 +156,8 @@ std::size_t Reading::next()
 {
     // Asked before: a device that is done adds nothing to what is then there.
     const bool deviceDone = channel.isDone(channel.inputStream());
-    const double ready = channel.nextBuffer(std::min(mostCounts - counts, 65536.0));
+    constexpr double mostOfBuffer = 1 << 18; // packets beyond that are divided, which copies them
+    const double ready = channel.nextBuffer(std::min(mostCounts - counts, mostOfBuffer));
     if (ready == 0) {
         done = deviceDone;
         if (!done) {
