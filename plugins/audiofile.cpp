@@ -177,9 +177,9 @@ private:
     /// Throws when a file that ends after so many frames should have had more.
     void requireEnd(sf_count_t delivered) const
     {
-        if (delivered < format.frames && format.frames != SF_COUNT_MAX) {
-            throw std::runtime_error(fileName + " ends after " + std::to_string(delivered) +
-                                     " of its " + std::to_string(format.frames) + " frames.");
+        if (const std::string missing = missingAtEnd(input.get(), format, delivered);
+            !missing.empty()) {
+            throw std::runtime_error(fileName + ": " + missing + ".");
         }
         const std::uint64_t size =
             sampleSize(format.format) * static_cast<std::uint64_t>(format.channels);

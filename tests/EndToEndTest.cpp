@@ -705,7 +705,8 @@ TEST(AudioFileTest, LostSamplesAreTold)
     } rows[] = {{".wav", "PCM_16", " 5974 samples were not taken.", nullptr},
                 {".flac", "PCM_16", " 4000 samples were not taken.", nullptr},
                 {".ogg", "VORBIS", nullptr, nullptr},
-                {".mp3", "MPEG_LAYER_III", nullptr, " of its 8000 frames."},
+                {".mp3", "MPEG_LAYER_III", nullptr, " of 8000 frames."},
+                {".wav", "PCM_16", nullptr, "it ends after 5326 of 8000 frames."},
                 {".flac", "PCM_16", nullptr, "Error : flac decoder lost sync."}};
     for (const auto& [ending, format, lost, cut] : rows) {
         SCOPED_TRACE(ending);
