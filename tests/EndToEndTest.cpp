@@ -787,6 +787,7 @@ TEST(OptionsTest, BadOnesAreNamed)
         {"udp", {"BlockSize", 1}, "BlockSize: is not known."},
         {"udp", {"Group", "10.0.0.1"}, "Group: is not the address of a group: 10.0.0.1."},
         {"udp", {"Group", "ff15::1"}, "Group: is not of the IP version of LocalHost."},
+        {"udp", {"LocalHost", "ff02::1"}, "Interface: is required: each link has its own ff02::1."},
         {"udp",
          {"Interface", "lo"},
          "Interface: is for multicast: neither Group nor Host is a group."},
