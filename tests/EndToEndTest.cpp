@@ -668,12 +668,16 @@ TEST(AudioFileTest, SamplesOfManyTypesInAFileWithoutHeader)
         EXPECT_EQ(written, values.size());
     };
     write("int64", std::vector<int64_t>{1, 2, 3});
+    EXPECT_EQ(channel.asyncError().rfind("brenix:Device:wrongType|3 counts", 0), 0U);
     write("int16", std::vector<int16_t>{-32768, 16384});
     write("int64", std::vector<int64_t>{1});
     write("float", std::vector{0.25F});
-    EXPECT_EQ(channel.write({1e6, -1e6, std::nan("")}), 3);
+    EXPECT_EQ(channel.write({1e6, -1e6, std::nan(""), 0}), 4);
     EXPECT_EQ(channel.close(), 1);
-    EXPECT_EQ(channel.asyncError(), "brenix:Device:wrongType|4 counts were not written to " + file +
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|The last frame for " + file +
+                                        " has 1 of 2 samples and was not written. 4 counts were "
+                                        "not written to " +
+                                        file +
                                         ": samples must be double, float, int8, int16 or int32.");
     std::ofstream(file, std::ios::app) << "e";
     channel.start(
