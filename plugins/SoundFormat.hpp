@@ -60,6 +60,34 @@ inline std::uint64_t sampleSize(int format)
     return 0;
 }
 
+/// What a sound file lacks of which so many frames were read to the end; empty when it lacks nothing. A huge
+/// length stands for one that is not known.
+inline std::string missingAtEnd(SNDFILE* sound, const SF_INFO& info, sf_count_t frames)
+{
+    const int container = info.format & SF_FORMAT_TYPEMASK;
+    sf_count_t all = info.frames;
+    if (container == SF_FORMAT_WAV || container == SF_FORMAT_WAVEX) {
+        // Of a file that was cut, libsndfile counts what is there.
+        const auto frameSize = static_cast<sf_count_t>(sampleSize(info.format)) * info.channels;
+        SF_CHUNK_INFO data{"data", 4, 0, nullptr};
+        SF_CHUNK_ITERATOR* const chunk = sf_get_chunk_iterator(sound, &data);
+        if (frameSize == 0 || chunk == nullptr ||
+            sf_get_chunk_size(chunk, &data) != SF_ERR_NO_ERROR || data.datalen >= 0x7FFFF000) {
+            return "";
+        }
+        all = data.datalen / frameSize;
+        if (const sf_count_t torn = data.datalen % frameSize; torn > 0 && frames == all) {
+            return "the last frame has " + std::to_string(torn) + " of " +
+                   std::to_string(frameSize) + " bytes";
+        }
+    }
+    // An empty AIFF file has some frames for libsndfile.
+    return frames < all && all < 1L << 40 && container != SF_FORMAT_AIFF
+               ? "it ends after " + std::to_string(frames) + " of " + std::to_string(all) +
+                     " frames"
+               : "";
+}
+
 /// The container format of a file name's ending; 0 when there is none for it. SD2 is none: its header is a
 /// file of its own.
 inline int containerOf(const std::string& fileName)

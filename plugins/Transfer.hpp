@@ -244,6 +244,19 @@ private:
         }
     }
 
+    /// Takes what is left in the output stream, so that one error tells all. Returns the number of bytes.
+    std::uint64_t takeLeft()
+    {
+        std::uint64_t left = 0;
+        if (device.sends) {
+            streams.refuseOutput();
+            while (const auto packet = streams.tryPull()) {
+                left += packet->counts * device.format.type->size;
+            }
+        }
+        return left;
+    }
+
     /// After all has stopped: says what failed, and what is lost.
     void finish()
     {
@@ -257,7 +270,7 @@ private:
             streams.tellLost(noRoom, nullptr);
         }
         if (!outputEnded) {
-            losses.addUnsent(unsent.size() + device.queuedBySystem(),
+            losses.addUnsent(unsent.size() + device.queuedBySystem() + (failure ? 0 : takeLeft()),
                              failure ? "" : "the other side does not take them");
             device.abandonOutput();
         }
@@ -266,6 +279,7 @@ private:
             throw std::runtime_error(losses.with("Transfer with " + device.peer +
                                                  " failed: " + failure.message() + "."));
         }
+        streams.endInput(); // what the core tells of it would hide the error below
         tellLosses();
     }
 

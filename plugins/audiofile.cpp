@@ -177,9 +177,9 @@ private:
     /// Throws when a file that ends after so many frames should have had more.
     void requireEnd(sf_count_t delivered) const
     {
-        if (delivered < format.frames && format.frames != SF_COUNT_MAX) {
-            throw std::runtime_error(fileName + " ends after " + std::to_string(delivered) +
-                                     " of its " + std::to_string(format.frames) + " frames.");
+        if (const std::string missing = missingAtEnd(input.get(), format, delivered);
+            !missing.empty()) {
+            throw std::runtime_error(fileName + ": " + missing + ".");
         }
         const std::uint64_t size =
             sampleSize(format.format) * static_cast<std::uint64_t>(format.channels);
@@ -198,22 +198,22 @@ private:
         const auto channels = static_cast<std::uint64_t>(format.channels);
         std::vector<double> samples; // a frame may be spread over packets
         std::uint64_t refused = 0;
+        std::string besides; // which each further error tells, too: only the last is kept
         while (auto packet = streams.pull()) {
             const auto data = takeField(*packet, dataField);
             AppendSamples append{samples, clips};
             visitNumbers(data.get(), append);
             if (!append.known) {
                 refused += packet->counts;
-                const std::string message =
-                    std::to_string(refused) + " counts were not written to " + fileName +
-                    ": samples must be double, float, int8, int16 or int32.";
-                deviceHost->raise("error", "brenix:Device:wrongType", message.c_str());
+                besides = ' ' + std::to_string(refused) + " counts were not written to " +
+                          fileName + ": samples must be double, float, int8, int16 or int32.";
+                deviceHost->raise("error", "brenix:Device:wrongType", besides.c_str() + 1);
                 continue;
             }
             const auto frames = static_cast<sf_count_t>(samples.size() / channels);
             if (!encoderHasRoom(samples.size())) {
                 failToWrite(streams, "no space left for the encoder's temporary file",
-                            samples.size());
+                            samples.size(), besides);
             }
             const sf_count_t written = sf_writef_double(output->get(), samples.data(), frames);
             framesWritten += written;
@@ -221,13 +221,13 @@ private:
                           samples.begin() + static_cast<std::ptrdiff_t>(written) *
                                                 static_cast<std::ptrdiff_t>(channels));
             if (const std::string error = output->error(); written != frames || !error.empty()) {
-                failToWrite(streams, error, samples.size());
+                failToWrite(streams, error, samples.size(), besides);
             }
         }
         if (!samples.empty()) {
-            throw std::runtime_error("The last frame for " + fileName + " has " +
-                                     std::to_string(samples.size()) + " of " +
-                                     std::to_string(channels) + " samples and was not written.");
+            throw std::runtime_error(
+                "The last frame for " + fileName + " has " + std::to_string(samples.size()) +
+                " of " + std::to_string(channels) + " samples and was not written." + besides);
         }
     }
 
@@ -245,9 +245,10 @@ private:
         return space.available >= reserve + samples * sizeof(std::int32_t);
     }
 
-    /// Takes what is left of the output and tells how much it was, with so many samples before it.
+    /// Takes what is left of the output and tells how much it was, with so many samples before it, and what
+    /// else was lost.
     [[noreturn]] void failToWrite(DeviceStreams& streams, const std::string& error,
-                                  std::uint64_t lost) const
+                                  std::uint64_t lost, const std::string& besides) const
     {
         streams.refuseOutput();
         while (const auto packet = streams.tryPull()) {
@@ -255,7 +256,7 @@ private:
         }
         throw std::runtime_error(
             "Could not write " + fileName + (error.empty() ? "." : ": " + error + ".") +
-            (lost > 0 ? " " + std::to_string(lost) + " samples were not taken." : ""));
+            (lost > 0 ? " " + std::to_string(lost) + " samples were not taken." : "") + besides);
     }
 
     struct CloseFile {

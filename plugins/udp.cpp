@@ -87,6 +87,15 @@ public:
             }
             settings.interface = findInterface(*interface);
         }
+        if (const auto local = settings.local.address();
+            local.is_v6() && local.to_v6().is_multicast_link_local()) {
+            if (!interface) {
+                Options::fail("Interface",
+                              "is required: each link has its own " + local.to_string());
+            }
+            settings.local.address(
+                asio::ip::address_v6(local.to_v6().to_bytes(), settings.interface));
+        }
         port.open(settings);
 
         lost = lostEarlier = dropped = 0;

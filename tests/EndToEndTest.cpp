@@ -668,12 +668,16 @@ TEST(AudioFileTest, SamplesOfManyTypesInAFileWithoutHeader)
         EXPECT_EQ(written, values.size());
     };
     write("int64", std::vector<int64_t>{1, 2, 3});
+    EXPECT_EQ(channel.asyncError().rfind("brenix:Device:wrongType|3 counts", 0), 0U);
     write("int16", std::vector<int16_t>{-32768, 16384});
     write("int64", std::vector<int64_t>{1});
     write("float", std::vector{0.25F});
-    EXPECT_EQ(channel.write({1e6, -1e6, std::nan("")}), 3);
+    EXPECT_EQ(channel.write({1e6, -1e6, std::nan(""), 0}), 4);
     EXPECT_EQ(channel.close(), 1);
-    EXPECT_EQ(channel.asyncError(), "brenix:Device:wrongType|4 counts were not written to " + file +
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|The last frame for " + file +
+                                        " has 1 of 2 samples and was not written. 4 counts were "
+                                        "not written to " +
+                                        file +
                                         ": samples must be double, float, int8, int16 or int32.");
     std::ofstream(file, std::ios::app) << "e";
     channel.start(
@@ -705,7 +709,8 @@ TEST(AudioFileTest, LostSamplesAreTold)
     } rows[] = {{".wav", "PCM_16", " 5974 samples were not taken.", nullptr},
                 {".flac", "PCM_16", " 4000 samples were not taken.", nullptr},
                 {".ogg", "VORBIS", nullptr, nullptr},
-                {".mp3", "MPEG_LAYER_III", nullptr, " of its 8000 frames."},
+                {".mp3", "MPEG_LAYER_III", nullptr, " of 8000 frames."},
+                {".wav", "PCM_16", nullptr, "it ends after 5326 of 8000 frames."},
                 {".flac", "PCM_16", nullptr, "Error : flac decoder lost sync."}};
     for (const auto& [ending, format, lost, cut] : rows) {
         SCOPED_TRACE(ending);
@@ -786,6 +791,7 @@ TEST(OptionsTest, BadOnesAreNamed)
         {"udp", {"BlockSize", 1}, "BlockSize: is not known."},
         {"udp", {"Group", "10.0.0.1"}, "Group: is not the address of a group: 10.0.0.1."},
         {"udp", {"Group", "ff15::1"}, "Group: is not of the IP version of LocalHost."},
+        {"udp", {"LocalHost", "ff02::1"}, "Interface: is required: each link has its own ff02::1."},
         {"udp",
          {"Interface", "lo"},
          "Interface: is for multicast: neither Group nor Host is a group."},

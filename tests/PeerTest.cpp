@@ -337,8 +337,12 @@ TEST(TcpTest, PeersThatDoNotAnswer)
     EXPECT_EQ(second.open(), 0);
     EXPECT_NE(second.error().find(": Connection timed out"), npos);
     ASSERT_EQ(writeBytes(channel, std::string(20 << 20, 'x')), 1);
+    ASSERT_EQ(writeBytes(channel, std::string(90 << 20, 'x')),
+              1); // which the device does not get to
     EXPECT_EQ(channel.close(), 1);
-    EXPECT_NE(channel.asyncError().find(" bytes were not sent to localhost:"), npos);
+    const std::string error = channel.asyncError();
+    EXPECT_NE(error.find(" bytes were not sent to localhost:"), npos) << error;
+    EXPECT_GT(std::strtol(error.c_str() + error.find('|') + 1, nullptr, 10), 90 << 20) << error;
 }
 
 TEST(UdpTest, DatagramsArePackets)

@@ -109,6 +109,7 @@ done <<END
 1|incomplete.wav: the last frame has 2 of 3 bytes|write loopback -i incomplete.wav -n 5
 2|--block: 1048576 counts of 3000 columns are more than|write loopback -i wide.csv -b 1048576
 2|x.foo: the ending .foo names no format|read signal -n 1 -w x.foo
+1|none/x.csv: No such file or directory|read signal -n 1 -w none/x.csv
 2|x.foo: the ending .foo names no format|write loopback -i x.foo
 1|short.flac: 2 samples beyond full scale were cut off|read signal -n 8 -o Amplitude=1.1 -o Frequency=6000 -w short.flac
 0|"counts":8,|read audiofile -o FileName=short.flac --json -w short.TXT

@@ -93,11 +93,11 @@ pieces cpp docs/plugin-authors.md 2 >ticks.cpp
 pieces c docs/plugin-authors.md >show.c
 expect '*0 1 2 3 4 5 5 5 ' bash -e <(pieces sh docs/plugin-authors.md 1)
 rm build/clip.so
-expect 'brenix:Stream:couldNotLoadFilter: * (exit code 1)' env -C build ./try
+expect 'brenix:Stream:couldNotLoadFilter: Could not load *./clip.so* (exit code 1)' env -C build ./try
 pieces cmake docs/plugin-authors.md >>CMakeLists.txt
 expect '*
 1.5 2.5 3.5
-brenix:InputStream:synchronousInputNotPossible: 
+brenix:InputStream:synchronousInputNotPossible: Cannot read 3 counts: there are 1 and the device is done.
 device: brenix:Device:failed: broken.txt: no number after 1 lines.
 exit code 1
 brenix:Channel:unexpectedException: Option FileName: must be given.

@@ -221,7 +221,7 @@ void save(const Settings& settings, std::string_view program, Values values)
     }
     std::ofstream file(settings.emitC);
     if (!(file << fill(start, values) << fill(program, values)).flush()) {
-        throw Failure("", settings.emitC + ": cannot be written");
+        failAsErrno(settings.emitC);
     }
 }
 

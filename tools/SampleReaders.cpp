@@ -217,38 +217,14 @@ public:
             fail(name, sf_error_number(error));
         }
         if (count < rows && !isInterrupted()) {
-            requireAll();
+            if (const std::string missing = missingAtEnd(sound.get(), info, frames);
+                !missing.empty()) {
+                fail(name, missing);
+            }
         }
     }
 
 private:
-    /// At the end: whether it is that of the last frame. A huge length stands for one that is not known.
-    void requireAll()
-    {
-        const int container = info.format & SF_FORMAT_TYPEMASK;
-        sf_count_t all = info.frames;
-        if (container == SF_FORMAT_WAV || container == SF_FORMAT_WAVEX) {
-            // Of a file that was cut, libsndfile counts what is there.
-            const auto frameSize = static_cast<sf_count_t>(sampleSize(info.format) * columns);
-            SF_CHUNK_INFO data{"data", 4, 0, nullptr};
-            SF_CHUNK_ITERATOR* const chunk = sf_get_chunk_iterator(sound.get(), &data);
-            if (frameSize == 0 || chunk == nullptr ||
-                sf_get_chunk_size(chunk, &data) != SF_ERR_NO_ERROR || data.datalen >= 0x7FFFF000) {
-                return;
-            }
-            all = data.datalen / frameSize;
-            if (const sf_count_t torn = data.datalen % frameSize; torn > 0 && frames == all) {
-                fail(name, "the last frame has " + std::to_string(torn) + " of " +
-                               std::to_string(frameSize) + " bytes");
-            }
-        }
-        // An empty AIFF file has some frames for libsndfile.
-        if (frames < all && all < 1L << 40 && container != SF_FORMAT_AIFF) {
-            fail(name, "it ends after " + std::to_string(frames) + " of " + std::to_string(all) +
-                           " frames");
-        }
-    }
-
     SF_INFO info{};
     OwnedSound sound;
     sf_count_t frames = 0; ///< that were read

@@ -43,7 +43,9 @@ OwnedFile openOutput(const SampleFile& file)
             }
             std::this_thread::sleep_for(std::chrono::milliseconds(10));
         }
-        ::fcntl(descriptor, F_SETFL, 0); // from here on a write waits
+        if (descriptor != -1) {              // or else errno tells why
+            ::fcntl(descriptor, F_SETFL, 0); // from here on a write waits
+        }
     }
     OwnedFile output(descriptor == -1 ? nullptr : ::fdopen(descriptor, "wb"));
     if (!output) {

@@ -150,8 +150,8 @@ extern "C" {
  * @return a channel handle, to be released with coderChannelDestroy(); NULL on failure
  *
  * Errors, in the two buffers: the four load and create failures with an empty message, whose reason
- * `brenix check PLUGIN` finds, since there is no channel that could tell it; brenix:Channel:unexpectedException for anything else, such as a null
- * path.
+ * `brenix check PLUGIN` finds, since there is no channel that could tell it;
+ * brenix:Channel:unexpectedException for anything else, such as a null path.
  */
 CODER_API void* coderChannelCreate(const char* devicePath, const char* converterPath, char* errorId,
                                    char* errorMessage, double firstLimit,

@@ -49,6 +49,9 @@ int main(void)
         if (id[0] == '\0') { /* then a plug-in raised an error inside the call */
             coderChannelGetLastSyncError(channel, id, message);
         }
+        if (message[0] == '\0') { /* then the core may know why */
+            coderChannelGetPropertyValue(channel, "Reason", "char", CODER_ERROR_SIZE, message);
+        }
         fprintf(stderr, "%s: %s\n", id, message);
         coderChannelClose(channel); /* these two do nothing if there is nothing to do */
         coderChannelTerm(channel);
