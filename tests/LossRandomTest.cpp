@@ -65,6 +65,7 @@ private:
 
     void produce(DeviceStreams& streams)
     {
+        deviceStreams = &streams;
         while (!resting && !streams.isClosing() && budget > 0) {
             switch (devicePick(8)) {
             case 0: {
@@ -334,6 +335,9 @@ private:
             EXPECT_GT(beside, limit - std::min(limit, available));
             EXPECT_TRUE(available > 0 || limit == 0);
         }
+        if (available + beside == 0 && rig->channel.isOpen()) {
+            EXPECT_EQ(deviceStreams->takenCounts(), next);
+        }
         return available + beside;
     }
 
@@ -353,6 +357,7 @@ private:
     std::mt19937_64 random, deviceRandom;
     std::uint64_t limit = 0;
     Worker* device = nullptr;
+    DeviceStreams* deviceStreams = nullptr; ///< once the device has begun
     std::string overflow;
     bool isMixed = false;              ///< whether there is a filter
     std::atomic<bool> resting = false; ///< whether the device is to rest

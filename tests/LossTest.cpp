@@ -32,23 +32,6 @@ std::string timesOf(const std::vector<Buffer>& buffers)
     return text;
 }
 
-/// Refuses packets that begin with one of its numbers.
-struct Refusing : Identity {
-    explicit Refusing(Counts firstNumbers) : firsts(std::move(firstNumbers)) {}
-    void convertInput(Packet& packet) override
-    {
-        const auto& data = dynamic_cast<TPointerProperty<std::uint64_t>&>(
-            *brenixplugin::asProperty(packet.fields->at(dataField)));
-        for (const std::uint64_t first : firsts) {
-            if (*data.data == first) {
-                packet.counts = 1000; // which makes no difference
-                throw std::runtime_error("refused");
-            }
-        }
-    }
-    Counts firsts;
-};
-
 /// Does a script: pN pushes N counts, lN says that N were lost before the next packet, tN tells a loss of N,
 /// i0 ends the input, kN lists N counts, rN reads N counts, f0 flushes, eN says that there were N errors so far.
 /// Returns what was read, and then what is left.
@@ -209,32 +192,6 @@ TEST(LossTest, TheFailureThatEndsADeviceIsToldAfterWhatWasLost)
                                         "brenix:Device:failed|it broke"}));
 }
 
-TEST(LossTest, ReadersThatWaitGetTheirCountsInEveryMode)
-{
-    for (const char* const overflow : {"wait", "dropOldest", "dropNewest"}) {
-        SCOPED_TRACE(overflow);
-        auto* const device = new Worker({stream, std::nullopt});
-        Rig rig(device, 10);
-        rig.init(Rig::options(overflow));
-        rig.open();
-        std::atomic<bool> enough = false;
-        device->start([&](DeviceStreams& streams) { // packets of which the limit is no multiple
-            while (!enough) {
-                Packet packet;
-                number(packet, 0, 4);
-                streams.push(std::move(packet));
-            }
-        });
-        for (int i = 0; i < 20; ++i) {
-            EXPECT_EQ(rig.read(9).empty(), false);
-            EXPECT_EQ(rig.read(10).empty(), false);
-        }
-        enough = true;
-        rig.input->flush();
-        rig.channel.close();
-    }
-}
-
 TEST(LossTest, PartsOfPacketsHaveTheirOwnTimes)
 {
     struct Halving : Filter {
@@ -277,90 +234,6 @@ TEST(LossTest, PartsOfPacketsHaveTheirOwnTimes)
         EXPECT_EQ(times, row.times);
         rig.channel.close();
     }
-}
-
-TEST(LossTest, ThePositionNeverPassesWhatIsPutBack)
-{
-    // 10 packets of 2 counts, of which those with 4 and 12 cannot be converted.
-    auto* const device = new Worker({stream, std::nullopt});
-    Rig rig(device, 30, new Refusing({4, 12}));
-    rig.init();
-    rig.open("", 0);
-    std::atomic<std::uint64_t> position = 0;
-    std::atomic<std::uint64_t> asked = 0;
-    device->start([&](DeviceStreams& streams) {
-        for (std::uint64_t first = 0; first < 20; first += 2) {
-            Packet packet;
-            number(packet, first, 2);
-            streams.push(std::move(packet));
-        }
-        streams.tellLost(5, "");
-        while (!streams.isClosing()) { // and is woken for each change
-            const unsigned wakes = device->wakes;
-            position = streams.takenCounts();
-            ++asked;
-            device->await([&] { return device->wakes != wakes; });
-        }
-    });
-    const auto positionIs = [&](std::uint64_t expected) {
-        for (int i = 0; i < 5000 && position != expected; ++i) {
-            std::this_thread::sleep_for(std::chrono::milliseconds(1));
-        }
-        EXPECT_EQ(position, expected);
-    };
-    while (asked == 0) {
-        std::this_thread::yield();
-    }
-    rig.read(1);
-    positionIs(1);
-    EXPECT_THROW(rig.read(6), brenixcore::CouldNotConvertInputData);
-    positionIs(1); // 1 to 3 were put back
-    EXPECT_EQ(rig.available(), 17);
-    rig.read(3);
-    positionIs(6);
-    EXPECT_THROW(rig.read(30), brenixcore::SynchronousInputNotPossible);
-    EXPECT_THROW(rig.read(14), brenixcore::CouldNotConvertInputData);
-    positionIs(6);
-    rig.input->flush();
-    positionIs(25);
-    EXPECT_EQ(rig.log.getLostCounts(), 9);
-    rig.channel.close();
-    EXPECT_EQ(rig.log.takeErrors(),
-              std::vector<std::string>{"brenix:Stream:dataLost|5 counts were lost: the device lost "
-                                       "them; 9 since open."});
-}
-
-TEST(LossTest, ReopeningStartsTheCountsAgainAndKeepsTheData)
-{
-    auto* const device = new Worker({stream, std::nullopt});
-    Rig rig(device, 4);
-    rig.init(Rig::options("wait", true));
-    const auto push = [&](std::uint64_t first, std::uint64_t lost, std::uint64_t taken) {
-        device->perform([&](DeviceStreams& streams) {
-            Packet packet;
-            packet.lost = lost;
-            number(packet, first, 3);
-            EXPECT_TRUE(streams.push(std::move(packet)));
-            EXPECT_EQ(streams.takenCounts(), taken);
-        });
-    };
-    rig.open();
-    push(0, 0, 0);
-    push(4, 1, 0); // waits beside the queue, also while the channel is closed
-    EXPECT_EQ(rig.log.getLostCounts(), 1);
-    rig.channel.close();
-    EXPECT_EQ(rig.available(), 3);
-    rig.open("dropNewest");
-    EXPECT_EQ(rig.log.getLostCounts(), 0);
-    push(2, 2, 0); // finds the queue full, as does what waited
-    EXPECT_EQ(rig.log.getLostCounts(), 8);
-    EXPECT_EQ(indicesOf(rig.read(2)), "0:2 ");
-    push(7, 2, 0);
-    EXPECT_EQ(indicesOf(rig.read(2)), "2:1 7:1 ");
-    device->perform([](DeviceStreams& streams) { EXPECT_EQ(streams.takenCounts(), 8); });
-    rig.channel.close();
-    EXPECT_EQ(indicesOf(rig.read(2)), "8:2 ");
-    EXPECT_EQ(rig.log.takeErrors().size(), 2);
 }
 
 TEST(LossTest, WithoutMemoryNothingIsLostUncounted)
