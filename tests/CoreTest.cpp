@@ -4,6 +4,7 @@
 #include "brenixcore/Converter.hpp"
 #include "brenixcore/Exceptions.hpp"
 #include "brenixcore/Stream.hpp"
+#include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Visit.hpp"
 #include "brenixplugin/Property.hpp"
 
@@ -14,7 +15,9 @@
 
 #include <filesystem>
 #include <fstream>
+#include <memory>
 #include <string>
+#include <vector>
 
 using namespace brenixcore;
 using brenixplugin::PropertyMap;
@@ -154,6 +157,31 @@ TEST(DataTest, MovesByPointerFromDeviceToCaller)
         brenixplugin::releaseProperties(properties);
     }
     EXPECT_FALSE(isLoaded(probe));
+}
+
+TEST(DataTest, WriteLeavesTheBuffersToTheCaller)
+{
+    using Array = brenixplugin::kit::coderconverter::TPointerProperty<double>;
+    Converter converter("identity");
+    Handler handler;
+    Channel channel(folder + "loopback.so", converter, handler, UINT64_MAX, UINT64_MAX);
+    PropertyMap properties;
+    channel.init({}, properties);
+    channel.open({});
+    const brenixplugin::OwnedDataBuffer written(new PropertyMap);
+    (*written)["data"] =
+        plugin::makeArray("data", std::unique_ptr<double[]>(new double[2]{3, 4}), 2).release();
+    EXPECT_EQ(channel.getOutputStream()->write({written.get(), written.get()}), 4);
+    std::vector<void*> buffers;
+    unsigned long read = 0;
+    channel.getInputStream()->read(4, buffers, read);
+    ASSERT_EQ(buffers.size(), 2);
+    for (void* const buffer : buffers) {
+        const brenixplugin::OwnedDataBuffer owned(static_cast<PropertyMap*>(buffer));
+        const auto& data = dynamic_cast<Array&>(*brenixplugin::asProperty(owned->at("data")));
+        EXPECT_EQ(std::vector(data.data, data.data + data.count), (std::vector<double>{3, 4}));
+    }
+    brenixplugin::releaseProperties(properties);
 }
 
 TEST(VisitTest, FindsTheClassOrOneItIsDerivedFrom)
