@@ -241,6 +241,7 @@ void Queue::putBack(Packets& taken) noexcept
     for (; !taken.empty(); taken.pop_back()) {
         change(taken.back().counts());
         packets.pushFront(std::move(taken.back()));
+        ++listed; // or it could be dropped, as what was not asked for
     }
 }
 

@@ -115,7 +115,7 @@ public:
     void settle(Packets& undelivered) noexcept;
 
     /// The counts of the packets that take() of `most` counts, or of all there are, would return. What was
-    /// listed last is not dropped before it is read.
+    /// listed last, or put back since, is not dropped before it is read.
     void list(std::uint64_t most, std::uint64_t& total, std::vector<unsigned long>& each);
 
     /// Waits until there is room for so many counts, or throws SynchronousOutputNotPossible. Nobody but
