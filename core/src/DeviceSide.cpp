@@ -120,7 +120,11 @@ void Channel::Impl::keepReason(const std::string& reason) noexcept
 
 bool Channel::Impl::push(plugin::Packet packet)
 {
-    return enter(packet, true);
+    const bool isTaken = enter(packet, true);
+    if (!isTaken) {
+        tellLost(packet.lost, lostByDevice); // of which the device can tell no more
+    }
+    return isTaken;
 }
 
 bool Channel::Impl::tryPush(plugin::Packet& packet)
