@@ -106,7 +106,7 @@ void Channel::Impl::keepReason(const std::string& reason) noexcept
             return;
         }
         constexpr std::size_t most = 1023; // what a buffer for the message of an error takes
-        auto property = plugin::makeScalar(reasonName, std::string(reason.c_str()).substr(0, most));
+        auto property = plugin::makeScalar(reasonName, reason.substr(0, most));
         const std::lock_guard lock(handlerMutex);
         if (handler != nullptr) {
             handler->onPropertyUpdate(property.get());
