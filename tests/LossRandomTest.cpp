@@ -114,6 +114,9 @@ private:
             isInPush = true;
             isTaken = streams.push(std::move(packet));
             isInPush = false;
+            if (!isTaken) { // but the gap before it counts
+                next = first;
+            }
         } else {
             isTaken = tryUntilRest(streams, packet);
         }

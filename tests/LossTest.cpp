@@ -32,6 +32,19 @@ std::string timesOf(const std::vector<Buffer>& buffers)
     return text;
 }
 
+/// Refuses packets that begin with 50.
+struct Refusing : Identity {
+    void convertInput(Packet& packet) override
+    {
+        const auto& data = dynamic_cast<TPointerProperty<std::uint64_t>&>(
+            *brenixplugin::asProperty(packet.fields->at(dataField)));
+        if (*data.data == 50) {
+            packet.counts = 1000; // which makes no difference
+            throw std::runtime_error("refused");
+        }
+    }
+};
+
 /// Does a script: pN pushes N counts, lN says that N were lost before the next packet, tN tells a loss of N,
 /// i0 ends the input, kN lists N counts, rN reads N counts, f0 flushes, eN says that there were N errors so far.
 /// Returns what was read, and then what is left.
@@ -45,8 +58,11 @@ public:
         std::istringstream words(script);
         std::vector<Buffer> all;
         const auto read = [&](std::uint64_t count) {
-            for (Buffer& buffer : rig.read(count)) {
-                all.push_back(std::move(buffer));
+            try {
+                for (Buffer& buffer : rig.read(count)) {
+                    all.push_back(std::move(buffer));
+                }
+            } catch (const brenixcore::CouldNotConvertInputData&) { // of the packet with 50
             }
         };
         char what = 0;
@@ -139,6 +155,11 @@ TEST(LossTest, EachPolicyKeepsWhatItSaysAndTellsEachGapOnce)
         {"dropOldest", 7, "p3 p3 k3 p5 k4 p2", "0:3 7:4 ", {{{4, 4}, full}, {{2, 6}, full}}},
         {"dropOldest",
          7,
+         "p3 t47 p3 k6 r6 p3 p3", // 50 is refused: what is put back is kept, too
+         "0:3 55:1 56:3 ",
+         {{{47, 47}, "it was told"}, {{2, 52}, full}}},
+        {"dropOldest",
+         7,
          "p1 p1 p1 p1 p1 p1 p1 k3 p1 p1 p1 p1 p1 p1 p1 p1 p1 p1 p1 p1 p1 r1 k3 p1 p1",
          "0:1 1:1 2:1 16:1 18:1 19:1 20:1 21:1 ",
          {{{13, 13}, full}, {{1, 14}, full}}},
@@ -153,7 +174,7 @@ TEST(LossTest, EachPolicyKeepsWhatItSaysAndTellsEachGapOnce)
     for (const auto& row : rows) {
         SCOPED_TRACE(std::string(row.overflow) + ": " + row.script);
         auto* const worker = new Worker({stream, std::nullopt});
-        Rig rig(worker, row.limit);
+        Rig rig(worker, row.limit, new Refusing);
         rig.init(Rig::options("", true));
         rig.open(row.overflow);
         Script script(rig, *worker);

@@ -80,9 +80,11 @@ template <typename Direction>
 std::unique_ptr<Direction> Channel::Impl::makeStream(const std::optional<plugin::StreamInfo>& info,
                                                      std::uint64_t limit)
 {
-    return info ? std::make_unique<Direction>(std::make_unique<Stream::Impl>(
-                      *device.object, converter, filterLibraries, *this, limit, *info))
-                : nullptr;
+    if (!info) {
+        return nullptr;
+    }
+    return std::make_unique<Direction>(std::make_unique<Stream::Impl>(
+        *device.object, converter, filterLibraries, *this, limit, *info));
 }
 
 void Channel::Impl::init(const PropertyMap& options, PropertyMap& properties)

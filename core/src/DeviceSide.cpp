@@ -4,7 +4,6 @@
 #include "Packets.hpp"
 #include "brenixcore/plugin/Make.hpp"
 
-#include <algorithm>
 #include <stdexcept>
 #include <utility>
 
@@ -107,8 +106,7 @@ void Channel::Impl::keepReason(const std::string& reason) noexcept
             return;
         }
         constexpr std::size_t most = 1023; // what a buffer for the message of an error takes
-        auto property =
-            plugin::makeScalar(reasonName, reason.substr(0, std::min(reason.find('\0'), most)));
+        auto property = plugin::makeScalar(reasonName, reason.substr(0, most));
         const std::lock_guard lock(handlerMutex);
         if (handler != nullptr) {
             handler->onPropertyUpdate(property.get());
@@ -122,7 +120,11 @@ void Channel::Impl::keepReason(const std::string& reason) noexcept
 
 bool Channel::Impl::push(plugin::Packet packet)
 {
-    return enter(packet, true);
+    const bool isTaken = enter(packet, true);
+    if (!isTaken) {
+        tellLost(packet.lost, lostByDevice); // of which the device can tell no more
+    }
+    return isTaken;
 }
 
 bool Channel::Impl::tryPush(plugin::Packet& packet)

@@ -176,7 +176,7 @@ Queue::Packets Queue::take(std::uint64_t count)
         refill();
     } catch (...) { // whatever has room now may be waited for
         wanted = 0;
-        putBackLocked(taken);
+        putBack(taken);
         notifyDevice(lock);
         throw;
     }
@@ -189,8 +189,12 @@ Queue::Packets Queue::take(std::uint64_t count)
     return taken;
 }
 
-void Queue::settle() noexcept
+void Queue::settle(Packets& undelivered) noexcept
 {
+    if (!undelivered.empty()) {
+        const std::lock_guard guard(mutex);
+        putBack(undelivered);
+    }
     inHand = none;
     if (phase != Phase::Closed) { // which this thread alone changes
         device.wake();
@@ -225,25 +229,20 @@ Queue::Packets Queue::takeAvailable(std::uint64_t count)
             change(-part);
         }
     } catch (...) {
-        putBackLocked(result);
+        putBack(result);
         throw;
     }
     listed -= std::min(listed, before - packets.size());
     return result;
 }
 
-void Queue::putBackLocked(Packets& taken) noexcept
+void Queue::putBack(Packets& taken) noexcept
 {
     for (; !taken.empty(); taken.pop_back()) {
         change(taken.back().counts());
         packets.pushFront(std::move(taken.back()));
+        ++listed; // or it could be dropped, as what was not asked for
     }
-}
-
-void Queue::putBack(Packets& taken) noexcept
-{
-    const std::lock_guard guard(mutex);
-    putBackLocked(taken);
 }
 
 void Queue::list(std::uint64_t most, std::uint64_t& total, std::vector<unsigned long>& each)

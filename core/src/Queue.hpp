@@ -110,14 +110,12 @@ public:
     /// Takes the `count` oldest counts: waits for them, or throws SynchronousInputNotPossible.
     Packets take(std::uint64_t count);
 
-    /// Puts packets that were taken last back in their place.
-    void putBack(Packets& taken) noexcept;
-
-    /// What was taken last is delivered or put back, and may be asked for by takenCounts().
-    void settle() noexcept;
+    /// Puts what is not delivered of the packets that were taken last back in its place. From here on
+    /// takenCounts() tells what is.
+    void settle(Packets& undelivered) noexcept;
 
     /// The counts of the packets that take() of `most` counts, or of all there are, would return. What was
-    /// listed last is not dropped before it is read.
+    /// listed last, or put back since, is not dropped before it is read.
     void list(std::uint64_t most, std::uint64_t& total, std::vector<unsigned long>& each);
 
     /// Waits until there is room for so many counts, or throws SynchronousOutputNotPossible. Nobody but
@@ -191,7 +189,7 @@ private:
 
     /// The number of the next count of a packet; 0 for one of an earlier opening.
     std::uint64_t positionOf(const QueuedPacket& packet) const;
-    void putBackLocked(Packets& taken) noexcept;
+    void putBack(Packets& taken) noexcept;
 
     /// Why a wait ended without what it waited for.
     const char* reason() const;

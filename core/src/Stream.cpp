@@ -192,13 +192,7 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
     Impl& stream = *impl;
     // Whatever is not delivered below goes back to where it was.
     struct Taken {
-        ~Taken()
-        {
-            if (!packets.empty()) {
-                queue.putBack(packets);
-            }
-            queue.settle();
-        }
+        ~Taken() { queue.settle(packets); }
         Queue& queue;
         Queue::Packets packets;
     };

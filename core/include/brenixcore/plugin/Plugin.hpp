@@ -54,7 +54,7 @@ public:
     /// Puts a packet of at least one count into the input stream, waiting while there is no room, unless the
     /// option Overflow says that counts are then lost. Its fields must be property objects of the classes of
     /// Visit.hpp. Returns false when the channel is closing and the packet was dropped: there is no room, or
-    /// no output left that it could answer.
+    /// no output left that it could answer. What was lost before it is told all the same.
     virtual bool push(Packet packet) = 0;
 
     /// Takes the next packet from the output stream, waiting for one. Returns nothing when the
@@ -88,8 +88,8 @@ public:
     virtual void tellLost(std::uint64_t counts, const char* reason) = 0;
 
     /// How far the caller has come with the input stream: all counts before this number, from open and lost
-    /// ones included, were read, flushed or lost. wake() tells when it changes. For a device that keeps
-    /// its place elsewhere.
+    /// ones included, were read, flushed or lost. wake() tells when the caller has changed it; a push() that
+    /// drops what has waited longest changes it, too. For a device that keeps its place elsewhere.
     virtual std::uint64_t takenCounts() const = 0;
 
 protected:
