@@ -4,6 +4,7 @@
 #include "brenixcoder/coder.h"
 
 #include <algorithm>
+#include <cmath>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -26,7 +27,7 @@ void requireFixedNumber(Field& field, std::size_t rows)
         for (std::size_t row = 1; row < rows; ++row) {
             if (field.step > 0 && (first != 0 || field.name != "Time")) { // 0 is no time
                 const std::int64_t value =
-                    first + static_cast<std::int64_t>(static_cast<double>(row) * field.step + 0.5);
+                    first + std::llround(static_cast<double>(row) * field.step);
                 std::memcpy(one.data(), &value, one.size());
             }
             field.elements.insert(field.elements.end(), one.begin(), one.end());

@@ -112,7 +112,7 @@ private:
 class Reading
 {
 public:
-    Reading(Channel& channel, const Settings& settings, double countRate);
+    Reading(Channel& openChannel, const Settings& settings, double signalRate);
 
     /// Reads the next buffer into `fields`. Returns its counts; 0 when none has come and, with
     /// isOver(), none will.
