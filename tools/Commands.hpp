@@ -76,7 +76,7 @@ struct PropertyValue {
 void emitInfo(const Settings& settings, const std::vector<PropertyValue>& properties,
               const std::string& fields);
 void emitRead(const Settings& settings, const std::vector<Field>& fields, double mostCounts,
-              double mostSeconds);
+              double mostSeconds, double mostListed);
 void emitWrite(const Settings& settings, const SampleReader& reader, bool hasInput,
                double mostCounts, double mostSeconds);
 
@@ -129,6 +129,7 @@ public:
     double getCounts() const { return counts; }
     double getMostCounts() const { return mostCounts; } ///< infinity when there is no limit
     double getMostSeconds() const { return mostSeconds; }
+    double getListed() const { return listed; }
     double getSeconds() const { return secondsSince(start); }
 
 private:
@@ -141,6 +142,9 @@ private:
     double mostCounts;
     double mostSeconds;
     double counts = 0;
+    /// What a peek lists at most: so few that little is kept from being dropped, so many that packets are
+    /// seldom divided.
+    double listed = 4096;
     bool done = false;
     std::vector<Field> fields;
     std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();

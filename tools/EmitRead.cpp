@@ -178,12 +178,13 @@ void addSound(const Settings& settings, const std::vector<Field>& fields, const 
 } // namespace
 
 void emitRead(const Settings& settings, const std::vector<Field>& fields, double mostCounts,
-              double mostSeconds)
+              double mostSeconds, double mostListed)
 {
     Values values = commonValues(settings, true, false);
     const std::string& format = settings.file.format;
     const std::size_t columns = columnNames(fields).size();
-    values["MOST"] = std::to_string(std::clamp<std::size_t>((1 << 24) / columns, 1, 65536));
+    values["MOST"] = std::to_string(std::clamp<std::size_t>(
+        (1 << 24) / columns, 1, static_cast<std::size_t>(std::min(mostListed, 65536.0))));
     for (std::size_t f = 0; f < fields.size(); ++f) {
         const ElementType& type = *fields[f].type;
         const std::string array = "field" + std::to_string(f + 1);

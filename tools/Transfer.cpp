@@ -156,8 +156,7 @@ std::size_t Reading::next()
 {
     // Asked before: a device that is done adds nothing to what is then there.
     const bool deviceDone = channel.isDone(channel.inputStream());
-    constexpr double mostOfBuffer = 1 << 18; // packets beyond that are divided, which copies them
-    const double ready = channel.nextBuffer(std::min(mostCounts - counts, mostOfBuffer));
+    const double ready = channel.nextBuffer(std::min(mostCounts - counts, listed));
     if (ready == 0) {
         done = deviceDone;
         if (!done) {
@@ -172,6 +171,7 @@ std::size_t Reading::next()
         channel.readField(field, ready);
     }
     counts += ready;
+    listed = std::max(listed, std::min(2 * ready, 524288.0));
     return static_cast<std::size_t>(ready);
 }
 
@@ -257,7 +257,7 @@ ExitCode readSamples(const Settings& given)
     }
     const double lost = channel.number("LostCounts", "uint64").value_or(0);
     if (writer && !settings.emitC.empty()) {
-        emitRead(settings, fields, most, reading.getMostSeconds());
+        emitRead(settings, fields, most, reading.getMostSeconds(), reading.getListed());
     }
     summarise(settings, "read", written, seconds, lost);
     if (settings.failOnLoss && (isLossTold || lost > 0)) {
