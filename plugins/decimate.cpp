@@ -6,6 +6,7 @@
 #include "brenixcore/plugin/Visit.hpp"
 
 #include <algorithm>
+#include <cmath>
 #include <cstddef>
 #include <cstdint>
 
@@ -37,6 +38,10 @@ public:
         for (const auto& field : *packet.fields) {
             visitProperty(brenixplugin::asProperty(field.second), keep);
         }
+        if (packet.time != 0) { // of what is now its first count
+            packet.time += std::llround(packet.period * static_cast<double>(skip));
+        }
+        packet.period *= static_cast<double>(factor);
         skip += kept * factor - packet.counts;
         packet.counts = kept;
     }

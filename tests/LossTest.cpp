@@ -255,6 +255,24 @@ TEST(LossTest, PartsOfPacketsHaveTheirOwnTimes)
         EXPECT_EQ(times, row.times);
         rig.channel.close();
     }
+
+    // Of 0 to 7 and 8 to 15 the counts 0, 3, 6 and 9, 12, 15 are left.
+    auto* const device = new Worker({StreamInfo{1, 4}, std::nullopt});
+    Rig rig(device, 8);
+    rig.init(Rig::options("", true));
+    rig.input->addFilter(PLUGINS "/decimate.so", {{"Factor", makeScalar("Factor", 3.0).release()}});
+    rig.open();
+    device->perform([&](DeviceStreams& streams) {
+        for (const std::uint64_t first : {0U, 8U}) {
+            Packet packet;
+            number(packet, first, 8);
+            packet.time = 1000 + static_cast<std::int64_t>(first) * 250'000'000;
+            streams.push(std::move(packet));
+        }
+    });
+    EXPECT_EQ(timesOf(rig.read(1)), "1000 ");
+    EXPECT_EQ(timesOf(rig.read(5)), "750001000 2250001000 ");
+    rig.channel.close();
 }
 
 TEST(LossTest, WithoutMemoryNothingIsLostUncounted)

@@ -35,9 +35,15 @@ void FilterChain::apply(plugin::Packet& packet)
     }
     const std::lock_guard lock(mutex);
     for (const auto& filter : filters) {
-        if (packet.counts > 0) {
+        if (const std::uint64_t before = packet.counts; before > 0) {
+            const double period = packet.period;
             filter->apply(packet);
             requireWhole(packet);
+            const bool isTold = packet.period != 0 && packet.period != period;
+            if (!isTold && packet.counts > 0) { // they take as long as before
+                packet.period =
+                    period * static_cast<double>(before) / static_cast<double>(packet.counts);
+            }
         }
     }
 }

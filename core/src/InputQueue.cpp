@@ -22,7 +22,7 @@ bool Queue::awaitTurn(Lock& lock, bool waits)
     return isFree() && takesPart();
 }
 
-bool Queue::bring(Lock& lock, plugin::Packet&& packet, double period)
+bool Queue::bring(Lock& lock, plugin::Packet&& packet)
 {
     // Whatever throws does so before the packet is taken, or leaves it in `pending`.
     packets.reserve(1 + held);
@@ -44,7 +44,6 @@ bool Queue::bring(Lock& lock, plugin::Packet&& packet, double period)
         QueuedPacket queued(std::move(packet));
         queued.index = numbered;
         queued.opening = opening;
-        queued.period = period;
         numbered += queued.counts();
         if (hasRoom) {
             enqueue(std::move(queued));

@@ -22,7 +22,6 @@ struct QueuedPacket {
     plugin::Packet packet;
     std::uint64_t taken = 0;
     std::uint64_t index = 0;   ///< of the packet's first count, from open on
-    double period = 0;         ///< nanoseconds of a count; 0: not known
     std::uint32_t opening = 0; ///< from which it is
     bool converted = false;
 
@@ -33,11 +32,12 @@ struct QueuedPacket {
     {
         QueuedPacket result(slice(packet, taken, length));
         if (packet.time != 0) {
-            result.packet.time = packet.time + std::llround(period * static_cast<double>(taken));
+            result.packet.time =
+                packet.time + std::llround(packet.period * static_cast<double>(taken));
         }
         result.index = index + taken;
         result.opening = opening;
-        result.period = period;
+        result.packet.period = packet.period;
         result.converted = converted;
         return result;
     }

@@ -73,9 +73,8 @@ public:
     /// Whether the device may bring a packet; waits for its turn if it is to.
     bool awaitTurn(Lock& lock, bool waits);
 
-    /// Takes the packet, whose turn it is, and of which a count takes so many nanoseconds, or 0 if that is
-    /// not known. Unlocks. Returns whether there is news of losses.
-    bool bring(Lock& lock, plugin::Packet&& packet, double period);
+    /// Takes the packet, whose turn it is. Unlocks. Returns whether there is news of losses.
+    bool bring(Lock& lock, plugin::Packet&& packet);
 
     std::optional<plugin::Packet> pull(bool waits);
 

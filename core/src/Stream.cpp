@@ -21,8 +21,11 @@ bool Stream::Impl::push(plugin::Packet& packet, bool waits)
     if (!queue.awaitTurn(lock, waits)) {
         return false;
     }
-    const std::uint64_t brought = packet.counts;
+    if (packet.period == 0 && info.rate > 0) {
+        packet.period = 1e9 / info.rate;
+    }
     if (!filters.empty()) {
+        const std::uint64_t brought = packet.counts;
         lock.unlock();
         const std::uint64_t lost = packet.lost; // which filters may look at, but not change
         try {
@@ -40,12 +43,7 @@ bool Stream::Impl::push(plugin::Packet& packet, bool waits)
         packet.lost = lost;
         lock.lock();
     }
-    double period = 0;
-    if (info.rate > 0 && packet.counts > 0) { // filters change the number of counts, not their time
-        period =
-            1e9 / info.rate * static_cast<double>(brought) / static_cast<double>(packet.counts);
-    }
-    if (queue.bring(lock, std::move(packet), period)) {
+    if (queue.bring(lock, std::move(packet))) {
         tellLosses(false);
     }
     return true;

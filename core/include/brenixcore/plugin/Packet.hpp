@@ -56,6 +56,8 @@ struct Packet {
     std::uint64_t counts = 0; ///< of each field
     std::int64_t time = 0;    ///< of its first count, in nanoseconds since 1970 (UTC); 0: not known
     std::uint64_t lost = 0;   ///< counts that the device lost before it
+    double period =
+        0; ///< nanoseconds of a count; 0: what the rate of the stream says, if it has one
 };
 
 /// Adds a field, or replaces the one of its name.
