@@ -6,6 +6,7 @@
 
 #include <sys/eventfd.h>
 
+#include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <optional>
@@ -22,7 +23,12 @@ public:
     {
     }
 
-    void signal() noexcept { ::eventfd_write(event.native_handle(), 1); }
+    void signal() noexcept
+    {
+        if (!signalled.exchange(true)) { // or else it is on its way
+            ::eventfd_write(event.native_handle(), 1);
+        }
+    }
 
     /// Calls the handler after the next signal, or when it is cancelled.
     template <typename Handler>
@@ -32,6 +38,7 @@ public:
                          [this, handler](const asio::error_code& /*error*/) {
                              eventfd_t times = 0;
                              ::eventfd_read(event.native_handle(), &times);
+                             signalled = false; // before the handler looks at what has changed
                              handler();
                          });
     }
@@ -40,6 +47,7 @@ public:
 
 private:
     asio::posix::stream_descriptor event;
+    std::atomic<bool> signalled = false;
 };
 
 /// A timer that is not started again while it runs.

@@ -97,9 +97,7 @@ void Stream::Impl::send(Queue::Packets& outgoing, std::chrono::steady_clock::tim
     } catch (...) {
         throw CouldNotConvertOutputData(currentExceptionText());
     }
-    outgoing.erase(std::remove_if(outgoing.begin(), outgoing.end(),
-                                  [](const QueuedPacket& queued) { return queued.counts() == 0; }),
-                   outgoing.end());
+    std::erase_if(outgoing, [](const QueuedPacket& queued) { return queued.counts() == 0; });
     queue.add(outgoing, begin);
 }
 
