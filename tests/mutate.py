@@ -3,7 +3,8 @@
 notices. Works in a copy of the work tree, build/mutate/tree, and goes on where it was stopped.
 
 A fault that does not compile, or after which the libraries, plug-ins and programs are the same, is none. The
-tests that reach the line run first, the quickest of them before all others. All results are kept in
+tests that reach the line are run, the quickest first; all of them for a line that is read by the compiler alone, as
+those of tables are. All results are kept in
 build/mutate/results.jsonl, without which it begins anew; --again seeds anew what has survived."""
 
 import argparse
@@ -197,10 +198,9 @@ def seed(fault, seconds, reach, sound):
         if products() == sound:
             return "changes nothing"
         quickest = sorted(seconds, key=seconds.get)
-        reaching = reach.get(f"{fault['file']}:{fault['line']}", [])
+        reaching = reach.get(f"{fault['file']}:{fault['line']}", quickest) # all of a table that the compiler reads
         rows = [[test for test in quickest if test in reaching and seconds[test] < 1],
-                [test for test in quickest if test in reaching and seconds[test] >= 1],
-                [test for test in quickest if test not in reaching]]
+                [test for test in quickest if test in reaching and seconds[test] >= 1]]
         for row in filter(None, rows):
             if failed := run_tests(row, 20 + 5 * max(seconds[test] for test in row)):
                 return failed
