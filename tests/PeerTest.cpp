@@ -216,11 +216,11 @@ TEST(TcpTest, NothingIsLostUnseenWhenThePeerEnds)
         std::string got;
         asio::error_code end;
         asio::read(socket, asio::dynamic_buffer(got), end);
-        const std::size_t lost = accepted - got.size(); // what came while the device ended
+        const std::size_t late = accepted - got.size(); // what came while the device ended
         ASSERT_EQ(channel.error(coderChannelGetLastAsyncError),
-                  lost == 0 ? "|"
+                  late == 0 ? "|"
                             : "brenix:Stream:dataLost|The device ended and did not take " +
-                                  std::to_string(lost) + " counts.");
+                                  std::to_string(late) + " counts.");
     }
 }
 
