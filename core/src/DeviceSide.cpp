@@ -84,9 +84,8 @@ void Channel::Impl::tellLoss(const Tell& tell) noexcept
 
 void Channel::Impl::updateLostCounts()
 {
-    const std::lock_guard lock(handlerMutex);
-    if (handler != nullptr &&
-        keepsLost) { // the sum under the lock, or an older one could come later
+    const std::lock_guard lock(handlerMutex); // also of the sum, or an older one could come later
+    if (handler != nullptr && keepsLost) {
         auto property = plugin::makeScalar(lostName, input->impl->queue.getLost());
         handler->onPropertyUpdate(property.get());
         property.release();
