@@ -1,45 +1,20 @@
 // The embedded core through its own classes: what the C functions do not show.
 
-#include "brenixcore/Channel.hpp"
-#include "brenixcore/Converter.hpp"
-#include "brenixcore/Exceptions.hpp"
-#include "brenixcore/Stream.hpp"
-#include "brenixcore/plugin/Make.hpp"
+#include "Handed.hpp"
 #include "brenixcore/plugin/Visit.hpp"
-#include "brenixplugin/Property.hpp"
 
-#include <gtest/gtest.h>
-
-#include <dlfcn.h>
 #include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
-#include <memory>
-#include <string>
-#include <vector>
 
-using namespace brenixcore;
-using brenixplugin::PropertyMap;
+using namespace handed;
 
 namespace
 {
 
 const std::string testPlugins = TEST_PLUGINS "/";
 const std::string folder = PLUGINS "/"; // where bare names are looked for
-
-class Handler : public Channel::IEventHandler
-{
-public:
-    void onCustomEvent(CustomEvent& event) override { ADD_FAILURE() << event.getMessage(); }
-    void onPropertyUpdate(brenixplugin::interfaces::IPropertyInfo* property) override
-    {
-        property->destroy();
-    }
-    void* onDelegatedEvent(DelegatedEvent& event) override { return event.invoke(); }
-    void onIgnoredEvent1(void* /*event*/) override {}
-    void onIgnoredEvent2(void* /*event*/) override {}
-};
 
 bool isLoaded(const std::string& path)
 {
@@ -95,16 +70,16 @@ TEST(LoadTest, ErrorsSayWhatWasTriedAndWhy)
         {test("throwingInt"), "Unrecognized error.", true},
         {test("nullFactory"), "the factory returned nothing", true},
     };
-    Converter converter("identity");
-    Handler handler;
+    brenixcore::Converter converter("identity");
+    Log log;
     for (const auto& [device, why, isCreated] : rows) {
         const bool isBare = device.find('/') == std::string::npos;
         const std::string path = isBare ? folder + device + ".so" : device;
         try {
-            const Channel channel(device, converter, handler, 1, 1);
+            const brenixcore::Channel channel(device, converter, log, 1, 1);
             ADD_FAILURE() << device;
         } catch (const std::runtime_error& exception) {
-            EXPECT_EQ(dynamic_cast<const CouldNotCreateDevice*>(&exception) != nullptr, isCreated);
+            EXPECT_EQ(dynamic_cast<const brenixcore::CouldNotCreateDevice*>(&exception) != nullptr, isCreated);
             EXPECT_EQ(exception.what(),
                       (isCreated ? "Could not create " : "Could not load ") + path + ": " + why);
         }
@@ -128,60 +103,51 @@ TEST(LoadTest, PluginsAreUnloaded)
 
 TEST(DataTest, MovesByPointerFromDeviceToCaller)
 {
-    const std::string probe = testPlugins + "probe.so";
-    {
-        Converter converter("identity");
-        Handler handler;
-        Channel channel(probe, converter, handler, UINT64_MAX, UINT64_MAX);
-        PropertyMap properties;
-        const std::string name = "Packets";
-        channel.init(
-            {{name, new brenixplugin::kit::device::TScalarProperty<std::u16string>(name, u"1000")}},
-            properties);
-        channel.open({});
-        std::vector<void*> buffers;
-        unsigned long read = 0;
-        channel.getInputStream()->read(1000, buffers, read);
-        ASSERT_EQ(buffers.size(), 1);
-        const brenixplugin::OwnedDataBuffer buffer(static_cast<PropertyMap*>(buffers[0]));
-        const auto field = [&](const char* fieldName) {
-            return brenixplugin::asProperty(buffer->at(fieldName));
-        };
-        const auto& data =
-            dynamic_cast<brenixplugin::kit::coderconverter::TPointerProperty<double>&>(
-                *field("data"));
-        const auto& address =
-            dynamic_cast<brenixplugin::kit::device::TScalarProperty<unsigned long>&>(
-                *field("Address"));
-        EXPECT_EQ(reinterpret_cast<std::uintptr_t>(data.data), address.value);
-        brenixplugin::releaseProperties(properties);
-    }
-    EXPECT_FALSE(isLoaded(probe));
+    auto* const device = new Worker({StreamInfo{}, std::nullopt});
+    Rig rig(device, UINT64_MAX);
+    rig.init();
+    rig.open();
+    const void* address = nullptr;
+    device->perform([&](DeviceStreams& streams) {
+        Packet packet;
+        number(packet, 0, 1000);
+        address = dataOf(*packet.fields).data;
+        streams.push(std::move(packet));
+    });
+    std::vector<void*> buffers;
+    std::uint64_t total = 0;
+    rig.input->read(1000, buffers, total);
+    ASSERT_EQ(buffers.size(), 1);
+    const brenixplugin::OwnedDataBuffer buffer(static_cast<PropertyMap*>(buffers[0]));
+    EXPECT_EQ(dataOf(*buffer).data, address);
 }
 
 TEST(DataTest, WriteLeavesTheBuffersToTheCaller)
 {
-    using Array = brenixplugin::kit::coderconverter::TPointerProperty<double>;
-    Converter converter("identity");
-    Handler handler;
-    Channel channel(folder + "loopback.so", converter, handler, UINT64_MAX, UINT64_MAX);
-    PropertyMap properties;
-    channel.init({}, properties);
-    channel.open({});
-    const brenixplugin::OwnedDataBuffer written(new PropertyMap);
-    (*written)["data"] =
-        plugin::makeArray("data", std::unique_ptr<double[]>(new double[2]{3, 4}), 2).release();
-    EXPECT_EQ(channel.getOutputStream()->write({written.get(), written.get()}), 4);
-    std::vector<void*> buffers;
-    unsigned long read = 0;
-    channel.getInputStream()->read(4, buffers, read);
-    ASSERT_EQ(buffers.size(), 2);
-    for (void* const buffer : buffers) {
-        const brenixplugin::OwnedDataBuffer owned(static_cast<PropertyMap*>(buffer));
-        const auto& data = dynamic_cast<Array&>(*brenixplugin::asProperty(owned->at("data")));
-        EXPECT_EQ(std::vector(data.data, data.data + data.count), (std::vector<double>{3, 4}));
+    const std::string loopback = folder + "loopback.so";
+    {
+        brenixcore::Converter converter("identity");
+        Log log;
+        brenixcore::Channel channel(loopback, converter, log, UINT64_MAX, UINT64_MAX);
+        PropertyMap properties;
+        channel.init({}, properties);
+        channel.open({});
+        Packet packet;
+        number(packet, 3, 2);
+        void* const written = &*packet.fields;
+        EXPECT_EQ(channel.getOutputStream()->write({written, written}), 4);
+        std::vector<void*> buffers;
+        std::uint64_t total = 0;
+        channel.getInputStream()->read(4, buffers, total);
+        ASSERT_EQ(buffers.size(), 2);
+        for (void* const buffer : buffers) {
+            const brenixplugin::OwnedDataBuffer owned(static_cast<PropertyMap*>(buffer));
+            const auto& data = dataOf(*owned);
+            EXPECT_EQ(Counts(data.data, data.data + data.count), (Counts{3, 4}));
+        }
+        brenixplugin::releaseProperties(properties);
     }
-    brenixplugin::releaseProperties(properties);
+    EXPECT_FALSE(isLoaded(loopback));
 }
 
 TEST(VisitTest, FindsTheClassOrOneItIsDerivedFrom)
@@ -206,7 +172,7 @@ TEST(VisitTest, FindsTheClassOrOneItIsDerivedFrom)
                 found = visited.values.size();
             }
         };
-        EXPECT_EQ(plugin::visitProperty(property, visitor), size > 0);
+        EXPECT_EQ(visitProperty(property, visitor), size > 0);
         EXPECT_EQ(found, size);
     }
 }

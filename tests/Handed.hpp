@@ -186,6 +186,12 @@ struct Buffer {
     std::optional<std::int64_t> time;
 };
 
+inline TPointerProperty<std::uint64_t>& dataOf(const PropertyMap& fields)
+{
+    return dynamic_cast<TPointerProperty<std::uint64_t>&>(
+        *brenixplugin::asProperty(fields.at(dataField)));
+}
+
 template <typename T>
 std::optional<T> scalarOf(const PropertyMap& fields, const char* name)
 {
@@ -243,8 +249,7 @@ struct Rig {
         std::vector<Buffer> buffers;
         for (void* const map : maps) {
             const brenixplugin::OwnedDataBuffer owned(static_cast<PropertyMap*>(map));
-            const auto& data = dynamic_cast<const TPointerProperty<std::uint64_t>&>(
-                *brenixplugin::asProperty(owned->at(dataField)));
+            const auto& data = dataOf(*owned);
             buffers.push_back({Counts(data.data, data.data + data.count),
                                scalarOf<std::uint64_t>(*owned, "Index"),
                                scalarOf<std::int64_t>(*owned, "Time")});

@@ -36,9 +36,7 @@ std::string timesOf(const std::vector<Buffer>& buffers)
 struct Refusing : Identity {
     void convertInput(Packet& packet) override
     {
-        const auto& data = dynamic_cast<TPointerProperty<std::uint64_t>&>(
-            *brenixplugin::asProperty(packet.fields->at(dataField)));
-        if (*data.data == 50) {
+        if (*dataOf(*packet.fields).data == 50) {
             packet.counts = 1000; // which makes no difference
             throw std::runtime_error("refused");
         }

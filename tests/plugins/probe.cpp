@@ -86,8 +86,8 @@ public:
         isOpen = true;
     }
 
-    /// Pushes packets of running numbers in "data", with a "Stamp", seven numbers "Odd" and the
-    /// "Address" of the numbers each; then takes all output.
+    /// Pushes packets of running numbers in "data", with a "Stamp" and seven numbers "Odd"
+    /// each; then takes all output.
     void run(DeviceStreams& streams) override
     {
         reach("run");
@@ -109,7 +109,6 @@ public:
             }
             Packet packet;
             packet.counts = size;
-            setField(packet, makeScalar("Address", reinterpret_cast<std::uintptr_t>(values.get())));
             setField(packet, makeArray(dataField, std::move(values), size));
             setField(packet, makeScalar("Stamp", next));
             setField(packet, makeArray("Odd", std::make_unique<double[]>(7), 7));
