@@ -79,7 +79,8 @@ TEST(LoadTest, ErrorsSayWhatWasTriedAndWhy)
             const brenixcore::Channel channel(device, converter, log, 1, 1);
             ADD_FAILURE() << device;
         } catch (const std::runtime_error& exception) {
-            EXPECT_EQ(dynamic_cast<const brenixcore::CouldNotCreateDevice*>(&exception) != nullptr, isCreated);
+            EXPECT_EQ(dynamic_cast<const brenixcore::CouldNotCreateDevice*>(&exception) != nullptr,
+                      isCreated);
             EXPECT_EQ(exception.what(),
                       (isCreated ? "Could not create " : "Could not load ") + path + ": " + why);
         }
@@ -103,12 +104,11 @@ TEST(LoadTest, PluginsAreUnloaded)
 
 TEST(DataTest, MovesByPointerFromDeviceToCaller)
 {
-    auto* const device = new Worker({StreamInfo{}, std::nullopt});
-    Rig rig(device, UINT64_MAX);
+    Rig rig({StreamInfo{}, std::nullopt}, UINT64_MAX);
     rig.init();
     rig.open();
     const void* address = nullptr;
-    device->perform([&](DeviceStreams& streams) {
+    rig.device->perform([&](DeviceStreams& streams) {
         Packet packet;
         number(packet, 0, 1000);
         address = dataOf(*packet.fields).data;

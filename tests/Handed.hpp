@@ -52,7 +52,7 @@ class Worker : public Device
 public:
     using Job = std::function<void(DeviceStreams&)>;
 
-    explicit Worker(DeviceInfo deviceInfo) : info(deviceInfo) {}
+    explicit Worker(const DeviceInfo& deviceInfo) : info(deviceInfo) {}
 
     DeviceInfo init(const PropertyMap& /*options*/, PropertyMap& /*properties*/,
                     DeviceHost& /*host*/) override
@@ -203,10 +203,22 @@ std::optional<T> scalarOf(const PropertyMap& fields, const char* name)
     return scalar == nullptr ? std::nullopt : std::optional(scalar->value);
 }
 
-/// The channel, with its input stream.
+/// Gives a packet its counts, numbered from `first` on. Returns it.
+inline Packet& number(Packet& packet, std::uint64_t first, std::uint64_t counts)
+{
+    std::unique_ptr<std::uint64_t[]> data(new std::uint64_t[counts]);
+    for (std::uint64_t i = 0; i < counts; ++i) {
+        data[i] = first + i;
+    }
+    setField(packet, makeArray(dataField, std::move(data), counts));
+    packet.counts = counts;
+    return packet;
+}
+
+/// The channel, with its device and its input stream.
 struct Rig {
-    Rig(Device* device, std::uint64_t limit, Converter* ownConverter = new Identity)
-        : converter(hand("Converter", ownConverter)),
+    Rig(const DeviceInfo& info, std::uint64_t limit, Converter* ownConverter = new Identity)
+        : device(new Worker(info)), converter(hand("Converter", ownConverter)),
           channel(hand("Device", device), converter, log, limit, UINT64_MAX)
     {
     }
@@ -256,6 +268,15 @@ struct Rig {
         }
         return buffers;
     }
+    /// Has the device push numbered counts.
+    void push(std::uint64_t first, std::uint64_t counts, std::int64_t time = 0)
+    {
+        device->perform([&](DeviceStreams& streams) {
+            Packet packet;
+            packet.time = time;
+            EXPECT_TRUE(streams.push(std::move(number(packet, first, counts))));
+        });
+    }
     Counts peek(std::uint64_t most = UINT64_MAX) const
     {
         std::uint64_t total = 0;
@@ -266,6 +287,7 @@ struct Rig {
     std::uint64_t available() const { return input->getDataAvailable(); }
 
     Log log;
+    Worker* const device; ///< the channel's
     brenixcore::Converter converter;
     brenixcore::Channel channel;
     brenixcore::InputStream* input = nullptr;
@@ -285,17 +307,6 @@ inline Loss lossOf(const std::string& error)
         return {};
     }
     return {std::stoull(error.substr(start.size())), std::stoull(error.substr(sum + 2))};
-}
-
-/// Gives a packet its counts, numbered from `first` on.
-inline void number(Packet& packet, std::uint64_t first, std::uint64_t counts)
-{
-    std::unique_ptr<std::uint64_t[]> data(new std::uint64_t[counts]);
-    for (std::uint64_t i = 0; i < counts; ++i) {
-        data[i] = first + i;
-    }
-    setField(packet, makeArray(dataField, std::move(data), counts));
-    packet.counts = counts;
 }
 
 } // namespace handed

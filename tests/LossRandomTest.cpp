@@ -25,8 +25,8 @@ public:
         if (pick(3) == 0) {
             info.output = StreamInfo{}; // then close drains
         }
-        device = new Worker(info);
-        rig.emplace(device, limit, new Picky(*this));
+        rig.emplace(info, limit, new Picky(*this));
+        device = rig->device;
     }
 
     /// Returns how many steps there were.
