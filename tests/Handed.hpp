@@ -219,7 +219,7 @@ inline Packet& number(Packet& packet, std::uint64_t first, std::uint64_t counts)
 struct Rig {
     Rig(const DeviceInfo& info, std::uint64_t limit, Converter* ownConverter = new Identity)
         : device(new Worker(info)), converter(hand("Converter", ownConverter)),
-          channel(hand("Device", device), converter, log, limit, UINT64_MAX)
+          channel(hand<Device>("Device", device), converter, log, limit, UINT64_MAX)
     {
     }
     Rig(const Rig&) = delete;
