@@ -27,7 +27,7 @@ public:
         : device(byteDevice), streams(deviceStreams), assembler(device.format, device.blockBytes),
           losses(*device.host, device.peer, device.source, device.format.type->name)
     {
-        if (!isDatagrams) {
+        if (!device.isDatagrams) {
             device.waiting.reset(); // of another connection
         }
     }
@@ -96,7 +96,7 @@ private:
                 inputEnded = true;
                 fail(error == asio::error::eof ? asio::error_code() : error);
             }
-            if (isDatagrams || inputEnded) {
+            if (device.isDatagrams || inputEnded) {
                 losses.partial += assembler.dropRest();
             }
             inputEnded ? tellLosses() : tellLossesSoon();
@@ -113,7 +113,7 @@ private:
         const std::uint64_t counts = device.waiting->counts;
         if (streams.tryPush(*device.waiting)) {
             device.waiting.reset();
-        } else if (closing && !isDatagrams) {
+        } else if (closing && !device.isDatagrams) {
             // Nobody makes room now, but the other side may have to send in order to receive.
             noRoom += counts;
             device.waiting.reset();
@@ -155,7 +155,7 @@ private:
             if (over) {
                 return;
             }
-            if (error && isDatagrams) {
+            if (error && device.isDatagrams) {
                 losses.addUnsent(std::exchange(unsent, {}).size(), error.message());
                 tellLossesSoon();
             } else if (error) {
@@ -244,19 +244,6 @@ private:
         }
     }
 
-    /// Takes what is left in the output stream, so that one error tells all. Returns the number of bytes.
-    std::uint64_t takeLeft()
-    {
-        std::uint64_t left = 0;
-        if (device.sends) {
-            streams.refuseOutput();
-            while (const auto packet = streams.tryPull()) {
-                left += packet->counts * device.format.type->size;
-            }
-        }
-        return left;
-    }
-
     /// After all has stopped: says what failed, and what is lost.
     void finish()
     {
@@ -270,7 +257,9 @@ private:
             streams.tellLost(noRoom, nullptr);
         }
         if (!outputEnded) {
-            losses.addUnsent(unsent.size() + device.queuedBySystem() + (failure ? 0 : takeLeft()),
+            const std::uint64_t left = failure || !device.sends ? 0 : discardOutput(streams);
+            losses.addUnsent(unsent.size() + device.queuedBySystem() +
+                                 left * device.format.type->size,
                              failure ? "" : "the other side does not take them");
             device.abandonOutput();
         }
@@ -284,7 +273,6 @@ private:
     }
 
     Owner& device;
-    const bool isDatagrams = device.isDatagrams;
     DeviceStreams& streams;
     asio::error_code failure;
     Assembler assembler;
@@ -298,9 +286,7 @@ private:
     Patience patience; ///< with the other side, while the device waits to end
     Ticker lossTicker{device.context};
 
-    // Under way:
-    bool receiving = false;
-    bool sending = false;
+    bool receiving = false, sending = false; ///< under way
     bool closing = false;
     bool inputEnded = false;
     bool inputDoneTold = false;

@@ -250,10 +250,7 @@ private:
     [[noreturn]] void failToWrite(DeviceStreams& streams, const std::string& error,
                                   std::uint64_t lost, const std::string& besides) const
     {
-        streams.refuseOutput();
-        while (const auto packet = streams.tryPull()) {
-            lost += packet->counts;
-        }
+        lost += discardOutput(streams);
         throw std::runtime_error(
             "Could not write " + fileName + (error.empty() ? "." : ": " + error + ".") +
             (lost > 0 ? " " + std::to_string(lost) + " samples were not taken." : "") + besides);

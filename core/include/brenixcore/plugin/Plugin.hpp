@@ -96,6 +96,18 @@ protected:
     ~DeviceStreams() = default;
 };
 
+/// Refuses output from here on and takes what is left of it, for a device that tells itself what it did not
+/// take. Returns its counts.
+inline std::uint64_t discardOutput(DeviceStreams& streams)
+{
+    streams.refuseOutput();
+    std::uint64_t counts = 0;
+    while (const auto packet = streams.tryPull()) {
+        counts += packet->counts;
+    }
+    return counts;
+}
+
 /// What a device has in one direction.
 struct StreamInfo {
     std::uint64_t countDimension = 1; ///< the dimension of the data along which it counts
