@@ -14,6 +14,7 @@
 #include <optional>
 #include <ostream>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace brenix
@@ -158,6 +159,9 @@ void tellPort(Channel& channel, const Settings& settings);
 
 /// The rate that is given or that the device tells; 0 when neither is.
 double countRate(Channel& channel, const SampleFile& file);
+
+/// What of the two limits is there: counts if the rate tells how many, or else seconds.
+std::pair<double, double> extent(const Settings& settings, double rate);
 
 } // namespace brenix
 
