@@ -25,13 +25,13 @@ bool Queue::awaitTurn(Lock& lock, bool waits)
 bool Queue::bring(Lock& lock, plugin::Packet&& packet)
 {
     // Whatever throws does so before the packet is taken, or leaves it in `pending`.
-    packets.reserve(1 + held);
     if (losses.isFrontPassed()) {
         losses.endAtFront();
     }
     if (pending && overflow != Overflow::Wait) { // since an opening that waited
         dropPending();
     }
+    packets.reserve(1 + held);
     if (packet.lost > 0) {
         losses.addAtEnd(packet.lost, lostByDevice);
         numbered += std::exchange(packet.lost, 0);

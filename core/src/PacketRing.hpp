@@ -136,8 +136,8 @@ private:
     std::vector<Slot> slots; ///< a power of two of them, or none
     std::size_t first = 0;   ///< wraps
     std::size_t length = 0;  ///< packets
-    std::size_t beforeHole =
-        0;                ///< so many of them come first; without a meaning where there is no hole
+    /// So many of them come before the hole; without a meaning where there is none.
+    std::size_t beforeHole = 0;
     std::size_t hole = 0; ///< empty slots
 };
 
