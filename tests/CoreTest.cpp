@@ -58,7 +58,7 @@ TEST(LoadTest, ErrorsSayWhatWasTriedAndWhy)
         {cut, "the file is cut short"},
         {lacking, "libabsent.so.6" + missing},
         {test("throwsWhileLoading"), "thrown while loading"},
-        {test("otherAbiVersion"), "it has plug-in ABI version 999, needed is 2"},
+        {test("otherAbiVersion"), "it has plug-in ABI version 999, needed is 3"},
         {test("throwingStatic"), "thrown by a static object"},
         {test("throwingStatic"), "thrown by a static object"}, // half loaded is not loaded
         {"identity", "it is a converter and no device", true},

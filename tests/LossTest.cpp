@@ -255,6 +255,38 @@ TEST(LossTest, PartsOfPacketsHaveTheirOwnTimes)
     rig.channel.close();
 }
 
+/// The core's own numbers go on beside those of the source: 4 counts, 1 lost, 4 counts.
+TEST(LossTest, ASourceMayNumberItsCounts)
+{
+    struct Same : Filter {
+        void tune(Options& /*options*/) override {}
+        void apply(Packet& /*packet*/) override {}
+    };
+    for (const bool isFiltered : {false, true}) {
+        Rig rig({StreamInfo{}, std::nullopt}, 100);
+        rig.init(Rig::options("", true));
+        if (isFiltered) {
+            rig.addFilter(new Same);
+        }
+        rig.open();
+        rig.device->perform([](DeviceStreams& streams) {
+            for (const std::uint64_t lost : {0U, 1U}) {
+                Packet packet;
+                packet.index = 900 + lost;
+                packet.lost = lost;
+                EXPECT_TRUE(streams.push(std::move(number(packet, 0, 4))));
+            }
+        });
+        std::string indices;
+        for (const std::uint64_t count : {1U, 3U, 2U, 2U}) {
+            indices += std::to_string(rig.read(count).at(0).index.value()) + " ";
+        }
+        EXPECT_EQ(indices, isFiltered ? "0 1 5 7 " : "900 901 901 903 ");
+        EXPECT_EQ(rig.log.getLostCounts(), 1U);
+        rig.channel.close();
+    }
+}
+
 TEST(LossTest, WithoutMemoryNothingIsLostUncounted)
 {
     for (const char* const overflow : {"wait", "dropOldest", "dropNewest"}) {

@@ -36,6 +36,9 @@ struct QueuedPacket {
                 packet.time + std::llround(packet.period * static_cast<double>(taken));
         }
         result.index = index + taken;
+        if (packet.index) {
+            result.packet.index = *packet.index + taken;
+        }
         result.opening = opening;
         result.packet.period = packet.period;
         result.converted = converted;

@@ -41,6 +41,7 @@ bool Stream::Impl::push(plugin::Packet& packet, bool waits)
             return true;
         }
         packet.lost = lost;
+        packet.index.reset(); // what filters leave are other counts
         lock.lock();
     }
     if (queue.bring(lock, std::move(packet))) {
@@ -214,7 +215,9 @@ void InputStream::read(unsigned long count, std::vector<void*>& buffers, unsigne
         }
         if (stream.stamps) {
             for (QueuedPacket& queued : taken.packets) {
-                plugin::setField(queued.packet, plugin::makeScalar("Index", queued.index));
+                plugin::setField(
+                    queued.packet,
+                    plugin::makeScalar("Index", queued.packet.index.value_or(queued.index)));
                 plugin::setField(queued.packet, plugin::makeScalar("Time", queued.packet.time));
             }
         }

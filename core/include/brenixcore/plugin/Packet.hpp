@@ -6,6 +6,7 @@
 #include "brenixplugin/Property.hpp"
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <utility>
 
@@ -58,6 +59,10 @@ struct Packet {
     std::uint64_t lost = 0;   ///< counts that the device lost before it
     double period =
         0; ///< nanoseconds of a count; 0: what the rate of the stream says, if it has one
+
+    /// The number of its first count, where its source numbers counts itself; then the caller's Index is
+    /// this one, unless the stream has filters.
+    std::optional<std::uint64_t> index = std::nullopt;
 };
 
 /// Adds a field, or replaces the one of its name.

@@ -27,7 +27,7 @@ namespace brenixcore::plugin
 {
 
 /// The version of everything in this file. A plug-in made for another version is not loaded.
-constexpr std::uint32_t abiVersion = 2;
+constexpr std::uint32_t abiVersion = 3;
 
 /// How a device reports to its channel, from any thread, from its init() to its term().
 class BRENIXCORE_PLUGIN_SHARED DeviceHost

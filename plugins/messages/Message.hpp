@@ -1,0 +1,72 @@
+// The messages of the devices that reach other machines: docs/messages.md says what is in them.
+#ifndef BRENIX_PLUGINS_MESSAGES_MESSAGE_HPP
+#define BRENIX_PLUGINS_MESSAGES_MESSAGE_HPP
+
+#include "brenixcore/plugin/Packet.hpp"
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <stdexcept>
+#include <string>
+#include <variant>
+
+namespace messages
+{
+
+/// What a writer says of itself.
+struct Hello {
+    std::string stream;
+    std::uint64_t seq = 0;                      ///< of the next packet
+    std::uint64_t first = 0;                    ///< of the next packet
+    std::string name;                           ///< the writer's for itself
+    std::string unit;                           ///< of the numbers; empty: not known
+    double rate = 0;                            ///< counts a second; 0: not known
+    std::map<std::string, std::string> options; ///< of the writer's device, as text
+};
+
+/// A packet, or a part of it.
+struct Data {
+    std::string stream;
+    std::uint64_t seq = 0;
+    std::uint64_t first = 0; ///< number of its first count
+
+    /// Its fields, `time` and `lost` are those of the message. A message that was read has all `counts`.
+    brenixcore::plugin::Packet packet;
+
+    // Of the counts of `packet`, those of the message, when one is written:
+    std::uint64_t begin = 0;
+    std::uint64_t counts = 0;
+};
+
+/// The writer has closed.
+struct End {
+    std::string stream;
+    std::uint64_t seq = 0;    ///< packets in all
+    std::uint64_t counts = 0; ///< counts in all, lost ones included
+};
+
+using Message = std::variant<Hello, Data, End>;
+
+/// What no message holds, or what one should not hold. The text says what and where.
+class Malformed : public std::runtime_error
+{
+public:
+    using std::runtime_error::runtime_error;
+};
+
+/// The bytes that a message takes.
+/// @throws Malformed for a field of a class that is not known
+std::size_t sizeOf(const Message& message);
+
+/// Writes those bytes; arrays are copied once, from their field to their place.
+void write(const Message& message, unsigned char* bytes);
+
+/// Reads a message. Nothing in it is trusted: no memory is taken for what is not there, and an array has
+/// at most `maxArray` bytes. Arrays are copied once, from their place to their field.
+/// @throws Malformed
+Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArray);
+
+} // namespace messages
+
+#endif
