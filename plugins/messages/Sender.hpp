@@ -25,10 +25,7 @@ public:
     explicit Sender(brenixcore::plugin::Options& options);
 
     /// Adds an option of the device to what the hello says.
-    void describe(const std::string& option, const std::string& value)
-    {
-        description.options[option] = value;
-    }
+    void describe(const std::string& option, const std::string& value);
 
     /// Begins a stream: a new name, numbers from 0.
     void begin();
@@ -36,9 +33,12 @@ public:
     /// The writer as it is now; to be sent at the beginning, and again for readers that come late.
     const Hello& hello() const { return description; }
 
-    /// The next message, of `counts` counts of the packet from `begin` on. The packet lives in it: all
-    /// parts of a packet are parts of one message.
-    void number(Data& data, std::uint64_t begin, std::uint64_t counts);
+    /// Makes the next message of `counts` counts of its packet, from `begin` on. All parts of a packet are
+    /// made in one Data, one after the other.
+    void number(Data& data, std::uint64_t begin, std::uint64_t counts) const;
+
+    /// It was sent, or will be.
+    void sent(const Data& data);
 
     /// Counts that will not be sent: the next message tells.
     void lose(std::uint64_t counts);

@@ -1,0 +1,59 @@
+// Reads CBOR item by item, and trusts none of it.
+#ifndef BRENIX_PLUGINS_MESSAGES_ITEM_HPP
+#define BRENIX_PLUGINS_MESSAGES_ITEM_HPP
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+namespace messages
+{
+
+/// An item, or the beginning of one that has others in it.
+struct Item {
+    enum class Kind { Unsigned, Negative, Bytes, Text, Array, Map, Tag, Bool, Float, Other };
+
+    Kind kind = Kind::Other;
+    std::uint64_t value = 0; ///< a number (n of -1 - n), a tag, true or false, a number of entries
+    double number = 0;       ///< of Float
+    std::string_view bytes;  ///< of Bytes and Text, in their place
+};
+
+/// Walks over the bytes of a message. Its operations throw Malformed.
+class Items
+{
+public:
+    Items(const unsigned char* first, std::size_t length) : bytes(first), size(length) {}
+
+    std::size_t getPosition() const { return position; }
+
+    /// Goes to what the name says, for errors.
+    void go(std::size_t place, std::string_view name)
+    {
+        position = lastPosition = place;
+        where = name;
+    }
+
+    Item next();
+
+    /// One of this kind.
+    Item next(Item::Kind kind, const char* expected);
+
+    /// One item with all that is in it.
+    void skip();
+
+    /// Tells of the item that was read last.
+    [[noreturn]] void fail(const std::string& problem) const;
+
+private:
+    const unsigned char* const bytes;
+    const std::size_t size;
+    std::size_t position = 0;
+    std::size_t lastPosition = 0;
+    std::string where = "the message";
+};
+
+} // namespace messages
+
+#endif

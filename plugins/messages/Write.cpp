@@ -1,0 +1,286 @@
+// From a message to its bytes.
+
+#include "Arrays.hpp"
+#include "Message.hpp"
+#include "Texts.hpp"
+
+#include "brenixcore/plugin/Visit.hpp"
+
+#include <cbor.h>
+
+#include <algorithm>
+#include <array>
+#include <cstring>
+
+namespace messages
+{
+
+namespace
+{
+
+using namespace brenixplugin::kit;
+using brenixcore::plugin::visitProperty;
+
+/// Takes the bytes in their order: writes them, or counts them where there is no place yet.
+class Output
+{
+public:
+    explicit Output(unsigned char* place) : bytes(place) {}
+
+    std::size_t getSize() const { return size; }
+
+    /// One of libcbor's functions.
+    template <typename Encode, typename Value>
+    void put(Encode encode, Value value)
+    {
+        std::array<unsigned char, 9> head{}; // the longest
+        const std::size_t length = encode(value, head.data(), head.size());
+        copy(head.data(), length);
+    }
+
+    void copy(const void* data, std::size_t length)
+    {
+        if (bytes != nullptr && length > 0) {
+            std::memcpy(bytes + size, data, length);
+        }
+        size += length;
+    }
+
+    void number(std::uint64_t value) { put(cbor_encode_uint, value); }
+
+    /// What is not UTF-8 stays as it is, as bytes.
+    void text(const std::string& value)
+    {
+        put(isUtf8(value) ? cbor_encode_string_start : cbor_encode_bytestring_start, value.size());
+        copy(value.data(), value.size());
+    }
+    void text(const std::u16string& value) { text(toBytes(value)); }
+
+private:
+    unsigned char* const bytes;
+    std::size_t size = 0;
+};
+
+/// How many elements a field has, and whether it is one value that describes the packet.
+struct Shape {
+    std::uint64_t elements = 0;
+    bool isScalar = false;
+
+    template <typename T>
+    void operator()(const coderconverter::TPointerProperty<T>& array)
+    {
+        elements = array.count;
+    }
+    template <typename T>
+    void operator()(const device::TVectorProperty<T>& vector)
+    {
+        elements = vector.values.size();
+    }
+    template <typename T>
+    void operator()(const device::TScalarProperty<T>& /*one*/)
+    {
+        elements = 1;
+        isScalar = std::is_arithmetic_v<T>;
+    }
+};
+
+/// Writes some of the elements of a field.
+struct Elements {
+    Output& output;
+    std::size_t begin;
+    std::size_t count;
+
+    template <typename T>
+    void operator()(const coderconverter::TPointerProperty<T>& array) const
+    {
+        if constexpr (std::is_same_v<T, bool>) { // a caller's may be neither 0 nor 1
+            each(reinterpret_cast<const unsigned char*>(array.data));
+        } else {
+            several(array.data);
+        }
+    }
+    template <typename T>
+    void operator()(const device::TVectorProperty<T>& vector) const
+    {
+        if constexpr (std::is_same_v<T, bool>) {
+            each(vector.values.begin());
+        } else {
+            several(vector.values.data());
+        }
+    }
+    template <typename T>
+    void operator()(const device::TScalarProperty<T>& scalar) const
+    {
+        if constexpr (std::is_same_v<T, bool>) {
+            each(&scalar.value);
+        } else if constexpr (std::is_arithmetic_v<T>) {
+            several(&scalar.value);
+        } else {
+            output.text(scalar.value);
+        }
+    }
+
+private:
+    template <typename T>
+    void several(const T* elements) const
+    {
+        if constexpr (std::is_arithmetic_v<T>) {
+            output.put(cbor_encode_tag, arrayTag<T>());
+            output.put(cbor_encode_bytestring_start, count * sizeof(T));
+            output.copy(elements + begin, count * sizeof(T));
+        } else {
+            output.put(cbor_encode_array_start, count);
+            std::for_each_n(elements + begin, count, [&](const T& text) { output.text(text); });
+        }
+    }
+
+    template <typename Flag>
+    void each(Flag flags) const
+    {
+        output.put(cbor_encode_array_start, count);
+        std::for_each_n(flags + static_cast<std::ptrdiff_t>(begin), count,
+                        [&](bool flag) { output.put(cbor_encode_bool, flag); });
+    }
+};
+
+/// A map of fields: those that go with the counts, or the constants.
+class FieldMap
+{
+public:
+    FieldMap(const Data& message, bool ofConstants) : data(message), isOfConstants(ofConstants)
+    {
+        for (const auto& [name, property] : *data.packet.fields) {
+            size += belongs(shapeOf(name, property)) ? 1U : 0U;
+        }
+    }
+
+    bool empty() const { return size == 0; }
+
+    void write(Output& output) const
+    {
+        output.put(cbor_encode_map_start, size);
+        for (const auto& [name, property] : *data.packet.fields) {
+            const Shape shape = shapeOf(name, property);
+            if (belongs(shape)) {
+                const std::uint64_t each = isOfConstants ? 0 : shape.elements / data.packet.counts;
+                output.text(name);
+                visitProperty(brenixplugin::asProperty(property),
+                              Elements{output, each * data.begin,
+                                       isOfConstants ? shape.elements : each * data.counts});
+            }
+        }
+    }
+
+private:
+    static Shape shapeOf(const std::string& name, void* property)
+    {
+        Shape shape;
+        if (!isUtf8(name) || !visitProperty(brenixplugin::asProperty(property), shape)) {
+            throw Malformed("Field " + name + " cannot be sent: its " +
+                            (isUtf8(name) ? "type is not known." : "name is not UTF-8."));
+        }
+        return shape;
+    }
+
+    bool belongs(const Shape& shape) const
+    {
+        const bool goesWithCounts =
+            !shape.isScalar && shape.elements > 0 && shape.elements % data.packet.counts == 0;
+        return goesWithCounts != isOfConstants;
+    }
+
+    const Data& data;
+    const bool isOfConstants;
+    std::size_t size = 0;
+};
+
+/// One message, its entries in the order of docs/messages.md.
+class Writer
+{
+public:
+    explicit Writer(unsigned char* place) : output(place) {}
+
+    std::size_t getSize() const { return output.getSize(); }
+
+    void operator()(const Hello& hello)
+    {
+        begin(hello.stream, hello.seq, 5);
+        entry("first", hello.first);
+        output.text("hello");
+        output.put(cbor_encode_map_start, std::size_t{4});
+        entry("name", hello.name);
+        entry("unit", hello.unit);
+        output.text("rate");
+        output.put(cbor_encode_double, hello.rate);
+        output.text("options");
+        output.put(cbor_encode_map_start, hello.options.size());
+        for (const auto& [name, value] : hello.options) {
+            entry(name, value);
+        }
+    }
+
+    void operator()(const Data& data)
+    {
+        const FieldMap fields(data, false);
+        const FieldMap constants(data, true);
+        begin(data.stream, data.seq, constants.empty() ? 8 : 9);
+        entry("first", data.first);
+        entry("counts", data.counts);
+        output.text("time");
+        const std::int64_t time = data.packet.time;
+        const auto magnitude = static_cast<std::uint64_t>(time < 0 ? -1 - time : time);
+        output.put(time < 0 ? cbor_encode_negint : cbor_encode_uint, magnitude);
+        entry("lost", data.packet.lost);
+        output.text("fields");
+        fields.write(output);
+        if (!constants.empty()) {
+            output.text("constants");
+            constants.write(output);
+        }
+    }
+
+    void operator()(const End& end)
+    {
+        begin(end.stream, end.seq, 4);
+        entry("end", end.counts);
+    }
+
+private:
+    void begin(const std::string& stream, std::uint64_t seq, std::size_t entries)
+    {
+        output.put(cbor_encode_map_start, entries);
+        entry("v", std::uint64_t{1});
+        entry("stream", stream);
+        entry("seq", seq);
+    }
+
+    void entry(const std::string& key, std::uint64_t value)
+    {
+        output.text(key);
+        output.number(value);
+    }
+    void entry(const std::string& key, const std::string& value)
+    {
+        output.text(key);
+        output.text(value);
+    }
+
+    Output output;
+};
+
+} // namespace
+
+std::size_t sizeOf(const Message& message)
+{
+    Writer writer(nullptr);
+    std::visit(writer, message);
+    return writer.getSize();
+}
+
+void write(const Message& message, unsigned char* bytes)
+{
+    Writer writer(bytes);
+    std::visit(writer, message);
+}
+
+} // namespace messages
