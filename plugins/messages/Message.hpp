@@ -55,12 +55,14 @@ public:
     using std::runtime_error::runtime_error;
 };
 
-/// The bytes that a message takes.
-/// @throws Malformed for a field of a class that is not known
-std::size_t sizeOf(const Message& message);
+/// The bytes that a message takes: a Hello, a Data or an End.
+/// @throws Malformed for a field that no message can hold
+template <typename Kind>
+std::size_t sizeOf(const Kind& message);
 
 /// Writes those bytes; arrays are copied once, from their field to their place.
-void write(const Message& message, unsigned char* bytes);
+template <typename Kind>
+void write(const Kind& message, unsigned char* bytes);
 
 /// Reads a message. Nothing in it is trusted: no memory is taken for what is not there, and an array has
 /// at most `maxArray` bytes. Arrays are copied once, from their place to their field.

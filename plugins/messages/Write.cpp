@@ -270,17 +270,26 @@ private:
 
 } // namespace
 
-std::size_t sizeOf(const Message& message)
+template <typename Kind>
+std::size_t sizeOf(const Kind& message)
 {
     Writer writer(nullptr);
-    std::visit(writer, message);
+    writer(message);
     return writer.getSize();
 }
 
-void write(const Message& message, unsigned char* bytes)
+template <typename Kind>
+void write(const Kind& message, unsigned char* bytes)
 {
     Writer writer(bytes);
-    std::visit(writer, message);
+    writer(message);
 }
+
+template std::size_t sizeOf(const Hello& message);
+template std::size_t sizeOf(const Data& message);
+template std::size_t sizeOf(const End& message);
+template void write(const Hello& message, unsigned char* bytes);
+template void write(const Data& message, unsigned char* bytes);
+template void write(const End& message, unsigned char* bytes);
 
 } // namespace messages
