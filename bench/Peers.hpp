@@ -60,6 +60,7 @@ struct Peer {
     const std::size_t elements;
     const std::size_t bytes;
     std::size_t capacity = std::numeric_limits<std::size_t>::max();
+    bool returns = true; ///< the blocks
 };
 
 /// A channel of this library that returns what is written to it.
