@@ -129,6 +129,10 @@ TEST(MessageTest, WhatIsNoMessageIsRefusedWithWhatAndWhere)
     }
 
     const auto field = [](const std::string& value) { return mapOf({{"data", value}}); };
+    std::map<std::string, std::string> many;
+    for (int i = 0; i < 33; ++i) {
+        many[std::to_string(i)] = number(0);
+    }
     const std::string huge = number(1ULL << 60U).substr(1);
     const struct {
         const char* name;
@@ -153,6 +157,7 @@ TEST(MessageTest, WhatIsNoMessageIsRefusedWithWhatAndWhere)
         {"fields", field(array(64, std::string(65, 'x'))), "of this type at most 64 are taken"},
         {"fields", field(head(6, 64) + "\x5B" + huge),
          "claims 1152921504606846985 bytes, of which 141 are there"},
+        {"fields", field(head(6, 64) + head(2, UINT64_MAX)), "claims 2^64 or more bytes, of which"},
         {"fields", field(head(6, 64) + "\x5F\xFF"), "must be of a given length"},
         {"fields", field(array(71, "12345678901")), "no whole number of elements of 8"},
         {"fields", field(array(76, "12")), "has tag 76"},
@@ -166,6 +171,11 @@ TEST(MessageTest, WhatIsNoMessageIsRefusedWithWhatAndWhere)
          "must be a text"},
         {"fields", field("\x83" + text("a") + text("b") + text("c")),
          "of this type at most 2 are taken"},
+        {"constants", mapOf({{"a", "\x81" + text("a")}, {"b", "\x81" + text("b")}}),
+         "field b, byte 68: has 1 elements; of this type at most 0 are taken"},
+        {"fields", field("\x81" + number(1)), "must be true or false, or a text"},
+        {"fields", mapOf({{std::string("a\0b", 3), array(64, "12")}}),
+         "1 to 255 bytes, none of them 0"},
         {"fields", field("\xF6"), "no simple value but true or false"},
         {"fields", field(number(1)), "must be a typed array"},
         {"fields", head(5, 2) + text("a") + array(64, "12") + text("a") + array(64, "12"),
@@ -174,6 +184,7 @@ TEST(MessageTest, WhatIsNoMessageIsRefusedWithWhatAndWhere)
         {"end", text("1"), "must be a whole number"},
         {"hello", mapOf({{"rate", "\xFB\x7F\xF0" + std::string(6, '\0')}}),
          "must be a number of 0 or more"},
+        {"hello", mapOf(many), "has 33 entries, more than 32"},
         {"hello", mapOf({{"options", mapOf({{"Gain", number(1)}})}}), "must be a text"},
     };
     for (const auto& row : rows) {
@@ -193,6 +204,25 @@ TEST(MessageTest, WhatIsNoMessageIsRefusedWithWhatAndWhere)
 }
 
 // --- Their order ---
+
+TEST(MessageTest, AHelloIsBeforeWhatTheWriterLostBehindItsLastPacket)
+{
+    brenixplugin::OwnedPropertyMap options;
+    Options given(options.map);
+    Sender sender(given);
+    sender.begin();
+    Data data = dataOf("", 0, 0, 4);
+    for (const std::uint64_t lost : {0U, 3U}) {
+        sender.lose(lost);
+        const Hello hello = sender.hello(); // a reader that comes now is told of them
+        EXPECT_EQ(sender.end().counts, hello.first + lost);
+        sender.number(data, 0, 4);
+        EXPECT_EQ(data.first, hello.first + lost);
+        EXPECT_EQ(data.packet.lost, lost);
+        sender.sent(data);
+    }
+    EXPECT_EQ(sender.end().counts, 11U);
+}
 
 /// Notes what the receiver reports.
 struct Notes final : DeviceHost, DeviceStreams {

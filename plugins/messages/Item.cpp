@@ -1,8 +1,12 @@
 #include "Item.hpp"
 
 #include "Message.hpp"
+#include "Texts.hpp"
 
 #include <cbor.h>
+
+#include <algorithm>
+#include <cstring>
 
 namespace messages
 {
@@ -66,14 +70,16 @@ cbor_callbacks callbacksOfItems()
 
 Item Items::next()
 {
-    const cbor_callbacks callbacks = callbacksOfItems();
+    static const cbor_callbacks callbacks = callbacksOfItems();
     lastPosition = position;
     Item item;
     const cbor_decoder_result result =
         cbor_stream_decode(bytes + position, size - position, &callbacks, &item);
     if (result.status == CBOR_DECODER_NEDATA) {
-        fail("claims " + std::to_string(result.required) + " bytes, of which " +
-             std::to_string(size - position) + " are there");
+        const std::size_t there = size - position;
+        const bool isBeyond = result.required <= there; // of 64 bits
+        fail("claims " + (isBeyond ? "2^64 or more" : std::to_string(result.required)) +
+             " bytes, of which " + std::to_string(there) + " are there");
     }
     if (result.status != CBOR_DECODER_FINISHED) {
         fail("is not CBOR");
@@ -97,12 +103,60 @@ Item Items::next(Kind kind, const char* expected)
     return item;
 }
 
+std::string_view Items::text()
+{
+    const std::string_view text = next(Kind::Text, "a text").bytes;
+    if (!isUtf8(text)) {
+        fail("is not UTF-8");
+    }
+    return text;
+}
+
+std::string_view Items::name()
+{
+    const std::string_view name = text();
+    if (!hasLengthOfName(name)) {
+        fail("must have 1 to " + std::to_string(maxName) + " bytes, none of them 0");
+    }
+    return name;
+}
+
+std::uint64_t Items::map(std::uint64_t most)
+{
+    const std::uint64_t count = next(Kind::Map, "a map").value;
+    if (count > most) {
+        fail("has " + std::to_string(count) + " entries, more than " + std::to_string(most));
+    }
+    return count;
+}
+
+std::string_view Items::flags(std::uint64_t most)
+{
+    const unsigned char* const begin = bytes + position;
+    const unsigned char* const end = begin + std::min<std::uint64_t>(most, size - position);
+    constexpr std::uint64_t eightTrue = 0xF5F5F5F5F5F5F5F5;
+    constexpr std::uint64_t lowest = 0x0101010101010101; // bits, which alone tell false from true
+    const unsigned char* at = begin;
+    for (std::uint64_t eight = 0; static_cast<std::size_t>(end - at) >= sizeof eight;
+         at += sizeof eight) {
+        std::memcpy(&eight, at, sizeof eight);
+        if ((eight | lowest) != eightTrue) {
+            break;
+        }
+    }
+    while (at < end && (*at | 1U) == 0xF5) {
+        ++at;
+    }
+    position += static_cast<std::size_t>(at - begin);
+    return {reinterpret_cast<const char*>(begin), static_cast<std::size_t>(at - begin)};
+}
+
 void Items::skip()
 {
     for (std::size_t left = 1; left > 0; --left) {
         const Item item = next();
         if (item.kind == Kind::Array) {
-            left += item.value;
+            left += item.value - flags(item.value).size();
         } else if (item.kind == Kind::Map) {
             left += 2 * item.value;
         } else if (item.kind == Kind::Tag) {
@@ -118,7 +172,8 @@ void Items::skip()
 
 void Items::fail(const std::string& problem) const
 {
-    throw Malformed(where + ", byte " + std::to_string(lastPosition) + ": " + problem);
+    throw Malformed(std::string(prefix) + std::string(where) + ", byte " +
+                    std::to_string(lastPosition) + ": " + problem);
 }
 
 } // namespace messages

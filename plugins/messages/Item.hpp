@@ -28,17 +28,31 @@ public:
 
     std::size_t getPosition() const { return position; }
 
-    /// Goes to what the name says, for errors.
-    void go(std::size_t place, std::string_view name)
+    /// Goes to what the name says, for errors; it must stay, as what is in the message does.
+    void go(std::size_t place, std::string_view name, std::string_view before = "")
     {
         position = lastPosition = place;
         where = name;
+        prefix = before;
     }
 
     Item next();
 
     /// One of this kind.
     Item next(Item::Kind kind, const char* expected);
+
+    /// A text.
+    std::string_view text();
+
+    /// A text that names something.
+    std::string_view name();
+
+    /// The beginning of a map with at most so many entries, and how many it has.
+    std::uint64_t map(std::uint64_t most);
+
+    /// The logical values that come next, at most so many, of one byte each.
+    std::string_view flags(std::uint64_t most);
+    static constexpr auto valueOf = [](char flag) -> unsigned char { return flag & 1; };
 
     /// One item with all that is in it.
     void skip();
@@ -51,7 +65,8 @@ private:
     const std::size_t size;
     std::size_t position = 0;
     std::size_t lastPosition = 0;
-    std::string where = "the message";
+    std::string_view where = "the message";
+    std::string_view prefix; ///< of `where`
 };
 
 } // namespace messages

@@ -18,7 +18,7 @@ namespace messages
 struct Hello {
     std::string stream;
     std::uint64_t seq = 0;                      ///< of the next packet
-    std::uint64_t first = 0;                    ///< of the next packet
+    std::uint64_t first = 0;                    ///< number of the next count, lost or not
     std::string name;                           ///< the writer's for itself
     std::string unit;                           ///< of the numbers; empty: not known
     double rate = 0;                            ///< counts a second; 0: not known
@@ -34,7 +34,7 @@ struct Data {
     /// Its fields, `time` and `lost` are those of the message. A message that was read has all `counts`.
     brenixcore::plugin::Packet packet;
 
-    // Of the counts of `packet`, those of the message, when one is written:
+    // Of the counts of `packet`, one or more, those of the message, when one is written:
     std::uint64_t begin = 0;
     std::uint64_t counts = 0;
 };
@@ -64,10 +64,10 @@ std::size_t sizeOf(const Kind& message);
 template <typename Kind>
 void write(const Kind& message, unsigned char* bytes);
 
-/// Reads a message. Nothing in it is trusted: no memory is taken for what is not there, and an array has
-/// at most `maxArray` bytes. Arrays are copied once, from their place to their field.
+/// Reads a message. Nothing in it is trusted: no memory is taken for what is not there, and its arrays
+/// take at most `maxArrays` bytes. Arrays are copied once, from their place to their field.
 /// @throws Malformed
-Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArray);
+Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArrays);
 
 } // namespace messages
 

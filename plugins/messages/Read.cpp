@@ -1,19 +1,13 @@
 // From the bytes of a message to what it says.
 
-#include "Arrays.hpp"
+#include "Fields.hpp"
 #include "Item.hpp"
 #include "Message.hpp"
-#include "Texts.hpp"
-
-#include "brenixcore/plugin/Make.hpp"
 
 #include <algorithm>
-#include <array>
-#include <bit>
 #include <cmath>
-#include <cstring>
 #include <limits>
-#include <memory>
+#include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
@@ -25,170 +19,9 @@ namespace
 {
 
 using namespace brenixcore::plugin;
-using brenixplugin::OwnedProperty;
-using brenixplugin::PropertyMap;
 using Kind = Item::Kind;
 
-std::string textOf(Items& items)
-{
-    const std::string_view text = items.next(Kind::Text, "a text").bytes;
-    if (!isUtf8(text)) {
-        items.fail("is not UTF-8");
-    }
-    return std::string(text);
-}
-
-/// A field on its way from the message.
-struct Field {
-    std::string name;
-    OwnedProperty property;
-    std::uint64_t elements;
-};
-
-template <typename T>
-T reversed(T value)
-{
-    auto bytes = std::bit_cast<std::array<unsigned char, sizeof(T)>>(value);
-    std::reverse(bytes.begin(), bytes.end());
-    return std::bit_cast<T>(bytes);
-}
-
-/// Reads fields, each with its name before it.
-class FieldReader
-{
-public:
-    FieldReader(Items& messageItems, std::size_t mostOfArray, bool ofConstants)
-        : items(messageItems), maxArray(mostOfArray), areConstants(ofConstants)
-    {
-    }
-
-    Field read()
-    {
-        Field field{textOf(items), nullptr, 1};
-        items.go(items.getPosition(), "field " + field.name);
-        const Item item = items.next();
-        if (item.kind == Kind::Tag) {
-            readNumbers(field, item.value);
-        } else if (item.kind == Kind::Array) {
-            readEach(field, item.value);
-        } else if (item.kind == Kind::Bytes || (item.kind == Kind::Text && isUtf8(item.bytes))) {
-            field.property = makeScalar(field.name, std::string(item.bytes));
-        } else {
-            items.fail(
-                item.kind == Kind::Text
-                    ? "is not UTF-8"
-                    : "must be a typed array, an array of logical values or of texts, or a text");
-        }
-        return field;
-    }
-
-private:
-    void requireSize(std::uint64_t elements, std::size_t each) const
-    {
-        if (elements > maxArray / each) {
-            items.fail("has " + std::to_string(elements) + " elements; of this type at most " +
-                       std::to_string(maxArray / each) + " are taken (MaxMessage)");
-        }
-    }
-
-    void readNumbers(Field& field, std::uint64_t tag)
-    {
-        const std::string_view bytes = items.next(Kind::Bytes, "the bytes of a typed array").bytes;
-        requireSize(bytes.size(), 1);
-        const bool isLittle = (tag & 4U) != 0;
-        const bool isReversed = isLittle != (std::endian::native == std::endian::little);
-        const auto take = [&](auto element) {
-            takeArray<decltype(element)>(field, bytes, isReversed);
-        };
-        switch (tag) {
-        case 64:
-        case 68: // clamped, when it was made
-            return take(static_cast<unsigned char>(0));
-        case 65:
-        case 69:
-            return take(static_cast<unsigned short>(0));
-        case 66:
-        case 70:
-            return take(0U);
-        case 67:
-        case 71:
-            return take(0UL);
-        case 72:
-            return take(static_cast<signed char>(0));
-        case 73:
-        case 77:
-            return take(static_cast<short>(0));
-        case 74:
-        case 78:
-            return take(0);
-        case 75:
-        case 79:
-            return take(0L);
-        case 81:
-        case 85:
-            return take(0.0F);
-        case 82:
-        case 86:
-            return take(0.0);
-        default:
-            items.fail("has tag " + std::to_string(tag) +
-                       ", which is that of none of the arrays of 8 to 64 bits");
-        }
-    }
-
-    template <typename T>
-    void takeArray(Field& field, std::string_view bytes, bool isReversed)
-    {
-        if (bytes.size() % sizeof(T) != 0) {
-            items.fail("has " + std::to_string(bytes.size()) +
-                       " bytes, which is no whole number of elements of " +
-                       std::to_string(sizeof(T)));
-        }
-        field.elements = bytes.size() / sizeof(T);
-        std::unique_ptr<T[]> elements(new T[field.elements]);
-        if (!bytes.empty()) {
-            std::memcpy(elements.get(), bytes.data(), bytes.size());
-        }
-        if (isReversed && sizeof(T) > 1) {
-            std::transform(elements.get(), elements.get() + field.elements, elements.get(),
-                           reversed<T>);
-        }
-        take(field, std::move(elements));
-    }
-
-    /// Logical values, or texts.
-    void readEach(Field& field, std::uint64_t count)
-    {
-        field.elements = count;
-        const std::size_t begin = items.getPosition();
-        if (count > 0 && items.next().kind == Kind::Text) {
-            requireSize(count, sizeof(std::string));
-            items.go(begin, "field " + field.name);
-            auto texts = std::make_unique<std::string[]>(count);
-            std::generate_n(texts.get(), count, [&] { return textOf(items); });
-            return take(field, std::move(texts));
-        }
-        requireSize(count, 1);
-        items.go(begin, "field " + field.name);
-        std::unique_ptr<bool[]> flags(new bool[count]);
-        std::generate_n(flags.get(), count, [&] {
-            return items.next(Kind::Bool, "true or false, as the elements before it").value != 0;
-        });
-        take(field, std::move(flags));
-    }
-
-    template <typename T>
-    void take(Field& field, std::unique_ptr<T[]> elements) const
-    {
-        field.property = areConstants && field.elements == 1
-                             ? makeScalar(field.name, std::move(elements[0]))
-                             : makeArray(field.name, std::move(elements), field.elements);
-    }
-
-    Items& items;
-    const std::size_t maxArray;
-    const bool areConstants; ///< a single one is a scalar then
-};
+constexpr std::uint64_t maxFields = 65536; // each takes memory of its own
 
 /// The entries of a map by their names, to be read in any order.
 class Entries
@@ -197,14 +30,11 @@ public:
     /// The map is the item that comes next.
     explicit Entries(Items& messageItems) : items(messageItems)
     {
-        const std::uint64_t count = items.next(Kind::Map, "a map").value;
-        if (count > most) {
-            items.fail("has " + std::to_string(count) + " entries, more than " +
-                       std::to_string(most));
-        }
+        constexpr std::uint64_t most = 32;
+        const std::uint64_t count = items.map(most);
+        places.reserve(count);
         for (std::uint64_t left = count; left > 0; --left) {
-            const std::string_view name =
-                items.next(Kind::Text, "a text, the name of an entry").bytes;
+            const std::string_view name = items.name();
             const std::size_t place = items.getPosition();
             if (find(name)) {
                 items.fail("is there twice");
@@ -253,11 +83,12 @@ public:
     }
 
     /// Empty when there is none.
-    std::string text(std::string_view name) { return find(name) ? textOf(items) : ""; }
+    std::string text(std::string_view name)
+    {
+        return std::string(find(name) ? items.text() : std::string_view());
+    }
 
 private:
-    static constexpr std::uint64_t most = 32;
-
     Items& items;
     std::vector<std::pair<std::string_view, std::size_t>> places;
 };
@@ -265,8 +96,8 @@ private:
 class Reader
 {
 public:
-    Reader(const unsigned char* bytes, std::size_t size, std::size_t mostOfArray)
-        : items(bytes, size), entries(items), maxArray(mostOfArray)
+    Reader(const unsigned char* bytes, std::size_t size, std::size_t mostOfArrays)
+        : items(bytes, size), entries(items), maxArrays(mostOfArrays)
     {
         if (items.getPosition() < size) {
             throw Malformed(std::to_string(size - items.getPosition()) +
@@ -280,10 +111,7 @@ public:
     Message read()
     {
         entries.require("stream");
-        std::string stream = textOf(items);
-        if (stream.empty() || stream.size() > maxName) {
-            items.fail("must have 1 to " + std::to_string(maxName) + " bytes");
-        }
+        std::string stream(items.name());
         if (entries.find("hello")) {
             return readHello(std::move(stream));
         }
@@ -294,8 +122,6 @@ public:
     }
 
 private:
-    static constexpr std::size_t maxName = 255;
-
     Message readHello(std::string stream)
     {
         Hello hello{
@@ -314,9 +140,10 @@ private:
             }
         }
         if (writer.find("options")) {
-            for (std::uint64_t left = items.next(Kind::Map, "a map").value; left > 0; --left) {
-                std::string name = textOf(items);
-                hello.options[std::move(name)] = textOf(items);
+            for (std::uint64_t left = items.map(maxFields); left > 0; --left) {
+                const std::string_view name = items.name();
+                items.go(items.getPosition(), name, "option ");
+                hello.options[std::string(name)] = items.text();
             }
         }
         return hello;
@@ -339,18 +166,18 @@ private:
             items.fail("must be 1 or more, and fit in 64 bits with first");
         }
         entries.require("fields");
-        readFields(data.packet, false);
+        FieldReader reader(items, maxArrays);
+        readFields(reader, data.packet, false);
         if (entries.find("constants")) {
-            readFields(data.packet, true);
+            readFields(reader, data.packet, true);
         }
         return data;
     }
 
-    void readFields(Packet& packet, bool areConstants)
+    void readFields(FieldReader& reader, Packet& packet, bool areConstants)
     {
-        FieldReader reader(items, maxArray, areConstants);
-        for (std::uint64_t left = items.next(Kind::Map, "a map").value; left > 0; --left) {
-            Field field = reader.read();
+        for (std::uint64_t left = items.map(maxFields); left > 0; --left) {
+            Field field = reader.read(areConstants);
             const bool fits = field.elements > 0 && field.elements % packet.counts == 0;
             if (!areConstants && !fits) {
                 items.fail("has " + std::to_string(field.elements) + " elements for " +
@@ -365,14 +192,14 @@ private:
 
     Items items;
     Entries entries;
-    const std::size_t maxArray;
+    const std::size_t maxArrays;
 };
 
 } // namespace
 
-Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArray)
+Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArrays)
 {
-    return Reader(bytes, size, maxArray).read();
+    return Reader(bytes, size, maxArrays).read();
 }
 
 } // namespace messages

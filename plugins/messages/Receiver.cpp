@@ -74,8 +74,9 @@ Receiver::Writer& Receiver::find(const std::string& stream, std::uint64_t seq, s
     if (writers.size() >= most) {
         throw Malformed("stream: more than " + std::to_string(most) + " have not ended");
     }
+    Writer& added = writers.emplace(stream, Writer{seq, first}).first->second;
     ++open;
-    return writers.emplace(stream, Writer{seq, first}).first->second;
+    return added;
 }
 
 void Receiver::take(const Hello& hello)
@@ -118,7 +119,7 @@ std::optional<Packet> Receiver::take(Data&& data, DeviceStreams& streams)
     if (lost > 0) {
         streams.tellLost(lost, reason.c_str());
     }
-    return std::move(packet);
+    return std::optional<Packet>(std::move(packet));
 }
 
 void Receiver::take(const End& end, DeviceStreams& streams)

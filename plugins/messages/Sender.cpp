@@ -29,7 +29,7 @@ Sender::Sender(brenixcore::plugin::Options& options)
 {
     using brenixcore::plugin::Options;
     const auto text = [&](const char* name, const std::string& value, std::size_t least) {
-        const std::string given = options.text(name).value_or(value);
+        std::string given = options.text(name).value_or(value);
         if (given.size() < least || given.size() > 200 || !isUtf8(given)) {
             Options::fail(name, "must be UTF-8 of " + std::to_string(least) + " to 200 bytes");
         }
@@ -74,7 +74,7 @@ void Sender::number(Data& data, std::uint64_t begin, std::uint64_t counts) const
     packet.lost = lost;
     data.stream = description.stream;
     data.seq = description.seq;
-    data.first = description.first;
+    data.first = description.first + lost;
     data.begin = begin;
     data.counts = counts;
 }
@@ -82,13 +82,12 @@ void Sender::number(Data& data, std::uint64_t begin, std::uint64_t counts) const
 void Sender::sent(const Data& data)
 {
     ++description.seq;
-    description.first += data.counts;
+    description.first = data.first + data.counts;
     lost = 0;
 }
 
 void Sender::lose(std::uint64_t counts)
 {
-    description.first += counts;
     lost += counts;
 }
 

@@ -43,11 +43,11 @@ public:
     /// Counts that will not be sent: the next message tells.
     void lose(std::uint64_t counts);
 
-    End end() const { return {description.stream, description.seq, description.first}; }
+    End end() const { return {description.stream, description.seq, description.first + lost}; }
 
 private:
     Hello description;
-    std::uint64_t lost = 0; ///< since the last message
+    std::uint64_t lost = 0; ///< behind the last message
 };
 
 } // namespace messages

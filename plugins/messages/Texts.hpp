@@ -1,9 +1,11 @@
-// Texts in messages are UTF-8.
+// Texts in messages are UTF-8; names of fields, options and streams are short as well.
 #ifndef BRENIX_PLUGINS_MESSAGES_TEXTS_HPP
 #define BRENIX_PLUGINS_MESSAGES_TEXTS_HPP
 
 #include <algorithm>
+#include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <string>
 #include <string_view>
 
@@ -13,12 +15,23 @@ namespace messages
 inline bool isUtf8(std::string_view text)
 {
     for (std::size_t i = 0; i < text.size();) {
+        std::uint64_t eight = 0; // most texts are ASCII
+        if (text.size() - i >= sizeof eight) {
+            std::memcpy(&eight, text.data() + i, sizeof eight);
+            if ((eight & 0x8080808080808080) == 0) {
+                i += sizeof eight;
+                continue;
+            }
+        }
         const auto byte = [&](std::size_t at) {
             return at < text.size() ? static_cast<unsigned char>(text[at]) : 0U;
         };
         const unsigned int first = byte(i);
-        const std::size_t length = first < 0x80   ? 1
-                                   : first < 0xC2 ? 0
+        if (first < 0x80) {
+            ++i;
+            continue;
+        }
+        const std::size_t length = first < 0xC2   ? 0
                                    : first < 0xE0 ? 2
                                    : first < 0xF0 ? 3
                                    : first < 0xF5 ? 4
@@ -38,6 +51,13 @@ inline bool isUtf8(std::string_view text)
         i += length;
     }
     return true;
+}
+
+constexpr std::size_t maxName = 255; ///< bytes
+
+inline bool hasLengthOfName(std::string_view text)
+{
+    return !text.empty() && text.size() <= maxName && text.find('\0') == std::string_view::npos;
 }
 
 /// The bytes of a text that a caller wrote, who has a code unit for each byte, by sign extension; UTF-8 of

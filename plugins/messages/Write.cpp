@@ -11,6 +11,7 @@
 #include <algorithm>
 #include <array>
 #include <cstring>
+#include <string_view>
 
 namespace messages
 {
@@ -29,13 +30,12 @@ public:
 
     std::size_t getSize() const { return size; }
 
-    /// One of libcbor's functions.
+    /// One of libcbor's functions. It writes what its result says, and no byte more.
     template <typename Encode, typename Value>
     void put(Encode encode, Value value)
     {
-        std::array<unsigned char, 9> head{}; // the longest
-        const std::size_t length = encode(value, head.data(), head.size());
-        copy(head.data(), length);
+        std::array<unsigned char, longestHead> unseen;
+        size += encode(value, bytes != nullptr ? bytes + size : unseen.data(), longestHead);
     }
 
     void copy(const void* data, std::size_t length)
@@ -46,7 +46,28 @@ public:
         size += length;
     }
 
+    /// Logical values, of one byte each.
+    template <typename Flag>
+    void flags(Flag begin, std::size_t count)
+    {
+        unsigned char none = 0;
+        cbor_encode_bool(false, &none, 1);
+        if (bytes != nullptr) {
+            std::transform(
+                begin, begin + static_cast<std::ptrdiff_t>(count), bytes + size,
+                [none](bool flag) { return static_cast<unsigned char>(none | (flag ? 1 : 0)); });
+        }
+        size += count;
+    }
+
     void number(std::uint64_t value) { put(cbor_encode_uint, value); }
+
+    /// One that is known to be UTF-8.
+    void name(std::string_view text)
+    {
+        put(cbor_encode_string_start, text.size());
+        copy(text.data(), text.size());
+    }
 
     /// What is not UTF-8 stays as it is, as bytes.
     void text(const std::string& value)
@@ -57,6 +78,8 @@ public:
     void text(const std::u16string& value) { text(toBytes(value)); }
 
 private:
+    static constexpr std::size_t longestHead = 9;
+
     unsigned char* const bytes;
     std::size_t size = 0;
 };
@@ -138,61 +161,19 @@ private:
     void each(Flag flags) const
     {
         output.put(cbor_encode_array_start, count);
-        std::for_each_n(flags + static_cast<std::ptrdiff_t>(begin), count,
-                        [&](bool flag) { output.put(cbor_encode_bool, flag); });
+        output.flags(flags + static_cast<std::ptrdiff_t>(begin), count);
     }
 };
 
-/// A map of fields: those that go with the counts, or the constants.
-class FieldMap
+/// @throws Malformed for a field of no class that a packet may have
+Shape shapeOf(const std::string& name, void* property)
 {
-public:
-    FieldMap(const Data& message, bool ofConstants) : data(message), isOfConstants(ofConstants)
-    {
-        for (const auto& [name, property] : *data.packet.fields) {
-            size += belongs(shapeOf(name, property)) ? 1U : 0U;
-        }
+    Shape shape;
+    if (!visitProperty(brenixplugin::asProperty(property), shape)) {
+        throw Malformed("Field " + name + " cannot be sent: its type is not known.");
     }
-
-    bool empty() const { return size == 0; }
-
-    void write(Output& output) const
-    {
-        output.put(cbor_encode_map_start, size);
-        for (const auto& [name, property] : *data.packet.fields) {
-            const Shape shape = shapeOf(name, property);
-            if (belongs(shape)) {
-                const std::uint64_t each = isOfConstants ? 0 : shape.elements / data.packet.counts;
-                output.text(name);
-                visitProperty(brenixplugin::asProperty(property),
-                              Elements{output, each * data.begin,
-                                       isOfConstants ? shape.elements : each * data.counts});
-            }
-        }
-    }
-
-private:
-    static Shape shapeOf(const std::string& name, void* property)
-    {
-        Shape shape;
-        if (!isUtf8(name) || !visitProperty(brenixplugin::asProperty(property), shape)) {
-            throw Malformed("Field " + name + " cannot be sent: its " +
-                            (isUtf8(name) ? "type is not known." : "name is not UTF-8."));
-        }
-        return shape;
-    }
-
-    bool belongs(const Shape& shape) const
-    {
-        const bool goesWithCounts =
-            !shape.isScalar && shape.elements > 0 && shape.elements % data.packet.counts == 0;
-        return goesWithCounts != isOfConstants;
-    }
-
-    const Data& data;
-    const bool isOfConstants;
-    std::size_t size = 0;
-};
+    return shape;
+}
 
 /// One message, its entries in the order of docs/messages.md.
 class Writer
@@ -206,13 +187,13 @@ public:
     {
         begin(hello.stream, hello.seq, 5);
         entry("first", hello.first);
-        output.text("hello");
+        output.name("hello");
         output.put(cbor_encode_map_start, std::size_t{4});
         entry("name", hello.name);
         entry("unit", hello.unit);
-        output.text("rate");
+        output.name("rate");
         output.put(cbor_encode_double, hello.rate);
-        output.text("options");
+        output.name("options");
         output.put(cbor_encode_map_start, hello.options.size());
         for (const auto& [name, value] : hello.options) {
             entry(name, value);
@@ -221,21 +202,29 @@ public:
 
     void operator()(const Data& data)
     {
-        const FieldMap fields(data, false);
-        const FieldMap constants(data, true);
-        begin(data.stream, data.seq, constants.empty() ? 8 : 9);
+        std::size_t fields = 0;
+        std::size_t constants = 0;
+        for (const auto& [name, property] : *data.packet.fields) {
+            if (!hasLengthOfName(name) || !isUtf8(name)) {
+                throw Malformed("Field " + name +
+                                " cannot be sent: its name is not UTF-8 of 1 to " +
+                                std::to_string(maxName) + " bytes.");
+            }
+            ++(isDivided(data, shapeOf(name, property)) ? fields : constants);
+        }
+        begin(data.stream, data.seq, constants == 0 ? 8 : 9);
         entry("first", data.first);
         entry("counts", data.counts);
-        output.text("time");
+        output.name("time");
         const std::int64_t time = data.packet.time;
         const auto magnitude = static_cast<std::uint64_t>(time < 0 ? -1 - time : time);
         output.put(time < 0 ? cbor_encode_negint : cbor_encode_uint, magnitude);
         entry("lost", data.packet.lost);
-        output.text("fields");
-        fields.write(output);
-        if (!constants.empty()) {
-            output.text("constants");
-            constants.write(output);
+        output.name("fields");
+        writeFields(data, fields, true);
+        if (constants > 0) {
+            output.name("constants");
+            writeFields(data, constants, false);
         }
     }
 
@@ -246,6 +235,28 @@ public:
     }
 
 private:
+    /// Whether the elements go with the counts.
+    static bool isDivided(const Data& data, const Shape& shape)
+    {
+        return !shape.isScalar && shape.elements > 0 && shape.elements % data.packet.counts == 0;
+    }
+
+    /// Those that are divided, or the others.
+    void writeFields(const Data& data, std::size_t size, bool divided)
+    {
+        output.put(cbor_encode_map_start, size);
+        for (const auto& [name, property] : *data.packet.fields) {
+            const Shape shape = shapeOf(name, property);
+            if (isDivided(data, shape) == divided) {
+                const std::uint64_t each = divided ? shape.elements / data.packet.counts : 0;
+                output.name(name);
+                visitProperty(brenixplugin::asProperty(property),
+                              Elements{output, each * data.begin,
+                                       divided ? each * data.counts : shape.elements});
+            }
+        }
+    }
+
     void begin(const std::string& stream, std::uint64_t seq, std::size_t entries)
     {
         output.put(cbor_encode_map_start, entries);
@@ -254,14 +265,14 @@ private:
         entry("seq", seq);
     }
 
-    void entry(const std::string& key, std::uint64_t value)
+    void entry(std::string_view key, std::uint64_t value)
     {
-        output.text(key);
+        output.name(key);
         output.number(value);
     }
-    void entry(const std::string& key, const std::string& value)
+    void entry(std::string_view key, const std::string& value)
     {
-        output.text(key);
+        output.name(key);
         output.text(value);
     }
 
