@@ -35,7 +35,7 @@ def load(folder):
             name = program + ":" + run["name"].removesuffix("/real_time").removesuffix(
                 "/manual_time").removesuffix("/iterations:1/real_time").removesuffix("/iterations:1")
             # One thread alone is measured by its own clock, which stops while others run.
-            own = run["name"].endswith("_time") or program != "calls"
+            own = run["name"].endswith("_time") or program not in ("calls", "messages")
             figures.setdefault(name, []).append(run["real_time" if own else "cpu_time"])
             for counter in ("allocations", "bytes_per_second", "residentBytes"):
                 if counter in run:
@@ -154,6 +154,21 @@ def stream_rows(report):
                100)
 
 
+def message_rows(report):
+    if not report.has("messages:message/64/copy"):
+        report.left_out("a packet to a message and back", "memcpy")
+        return
+    for way, what in (("write", "a packet of doubles to a message"), ("read", "a message to a packet of doubles")):
+        for size, limit in (("64", 600), ("4096", 600)):
+            report.row(f"{what}, {SIZES[size]}: added", "memcpy", report.combine(
+                lambda ours, copy: ours - copy, f"messages:message/{size}/{way}",
+                f"messages:message/{size}/copy"), " ns", limit if way == "write" else 2.5 * limit)
+        for size, limit in (("65536", 1.75), ("1048576", 1.2)):
+            report.row(f"{what}, {SIZES[size]}", "memcpy", report.combine(
+                lambda ours, copy: ours / copy, f"messages:message/{size}/{way}",
+                f"messages:message/{size}/copy"), " x", limit)
+
+
 def machine(folder):
     """One line: processor, compiler, rounds, and how busy the machine was."""
     runs = [json.loads(file.read_text())["context"] for file in (folder / "rounds").glob("two-*")]
@@ -211,6 +226,7 @@ def main():
     report = Report(load(folder))
     call_rows(report)
     stream_rows(report)
+    message_rows(report)
     (folder / "results.json").write_text(
         json.dumps({"figures": report.figures, "rows": report.rows}, indent=1))
     text = machine(folder) + table(report.rows)
