@@ -14,6 +14,12 @@
 namespace messages
 {
 
+/// Whether it can be the rate of a writer: 0, or at least a count in eleven days.
+constexpr bool isRate(double rate)
+{
+    return rate == 0 || (rate >= 1e-6 && rate <= 1e15);
+}
+
 /// What a writer says of itself.
 struct Hello {
     std::string stream;

@@ -5,7 +5,6 @@
 #include "Message.hpp"
 
 #include <algorithm>
-#include <cmath>
 #include <limits>
 #include <string>
 #include <string_view>
@@ -135,8 +134,8 @@ private:
             hello.rate = rate.kind == Kind::Float      ? rate.number
                          : rate.kind == Kind::Unsigned ? static_cast<double>(rate.value)
                                                        : -1;
-            if (!(hello.rate >= 0) || std::isinf(hello.rate)) {
-                items.fail("must be a number of 0 or more");
+            if (!isRate(hello.rate)) {
+                items.fail("must be 0, or a number from 1e-6 to 1e15");
             }
         }
         if (writer.find("options")) {

@@ -63,7 +63,7 @@ void Receiver::skip(const std::string& origin, const char* problem)
 
 Receiver::Writer& Receiver::find(const std::string& stream, std::uint64_t seq, std::uint64_t first)
 {
-    constexpr std::size_t most = 65536; // of which the memory is taken
+    constexpr std::size_t most = 1U << 20U; // more than the channels of the largest plant
     const auto found = writers.find(stream);
     if (found != writers.end()) {
         return found->second;
@@ -92,20 +92,24 @@ void Receiver::take(const Hello& hello)
 
 std::optional<Packet> Receiver::take(Data&& data, DeviceStreams& streams)
 {
-    // A reader that comes late misses nothing: for it, the stream begins here.
     Packet& packet = data.packet;
-    const std::uint64_t begin = data.seq == 0 ? 0 : data.first - packet.lost;
-    Writer& writer = find(data.stream, data.seq, begin);
+    const auto contradicts = [&](std::uint64_t end) {
+        throw Malformed("first: " + std::to_string(data.first) +
+                        " contradicts the packet before, which ended at " + std::to_string(end));
+    };
+    if (data.seq == 0 && data.first != packet.lost) {
+        contradicts(0);
+    }
+    // A reader that comes late misses nothing: for it, the stream begins here.
+    Writer& writer = find(data.stream, data.seq, data.first - packet.lost);
     if (data.seq < writer.seq) {
         return std::nullopt; // it was there before
     }
     const std::uint64_t skipped = data.seq - writer.seq; // packets, of one count at least
     const std::uint64_t missing = data.first - writer.first;
     if (data.first < writer.first || missing < packet.lost || missing - packet.lost < skipped ||
-        (skipped == 0 && missing != packet.lost)) {
-        throw Malformed("first: " + std::to_string(data.first) +
-                        " contradicts the packet before, which ended at " +
-                        std::to_string(writer.first));
+        (skipped == 0 && missing != packet.lost) || writer.hasEnded) {
+        contradicts(writer.first);
     }
     setField(packet, makeScalar("Source", data.stream));
     packet.index = data.first;

@@ -38,8 +38,8 @@ Sender::Sender(brenixcore::plugin::Options& options)
     description.name = text("Name", nameOfMachine(), 1);
     description.unit = text("Unit", "", 0);
     description.rate = options.number("Rate").value_or(0);
-    if (!(description.rate >= 0) || std::isinf(description.rate)) {
-        Options::fail("Rate", "must be 0 or more");
+    if (!isRate(description.rate)) {
+        Options::fail("Rate", "must be 0 or from 1e-6 to 1e15");
     }
 }
 
