@@ -41,6 +41,9 @@ mkdir folder
 # exit code | text in the output | arguments
 while IFS='|' read -r code text arguments; do
     eval "set -- $arguments"
+    if [[ $1 == keys || ${2:-} == zmq ]] && [[ ! -e $build/lib/brenix-plugins/zmq.so ]]; then
+        continue # it was left out
+    fi
     got=0
     timeout -k 5 20 brenix "$@" >out 2>&1 </dev/null || got=$?
     if [[ $got -ne $code ]] || ! grep -qF -- "$text" out || grep -q 'brenix: brenix:' out; then
@@ -98,10 +101,16 @@ done <<END
 2|--time needs csv, not wav|read signal --time -n 1 -w time.wav
 0|read 1200 counts|read signal -o Pace=fast -n 1.2k -r 1M --limit 4Ki -w kilo.csv
 2|--block: 2Mi is not a whole number from 1 to 1048576|write loopback -b 2Mi
-2|foo is no command: there are plugins, check, info, read, write, scope|foo
+2|foo is no command: there are plugins, check, info, read, write, scope, keys|foo
 2|a command is missing: there are plugins|''
 2|--nonsense; see brenix read --help|read signal --nonsense
 0|Usage: brenix write|help write
+0|{"secretKeyFile":"a.key","publicKeyFile":"a.key.pub","publicKey":"|keys a.key --json
+1|a.key: File exists|keys a.key
+1|none/a.key: No such file or directory|keys none/a.key
+2|file is required|keys
+1|Could not bind tcp://nowhere:5000: No such device|write zmq -o Endpoint=tcp://nowhere:5000 -o Pattern=push -i samples.csv
+1|Option Topic: is not for pull|read zmq -o Endpoint=tcp://127.0.0.1:5000 -o Pattern=pull -o Topic=a
 1|line 2: not a number of type double: \x1b[31m\xc2\x9bä\xff|write loopback -i escapes.csv
 1|brenix:Device:failed: failed in run; also: |write $plugins/probe.so -o Streams=o -o FailIn=run -b 1 -i many.csv
 1|brenix:InputStream:couldNotConvertInputData: 13 is refused|read $plugins/probe.so -c $plugins/pickyConverter.so -o Packets:int32=5,15 -w refused.csv
@@ -244,7 +253,9 @@ awk -F'|' '/^## / { gsub("`", "", $0); n = split($0, words, " "); plugin = words
         for (i = 2; i < NF; i++) { gsub(/[`"]/, "", $i); gsub(/^ +| +$/, "", $i) }
         if (NF == 7) print plugin "|" $2 "|" $3 "|" $4 "|" $5 "|" $6
         else if (NF == 6) print plugin "|" $2 "|" $3 "|" $4 "|-|" $5
-    }' "$source/docs/plugins.md" | sort >documented
+    }' "$source/docs/plugins.md" | sort | while IFS= read -r row; do
+    [[ ! -e $build/lib/brenix-plugins/${row%%|*}.so ]] || echo "$row" # some may be left out
+done >documented
 [[ $(wc -l <documented) -gt 30 ]] || fail "no tables found in plugins.md"
 diff described documented >&2 || fail "plug-ins and plugins.md differ"
 

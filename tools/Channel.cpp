@@ -129,6 +129,13 @@ void Channel::open(const ChannelSettings& settings)
                           [&](auto... list) { return coderChannelOpen(handle, list...); }));
 }
 
+void Channel::execute(const std::string& command, const std::vector<std::string>& options)
+{
+    check(callWithOptions(parseOptions(options, ""), [&](auto... list) {
+        return coderChannelExecute(handle, command.c_str(), list...);
+    }));
+}
+
 void Channel::finish(const std::optional<Failure>& failure, std::vector<Failure>* losses)
 {
     std::vector<Failure> failures;

@@ -77,6 +77,7 @@ public:
     ~Channel();
 
     void open(const ChannelSettings& settings);
+    void execute(const std::string& command, const std::vector<std::string>& options);
 
     /// Closes, when it is open, and terminates. Throws what fails, or the failure that ended a
     /// transfer, behind the device's errors if there are any: mostly they are the reason.

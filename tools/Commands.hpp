@@ -48,6 +48,7 @@ struct Settings {
     std::size_t window = 1024; ///< counts that the scope shows
     std::string png;
     std::string emitC;
+    std::string keyFile;
 };
 
 using Json = nlohmann::ordered_json;
@@ -64,6 +65,7 @@ ExitCode showInfo(const Settings& settings);
 ExitCode readSamples(const Settings& given);
 ExitCode writeSamples(const Settings& given);
 ExitCode showScope(const Settings& settings);
+ExitCode makeKeys(const Settings& settings);
 
 struct PropertyValue {
     std::string name;

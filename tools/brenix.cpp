@@ -183,6 +183,13 @@ ExitCode run(Settings& settings, int count, char** arguments)
         ->add_option("--png", settings.png, "Write a picture of all that was read (needs gnuplot)")
         ->type_name("FILE");
 
+    command = add("keys", "Make a pair of keys for the device zmq", makeKeys);
+    command
+        ->add_option("file", settings.keyFile,
+                     "New file of the secret key; FILE.pub is that of the public one")
+        ->type_name("FILE")
+        ->required();
+
     std::vector<std::string> words(arguments + 1, arguments + count);
     if (!words.empty() && words[0] == "help") { // as many programs have it
         words.erase(words.begin());

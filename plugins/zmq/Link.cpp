@@ -1,0 +1,392 @@
+#include "Link.hpp"
+
+#include "Keys.hpp"
+
+#include <sys/eventfd.h>
+#include <sys/ioctl.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <string_view>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+namespace zeromq
+{
+
+namespace
+{
+
+using std::chrono::milliseconds;
+
+constexpr std::string_view ipcPrefix = "ipc://";
+
+int typeOf(Pattern pattern)
+{
+    constexpr std::array types = {ZMQ_PUSH, ZMQ_PULL, ZMQ_XPUB, ZMQ_SUB};
+    return types.at(static_cast<std::size_t>(pattern));
+}
+
+/// Whether somebody listens at the file of an ipc endpoint: libzmq would take it away from him.
+bool isTaken(const std::string& endpoint)
+{
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    const std::string path = endpoint.substr(ipcPrefix.size());
+    if (path.size() >= sizeof address.sun_path) {
+        return false; // libzmq refuses it
+    }
+    std::copy(path.begin(), path.end(), address.sun_path);
+    const int handle = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    const int result =
+        ::connect(handle, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    const bool taken = result == 0 || errno == EAGAIN; // so many wait for him
+    ::close(handle);
+    return taken;
+}
+
+} // namespace
+
+WakeUp::WakeUp() : handle(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK))
+{
+    if (handle == -1) {
+        throw std::system_error(errno, std::generic_category(), "eventfd");
+    }
+}
+
+WakeUp::~WakeUp()
+{
+    ::close(handle);
+}
+
+void WakeUp::signal() noexcept
+{
+    if (!signalled.exchange(true)) { // or else it is on its way
+        ::eventfd_write(handle, 1);
+    }
+}
+
+void WakeUp::clear() noexcept
+{
+    eventfd_t times = 0;
+    ::eventfd_read(handle, &times);
+    signalled = false; // before anybody looks at what has changed
+}
+
+Link::Link(const Settings& linkSettings, brenixcore::plugin::DeviceHost& deviceHost)
+    : settings(linkSettings), host(deviceHost), context(zmq_ctx_new()), endpoint(settings.endpoint)
+{
+    if (!context) {
+        fail("Could not start libzmq");
+    }
+    socket = makeSocket(context.get(), typeOf(settings.pattern));
+    setOptions();
+    if (!settings.secretKeyFile.empty()) {
+        setKeys();
+    }
+    const char* const events = "inproc://events";
+    zmq_socket_monitor(socket.get(), events, ZMQ_EVENT_ALL);
+    monitor = makeSocket(context.get(), ZMQ_PAIR);
+    set(monitor.get(), ZMQ_RCVHWM, 0);
+    if (zmq_connect(monitor.get(), events) != 0) {
+        fail("Could not watch a socket");
+    }
+    if (!settings.binds) {
+        connect();
+        return;
+    }
+    if (endpoint.rfind(ipcPrefix, 0) == 0 && isTaken(endpoint)) {
+        throw std::runtime_error("Could not bind " + endpoint + ": Address already in use");
+    }
+    if (zmq_bind(socket.get(), endpoint.c_str()) != 0) {
+        failToBind(zmq_errno());
+    }
+    std::array<char, 1024> bound{};
+    std::size_t size = bound.size();
+    if (zmq_getsockopt(socket.get(), ZMQ_LAST_ENDPOINT, bound.data(), &size) == 0) {
+        endpoint = bound.data();
+    }
+}
+
+/// The event tells the error where zmq_bind() has another one by then.
+void Link::failToBind(int error)
+{
+    const auto look = [&](std::uint16_t event, std::uint32_t value) {
+        if (event == ZMQ_EVENT_BIND_FAILED && error == EAGAIN) {
+            error = static_cast<int>(value);
+        }
+    };
+    takeEvents(look);
+    throw std::runtime_error("Could not bind " + endpoint + ": " + zmq_strerror(error));
+}
+
+template <typename Take>
+void Link::takeEvents(const Take& handler)
+{
+    Frame event;
+    Frame address;
+    while (event.receive(monitor.get()) && address.receive(monitor.get())) {
+        std::uint16_t number = 0;
+        std::uint32_t value = 0;
+        std::memcpy(&number, event.data(), sizeof number);
+        std::memcpy(&value, event.data() + sizeof number, sizeof value);
+        handler(number, value);
+    }
+}
+
+void Link::setOptions()
+{
+    void* const to = socket.get();
+    set(to, ZMQ_SNDHWM, settings.highWater);
+    set(to, ZMQ_RCVHWM, settings.highWater);
+    set(to, ZMQ_IPV6, settings.endpoint.find('[') != std::string::npos ? 1 : 0);
+    if (settings.pattern == Pattern::Push) {
+        set(to, ZMQ_IMMEDIATE, 1); // nothing for a peer that is not there yet
+    }
+    // A machine that has gone does not close its connections. ZMTP's own heartbeats would take a reader that
+    // does not read for one that has gone.
+    set(to, ZMQ_TCP_KEEPALIVE, 1);
+    set(to, ZMQ_TCP_KEEPALIVE_IDLE, 10);
+    set(to, ZMQ_TCP_KEEPALIVE_INTVL, 5);
+    set(to, ZMQ_TCP_KEEPALIVE_CNT, 4);
+    if (settings.maxMessage) {
+        const auto most = static_cast<std::int64_t>(*settings.maxMessage);
+        zmq_setsockopt(to, ZMQ_MAXMSGSIZE, &most, sizeof most);
+    }
+    if (settings.pattern == Pattern::Subscribe) {
+        set(to, ZMQ_SUBSCRIBE, settings.topic);
+    } else if (settings.pattern == Pattern::Publish) {
+        set(to, ZMQ_XPUB_VERBOSER, 1); // it tells of each that comes and goes
+    }
+}
+
+void Link::setKeys()
+{
+    const KeyPair own = readSecretKey(settings.secretKeyFile);
+    publicKey = own.publicKey;
+    set(socket.get(), ZMQ_CURVE_PUBLICKEY, own.publicKey);
+    set(socket.get(), ZMQ_CURVE_SECRETKEY, own.secretKey);
+    if (!settings.binds) {
+        set(socket.get(), ZMQ_CURVE_SERVERKEY, readPublicKey(settings.serverKeyFile));
+        return;
+    }
+    allowedKeys = readPublicKeys(settings.allowedKeysFile);
+    admission = makeSocket(context.get(), ZMQ_REP);
+    if (zmq_bind(admission.get(), "inproc://zeromq.zap.01") != 0) {
+        fail("Could not look after keys");
+    }
+    set(socket.get(), ZMQ_CURVE_SERVER, 1);
+    set(socket.get(), ZMQ_ZAP_DOMAIN, std::string("brenix"));
+}
+
+void Link::connect()
+{
+    if (zmq_connect(socket.get(), endpoint.c_str()) != 0) {
+        fail("Could not connect to " + endpoint);
+    }
+}
+
+void Link::wait(WakeUp& wakeUp, short events, milliseconds time)
+{
+    const auto now = Clock::now();
+    const auto atMost = [&](Clock::time_point when) {
+        time = std::clamp(std::chrono::ceil<milliseconds>(when - now), milliseconds(0), time);
+    };
+    if (!refusals.empty()) {
+        atMost(nextTelling);
+    }
+    if (nextConnect) {
+        atMost(*nextConnect);
+    }
+    std::array<zmq_pollitem_t, 4> items = {
+        zmq_pollitem_t{socket.get(), 0, events, 0}, zmq_pollitem_t{monitor.get(), 0, ZMQ_POLLIN, 0},
+        zmq_pollitem_t{nullptr, wakeUp.getHandle(), ZMQ_POLLIN, 0},
+        zmq_pollitem_t{admission.get(), 0, ZMQ_POLLIN, 0}};
+    const int count = admission ? 4 : 3;
+    if (zmq_poll(items.data(), count, time.count()) > 0 && items[2].revents != 0) {
+        wakeUp.clear();
+    }
+}
+
+void Link::attend(bool isEmpty)
+{
+    if (admission) {
+        answerStranger();
+    }
+    const std::uint64_t before = arrivals;
+    takeEvents([this](std::uint16_t event, std::uint32_t value) { take(event, value); });
+    if (arrivals != before) { // the socket is to know of them, too
+        int ready = 0;
+        std::size_t size = sizeof ready;
+        zmq_getsockopt(socket.get(), ZMQ_EVENTS, &ready, &size);
+    }
+    const auto now = Clock::now();
+    if (nextConnect && now >= *nextConnect && isEmpty) {
+        connectAgain();
+    }
+    if (now >= nextTelling) {
+        tellRefusals();
+    }
+}
+
+/// libzmq gives a connection up when what comes over it is none of its messages, or too large a one.
+void Link::connectAgain()
+{
+    nextConnect.reset();
+    if (std::exchange(wasPeer, false)) {
+        const std::string what = "The connection to " + endpoint +
+                                 " has ended: what came over it is no message, or larger than "
+                                 "MaxMessage.";
+        host.raise("error", "brenix:Device:badMessage", what.c_str());
+    }
+    zmq_disconnect(socket.get(), endpoint.c_str()); // or it takes itself for connected
+    connect();
+}
+
+void Link::take(std::uint16_t event, std::uint32_t value)
+{
+    const bool hasKey = !settings.secretKeyFile.empty();
+    switch (event) {
+    case ZMQ_EVENT_ACCEPTED:
+    case ZMQ_EVENT_CONNECTED:
+        connections.insert(static_cast<int>(value));
+        break;
+    case ZMQ_EVENT_HANDSHAKE_SUCCEEDED:
+        ++arrivals;
+        vain = 0;
+        patience = shortest;
+        break;
+    case ZMQ_EVENT_HANDSHAKE_FAILED_AUTH:
+        ++failing;
+        if (!settings.binds) {
+            refuse("it does not allow the key of " + settings.secretKeyFile);
+        }
+        break;
+    case ZMQ_EVENT_HANDSHAKE_FAILED_PROTOCOL:
+        ++failing;
+        if (value == ZMQ_PROTOCOL_ERROR_ZMTP_MECHANISM_MISMATCH) {
+            refuse(hasKey ? "the other side has no key" : "the other side has a key");
+        } else if (value == ZMQ_PROTOCOL_ERROR_ZMTP_CRYPTOGRAPHIC) {
+            refuse(settings.binds ? "it expected another key than that of " + settings.secretKeyFile
+                                  : "it has another key than that of " + settings.serverKeyFile);
+        } else {
+            refuse("it does not keep to the protocol");
+        }
+        break;
+    case ZMQ_EVENT_HANDSHAKE_FAILED_NO_DETAIL:
+        ++failing;
+        // One that has just gone away looks the same.
+        if (!settings.binds && ++vain > 2) {
+            refuse(hasKey ? "it has another key than that of " + settings.serverKeyFile +
+                                ", has no key, or is no ZeroMQ socket"
+                          : "it has a key, or is no ZeroMQ socket");
+        }
+        break;
+    case ZMQ_EVENT_DISCONNECTED:
+        connections.erase(static_cast<int>(value));
+        if (failing > 0) {
+            --failing;
+        } else {
+            ++departures;
+            wasPeer = true;
+        }
+        if (!settings.binds) { // unless libzmq says that it tries again
+            nextConnect = Clock::now() + patience;
+            patience = std::min<Clock::duration>(2 * patience, std::chrono::seconds(16));
+        }
+        break;
+    case ZMQ_EVENT_CONNECT_RETRIED:
+        wasPeer = false;
+        nextConnect.reset();
+        break;
+    default:
+        break;
+    }
+}
+
+std::uint64_t Link::getQueued() const
+{
+    std::uint64_t all = 0;
+    for (const int connection : connections) {
+        int queued = 0;
+        ::ioctl(connection, TIOCOUTQ, &queued); // also the one of sockets
+        all += static_cast<std::uint64_t>(std::max(queued, 0));
+    }
+    return all;
+}
+
+/// As https://rfc.zeromq.org/spec/27 has it.
+void Link::answerStranger()
+{
+    std::vector<std::string> request;
+    Frame frame;
+    while (frame.receive(admission.get())) {
+        request.push_back(frame.text());
+        if (frame.hasMore()) {
+            continue;
+        }
+        // Version, request, domain, address, routing id, mechanism, key.
+        const bool isKey = request.size() == 7 && request[5] == "CURVE";
+        const std::string key = isKey ? keyText(request[6]) : "";
+        const bool isAllowed = isKey && allowedKeys.count(key) > 0;
+        if (!isAllowed) {
+            refuse("the key " + key + " from " + (request.size() > 3 ? request[3] : "") +
+                   " is not in " + settings.allowedKeysFile);
+        }
+        const std::string id = request.size() > 1 ? request[1] : "";
+        const std::array<std::string, 6> reply = {
+            "1.0", id, isAllowed ? "200" : "400", isAllowed ? "OK" : "not allowed", key, ""};
+        for (std::size_t i = 0; i < reply.size(); ++i) {
+            zmq_send(admission.get(), reply.at(i).data(), reply.at(i).size(),
+                     ZMQ_DONTWAIT | (i + 1 < reply.size() ? ZMQ_SNDMORE : 0));
+        }
+        request.clear();
+    }
+}
+
+void Link::refuse(const std::string& what)
+{
+    constexpr std::size_t most = 4; // that one text tells
+    if (refusals.size() < most || refusals.count(what) > 0) {
+        ++refusals[what];
+    } else {
+        ++refusals["others"];
+    }
+}
+
+void Link::tellRefusals()
+{
+    if (refusals.empty()) {
+        return;
+    }
+    std::string text =
+        (settings.binds ? "Peers were refused at " : "Could not be a peer of ") + endpoint + ": ";
+    const char* separator = "";
+    for (const auto& [what, times] : refusals) {
+        text += separator + what;
+        text += times > 1 ? " (" + std::to_string(times) + " times)" : "";
+        separator = "; ";
+    }
+    text += ".";
+    refusals.clear();
+    nextTelling = Clock::now() + std::chrono::seconds(1);
+    host.raise("error", settings.binds ? "brenix:Device:peerRefused" : "brenix:Device:refused",
+               text.c_str());
+}
+
+void Link::close(milliseconds linger)
+{
+    set(socket.get(), ZMQ_LINGER, static_cast<int>(linger.count()));
+    monitor.reset();
+    socket.reset();
+    admission.reset(); // without it, everybody would be let in
+    context.reset();
+}
+
+} // namespace zeromq

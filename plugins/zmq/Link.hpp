@@ -1,0 +1,131 @@
+// The socket of the device zmq, and an eye on who is at its other end.
+#ifndef BRENIX_PLUGINS_ZMQ_LINK_HPP
+#define BRENIX_PLUGINS_ZMQ_LINK_HPP
+
+#include "Zmq.hpp"
+
+#include "brenixcore/plugin/Plugin.hpp"
+
+#include <atomic>
+#include <chrono>
+#include <cstdint>
+#include <map>
+#include <optional>
+#include <set>
+#include <string>
+
+namespace zeromq
+{
+
+using Clock = std::chrono::steady_clock;
+
+enum class Pattern { Push, Pull, Publish, Subscribe };
+
+inline bool writes(Pattern pattern)
+{
+    return pattern == Pattern::Push || pattern == Pattern::Publish;
+}
+
+struct Settings {
+    std::string endpoint;
+    Pattern pattern = Pattern::Push;
+    bool binds = true;
+    std::string topic;
+    int highWater = 1000;
+    std::string secretKeyFile;   ///< empty: no keys
+    std::string serverKeyFile;   ///< of a side that goes to the endpoint
+    std::string allowedKeysFile; ///< of a side that binds
+    std::optional<std::size_t> maxMessage;
+};
+
+/// Ends the wait of another thread.
+class WakeUp
+{
+public:
+    WakeUp();
+    WakeUp(const WakeUp&) = delete;
+    WakeUp& operator=(const WakeUp&) = delete;
+    ~WakeUp();
+
+    void signal() noexcept;
+    void clear() noexcept;
+    int getHandle() const { return handle; }
+
+private:
+    const int handle;
+    std::atomic<bool> signalled = false;
+};
+
+/// Binds or connects, tells who was refused, connects again, and counts the peers.
+class Link
+{
+public:
+    /// Throws when it cannot bind, and when keys are not as they should be.
+    Link(const Settings& linkSettings, brenixcore::plugin::DeviceHost& deviceHost);
+
+    void* getSocket() const { return socket.get(); }
+    const std::string& getEndpoint() const { return endpoint; }   ///< where it is bound
+    const std::string& getPublicKey() const { return publicKey; } ///< empty: none
+
+    /// Waits for one of the events of libzmq's poll, for something to attend to, or for somebody who wakes
+    /// the device, and no longer than the time.
+    void wait(WakeUp& wakeUp, short events, std::chrono::milliseconds time);
+
+    /// Looks after the peers. A connection that has ended is made anew only when the socket is empty, as
+    /// libzmq then drops what has arrived.
+    void attend(bool isEmpty);
+
+    // Peers that are let in:
+    std::uint64_t getPeers() const { return arrivals > departures ? arrivals - departures : 0; }
+    std::uint64_t getArrivals() const { return arrivals; }
+    std::uint64_t getDepartures() const { return departures; }
+
+    /// Bytes that the system has and the peers' systems have not confirmed.
+    std::uint64_t getQueued() const;
+
+    /// Raises an error for those that were refused and not told yet.
+    void tellRefusals();
+
+    /// Closes. The socket has so much time for what it still has to send.
+    void close(std::chrono::milliseconds linger);
+
+private:
+    [[noreturn]] void failToBind(int error);
+    template <typename Take>
+    void takeEvents(const Take& handler);
+    void setOptions();
+    void setKeys();
+    void take(std::uint16_t event, std::uint32_t value);
+    void answerStranger();
+    void refuse(const std::string& what);
+    void connect();
+    void connectAgain();
+
+    static constexpr Clock::duration shortest = std::chrono::milliseconds(250);
+
+    const Settings settings;
+    brenixcore::plugin::DeviceHost& host;
+    OwnedContext context;  // is to end last
+    OwnedSocket admission; ///< where libzmq asks whether a key is allowed
+    OwnedSocket socket;
+    OwnedSocket monitor;
+    std::set<std::string> allowedKeys;
+    std::string publicKey;
+    std::string endpoint;
+
+    std::uint64_t arrivals = 0;
+    std::uint64_t departures = 0;
+    std::set<int> connections; ///< of the system
+    std::uint64_t failing = 0; ///< connections that were refused and have not ended yet
+    std::uint64_t vain = 0;    ///< attempts to connect, one after the other
+
+    std::map<std::string, std::uint64_t> refusals; ///< since they were told, by what they were
+    Clock::time_point nextTelling{};
+    std::optional<Clock::time_point> nextConnect; ///< when libzmq does not by itself
+    Clock::duration patience = shortest;
+    bool wasPeer = false; ///< and its connection has ended
+};
+
+} // namespace zeromq
+
+#endif

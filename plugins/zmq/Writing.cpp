@@ -1,0 +1,277 @@
+#include "Writing.hpp"
+
+#include <algorithm>
+#include <cstdlib>
+#include <new>
+#include <utility>
+
+namespace zeromq
+{
+
+using namespace brenixcore::plugin;
+using std::chrono::milliseconds;
+
+namespace
+{
+
+/// Stands before the bytes of a message.
+struct alignas(std::max_align_t) Head {
+    Outstanding* outstanding;
+    std::uint64_t counts;
+};
+
+/// libzmq calls it, on a thread of its own, when it has no more use for a message.
+void release(void* /*bytes*/, void* hint)
+{
+    auto* const head = static_cast<Head*>(hint);
+    Outstanding& outstanding = *head->outstanding;
+    outstanding.counts -= head->counts;
+    if (--outstanding.messages == 0 && outstanding.isAwaited) {
+        outstanding.wakeUp.signal();
+    }
+    std::free(head); // NOLINT(cppcoreguidelines-no-malloc)
+}
+
+} // namespace
+
+Writing::Writing(Link& deviceLink, const Settings& linkSettings,
+                 const WritingSettings& writingSettings, messages::Sender& deviceSender,
+                 WakeUp& deviceWakeUp, DeviceHost& deviceHost, Outstanding& deviceOutstanding)
+    : link(deviceLink), settings(linkSettings), limits(writingSettings), sender(deviceSender),
+      wakeUp(deviceWakeUp), host(deviceHost), outstanding(deviceOutstanding)
+{
+}
+
+std::uint64_t Writing::getReaders() const
+{
+    return settings.pattern == Pattern::Publish ? subscriptions : link.getPeers();
+}
+
+void Writing::run(DeviceStreams& streams)
+{
+    sender.begin();
+    for (;;) {
+        const bool closing = streams.isClosing(); // before the last look at the output
+        if (closing && !deadline) {
+            deadline = Clock::now() + limits.closeTimeout;
+        }
+        hasBegun = hasBegun || getReaders() >= limits.readers;
+        State state = State::Blocked;
+        if (hasBegun) {
+            state = sendSome(streams);
+        } else if (closing && !waiting && !pull(streams)) {
+            state = State::Idle;
+        }
+        if (closing && (state == State::Idle || Clock::now() >= *deadline)) {
+            break;
+        }
+        wait(state, milliseconds(state == State::Busy ? 0 : 10000));
+    }
+    finish(streams);
+}
+
+/// Comes back after some packets, to look after the peers.
+Writing::State Writing::sendSome(DeviceStreams& streams)
+{
+    constexpr int some = 256;
+    for (int i = 0; i < some; ++i) {
+        const bool isIdle = !waiting && !pull(streams);
+        if (!sendHellos() && !isIdle) {
+            return State::Blocked;
+        }
+        if (isIdle) {
+            return State::Idle;
+        }
+        if (!send(outgoing)) {
+            return State::Blocked;
+        }
+        sent += *waiting;
+        waiting.reset();
+    }
+    return State::Busy;
+}
+
+/// Makes a message of the next packet, if there is one. A hello goes before it.
+bool Writing::pull(DeviceStreams& streams)
+{
+    if (hellos > 0) {
+        greeting = sender.hello();
+    }
+    while (auto packet = streams.tryPull()) {
+        messages::Data data;
+        data.packet = std::move(*packet);
+        const std::uint64_t counts = data.packet.counts;
+        try {
+            sender.number(data, 0, counts);
+            make(outgoing, data, counts);
+            sender.sent(data);
+            waiting = counts;
+            return true;
+        } catch (const messages::Malformed& problem) {
+            sender.lose(counts);
+            unfit += counts;
+            why = problem.what();
+            tell();
+        }
+    }
+    return false;
+}
+
+/// The message is written where libzmq sends it from.
+template <typename Kind>
+void Writing::make(Frame& frame, const Kind& message, std::uint64_t counts)
+{
+    const std::size_t size = messages::sizeOf(message);
+    void* const memory = std::malloc(sizeof(Head) + size); // NOLINT(cppcoreguidelines-no-malloc)
+    if (memory == nullptr) {
+        throw std::bad_alloc();
+    }
+    auto* const head = new (memory) Head{&outstanding, counts};
+    auto* const bytes = reinterpret_cast<unsigned char*>(head + 1);
+    outstanding.counts += counts;
+    ++outstanding.messages;
+    zmq_msg_close(frame.get());
+    if (zmq_msg_init_data(frame.get(), bytes, size, release, head) != 0) {
+        release(bytes, head);
+        zmq_msg_init(frame.get());
+        throw std::bad_alloc();
+    }
+    messages::write(message, bytes);
+}
+
+/// Whether libzmq has taken it.
+bool Writing::send(Frame& frame)
+{
+    void* const socket = link.getSocket();
+    if (settings.pattern == Pattern::Publish &&
+        zmq_send(socket, settings.topic.data(), settings.topic.size(), ZMQ_DONTWAIT | ZMQ_SNDMORE) <
+            0) {
+        return false;
+    }
+    return zmq_msg_send(frame.get(), socket, ZMQ_DONTWAIT) >= 0;
+}
+
+bool Writing::sendHellos()
+{
+    for (; greeting && hellos > 0; --hellos) {
+        Frame frame;
+        make(frame, *greeting, 0);
+        if (!send(frame)) {
+            return false;
+        }
+    }
+    greeting.reset();
+    return true;
+}
+
+void Writing::wait(State state, milliseconds time)
+{
+    if (deadline) {
+        time = std::clamp(std::chrono::ceil<milliseconds>(*deadline - Clock::now()),
+                          milliseconds(0), time);
+    }
+    const bool publishes = settings.pattern == Pattern::Publish;
+    const bool isFull = state == State::Blocked && hasBegun;
+    outstanding.isAwaited = !publishes;
+    link.wait(wakeUp, static_cast<short>(publishes ? ZMQ_POLLIN : isFull ? ZMQ_POLLOUT : 0), time);
+    outstanding.isAwaited = false;
+    const std::uint64_t before = sent - outstanding.counts + waiting.value_or(0);
+    const std::uint64_t arrivals = link.getArrivals();
+    const std::uint64_t departures = link.getDepartures();
+    link.attend(true);
+    if (publishes) {
+        takeSubscriptions();
+        return;
+    }
+    if (link.getArrivals() != arrivals) {
+        hellos = link.getPeers(); // they go round
+    }
+    // When a peer goes, libzmq drops what was on the way to it as if it had been sent.
+    if (link.getDepartures() == departures) {
+        handedOver = before;
+    } else if (const std::uint64_t lost = sent - std::exchange(handedOver, sent); lost > 0) {
+        doubtful += lost;
+        tell();
+    }
+}
+
+/// Those of the topic, which for a reader is the beginning of one.
+void Writing::takeSubscriptions()
+{
+    Frame frame;
+    while (frame.receive(link.getSocket())) {
+        if (frame.size() == 0 || settings.topic.rfind(frame.text().substr(1), 0) != 0) {
+            continue;
+        }
+        if (frame.data()[0] == 1) {
+            ++subscriptions;
+            hellos = 1;
+        } else if (subscriptions > 0) {
+            --subscriptions;
+        }
+    }
+}
+
+// --- The end ---
+
+/// Whether the systems of all peers have taken everything before the time is over.
+bool Writing::waitUntilHandedOver()
+{
+    const auto isOver = [this] { return outstanding.messages == 0 && link.getQueued() == 0; };
+    while (!isOver() && Clock::now() < *deadline) {
+        wait(State::Idle, milliseconds(2));
+    }
+    return isOver();
+}
+
+/// To each peer, if nothing is before it: then they have their turns. One that is behind gets none.
+void Writing::sendEnd()
+{
+    wait(State::Idle, milliseconds(0)); // libzmq is to know who has room again
+    const std::uint64_t times = settings.pattern == Pattern::Publish ? 1 : link.getPeers();
+    for (std::uint64_t i = 0; i < times; ++i) {
+        Frame frame;
+        make(frame, sender.end(), 0);
+        send(frame);
+    }
+}
+
+void Writing::finish(DeviceStreams& streams)
+{
+    undelivered = discardOutput(streams);
+    sender.lose(undelivered);
+    if (waitUntilHandedOver()) {
+        sendEnd();
+        waitUntilHandedOver();
+    }
+    undelivered += outstanding.counts;
+    link.tellRefusals();
+    unconfirmed = undelivered == 0 ? link.getQueued() : 0;
+    const auto now = Clock::now();
+    link.close(std::chrono::ceil<milliseconds>(std::max(*deadline, now) - now));
+    tell();
+}
+
+/// Raises an error if more is lost than was told.
+void Writing::tell()
+{
+    std::string text;
+    const auto add = [&](std::uint64_t number, const std::string& sentence) {
+        if (number > 0) {
+            text.append(text.empty() ? "" : " ").append(std::to_string(number)).append(sentence);
+        }
+    };
+    const std::string& endpoint = link.getEndpoint();
+    add(unfit, " counts were not sent to " + endpoint + ": " + why + ".");
+    add(doubtful, " counts, or some of them, were lost with a reader at " + endpoint +
+                      " that went when they were on their way.");
+    add(undelivered, " counts were not sent to " + endpoint + ": nobody took them in time.");
+    add(unconfirmed, " bytes of the last packets had not arrived from " + endpoint + " in time.");
+    if (text != std::exchange(told, text)) {
+        const bool isLoss = doubtful + undelivered + unconfirmed > 0;
+        host.raise("error", isLoss ? "brenix:Device:dataLost" : "brenix:Device:wrongType",
+                   text.c_str());
+    }
+}
+
+} // namespace zeromq
