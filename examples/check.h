@@ -29,7 +29,7 @@ static int check(void* channel, const char* call, int result)
     return 0;
 }
 
-/* Whether data that was lost is a failure like any other error, or is only printed. */
+/* Whether data that was lost, or a stranger who was refused, is a failure like any other error, or is only printed. */
 static int lossIsFailure = 1;
 
 /* Returns 0, after printing it, if a plug-in has raised an error between the calls. */
@@ -47,7 +47,9 @@ static int checkDevice(void* channel)
     }
     (void)coderChannelGetLastAsyncError(channel, id, message);
     fprintf(stderr, "device: %s: %s\n", id, message);
-    return !lossIsFailure && strstr(id, ":dataLost") != NULL;
+    return !lossIsFailure &&
+           (strstr(id, ":dataLost") != NULL || strstr(id, ":badMessage") != NULL ||
+            strstr(id, ":peerRefused") != NULL);
 }
 
 /* Makes a channel; prints why when it returns NULL. */

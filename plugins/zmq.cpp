@@ -149,6 +149,7 @@ public:
         }
         options.requireAllKnown();
         publish(properties, "Endpoint", settings.endpoint);
+        publish(properties, "Peers", 0U);
         publish(properties, "PublicKey", std::string());
         return {writes(settings.pattern) ? std::nullopt : std::optional(StreamInfo{}),
                 writes(settings.pattern) ? std::optional(StreamInfo{}) : std::nullopt};
@@ -160,6 +161,7 @@ public:
         link = std::make_unique<Link>(settings, *host);
         host->updateProperty(makeScalar("Endpoint", link->getEndpoint()));
         host->updateProperty(makeScalar("PublicKey", link->getPublicKey()));
+        host->updateProperty(makeScalar("Peers", 0U));
     }
 
     void run(DeviceStreams& streams) override
@@ -251,6 +253,7 @@ constexpr OptionInfo optionTable[] = {
 
 constexpr PropertyInfo propertyTable[] = {
     {"Endpoint", "char", "", "where it is bound, with the port that the system chose"},
+    {"Peers", "uint32", "", "that are connected and were let in"},
     {"PublicKey", "char", "", "of SecretKeyFile, or of the pair that keys made"},
     messages::receiverProperties[0],
     messages::receiverProperties[1],

@@ -50,7 +50,7 @@ done
 echo "== the programs of the pages with pkg-config, as C and as C++"
 read -ra warnings <<<"$CFLAGS"
 mkdir programs
-pieces c README.md >programs/first.c
+pieces c README.md 1 >programs/first.c
 pieces c docs/generated-code.md >programs/generated.c
 cp "$docs"/examples/* programs
 for language in c:99 c++:17; do
@@ -58,15 +58,30 @@ for language in c:99 c++:17; do
         "$CC" -x "${language%:*}" "-std=${language/:/}" "${warnings[@]}" programs/$program.c -x none \
             "${flags[@]}" -o $program
     done
-    expect '1.5 2.5 3.5' env -i ./first
+    expect '-1 -0.981667 -0.963333' env -i ./first
     expect 'tone.wav: 48000 samples at 48000 Hz' env -i ./generated
 done
-for example in levels echo gaps stream; do
+for example in levels echo gaps stream collect; do
     "$CC" "${warnings[@]}" programs/$example.c "${flags[@]}" -o $example
 done
 expect '*char *: the same' env -i ./echo
 expect '*gap: * counts from * on*the core says *[0-9]' env -i ./gaps
 expect '1.000 s, 48000 Hz*Overall *1.000000 *0.707*' env -i ./levels tone.wav
+
+if [[ -e $build/lib/brenix-plugins/zmq.so ]]; then
+    echo "== one reader of many writers, and the program of README on another machine"
+    "$source/tests/collect.sh" ./collect installed/bin/brenix
+    # Its file of a socket has a name as long as the address.
+    awk 'NR == FNR { if (/Create/) create = $0; else init = init (init == "" ? "" : "\n") $0; next }
+        /coderChannelCreate/ { $0 = create } /coderChannelInit/ { $0 = init } { print }' \
+        <(pieces c README.md 2 | sed 's|tcp://127.0.0.1:5000|ipc://remote.socket_|') \
+        programs/first.c >programs/remote.c
+    "$CC" "${warnings[@]}" programs/remote.c "${flags[@]}" -o remote
+    printf '1.5\n2.5\n3.5\n' | installed/bin/brenix write zmq -o Endpoint=ipc://remote.socket_ \
+        -o Pattern=push -q &
+    expect '1.5 2.5 3.5' env -i ./remote
+    wait $!
+fi
 
 echo "== with CMake, as C and as C++"
 cp programs/first.c programs/first.cpp
@@ -82,8 +97,8 @@ END
 export CMAKE_PREFIX_PATH=$scratch/installed
 cmake -S programs -B programs/build >>log
 cmake --build programs/build >>log
-expect '1.5 2.5 3.5' env -i programs/build/c
-expect '1.5 2.5 3.5' env -i programs/build/cpp
+expect '-1 -0.981667 -0.963333' env -i programs/build/c
+expect '-1 -0.981667 -0.963333' env -i programs/build/cpp
 
 echo "== the guide for plug-in authors"
 cp -r "$docs/plugins/template" plugins

@@ -136,12 +136,12 @@ void Channel::execute(const std::string& command, const std::vector<std::string>
     }));
 }
 
-void Channel::finish(const std::optional<Failure>& failure, std::vector<Failure>* losses)
+void Channel::finish(const std::optional<Failure>& failure, std::vector<Failure>* passing)
 {
     std::vector<Failure> failures;
     const auto add = [&](const std::optional<Failure>& one) {
         if (one) {
-            (losses != nullptr && one->isLoss() ? *losses : failures).push_back(*one);
+            (passing != nullptr && one->isPassing() ? *passing : failures).push_back(*one);
         }
     };
     add(deviceError());

@@ -26,7 +26,10 @@ public:
     const std::string& getId() const { return id; }
 
     /// Whether it tells that data was lost and nothing else is wrong.
-    bool isLoss() const { return id.find(":dataLost") != std::string::npos; }
+    bool isLoss() const { return has(":dataLost") || has(":badMessage"); }
+
+    /// The same, or that somebody was not let in.
+    bool isPassing() const { return isLoss() || has(":peerRefused"); }
 
     /// Identifier and message, as far as there are both.
     std::string text() const
@@ -36,6 +39,8 @@ public:
     }
 
 private:
+    bool has(const char* part) const { return id.find(part) != std::string::npos; }
+
     std::string id;
 };
 
@@ -81,8 +86,9 @@ public:
 
     /// Closes, when it is open, and terminates. Throws what fails, or the failure that ended a
     /// transfer, behind the device's errors if there are any: mostly they are the reason.
-    /// Losses of data are no failures where a list takes them.
-    void finish(const std::optional<Failure>& failure = {}, std::vector<Failure>* losses = nullptr);
+    /// What is passing is no failure where a list takes it.
+    void finish(const std::optional<Failure>& failure = {},
+                std::vector<Failure>* passing = nullptr);
 
     /// Throws the error of a call that returned 0.
     void check(int result);

@@ -140,10 +140,10 @@ ExitCode readSamples(const Settings& given)
                 written = reading.getCounts();
                 progress.update(written);
             }
-            if (const auto error = channel.deviceError(); error && error->isLoss()) {
+            if (const auto error = channel.deviceError(); error && error->isPassing()) {
                 progress.finish();
                 report(settings, *error);
-                isLossTold = true;
+                isLossTold = isLossTold || error->isLoss();
             } else if (error) {
                 ended = error;
                 reading.endWithAvailable();
@@ -165,11 +165,11 @@ ExitCode readSamples(const Settings& given)
             writer->finish(); // what came before a failure is kept
         }
     });
-    std::vector<Failure> losses;
-    channel.finish(failure ? failure : unwritten, &losses);
-    for (const Failure& loss : losses) {
-        report(settings, loss);
-        isLossTold = true;
+    std::vector<Failure> passing;
+    channel.finish(failure ? failure : unwritten, &passing);
+    for (const Failure& one : passing) {
+        report(settings, one);
+        isLossTold = isLossTold || one.isLoss();
     }
     const double lost = channel.number("LostCounts", "uint64").value_or(0);
     if (writer && !settings.emitC.empty()) {
@@ -242,8 +242,12 @@ ExitCode writeSamples(const Settings& given)
             if (bad) { // after the rows before it
                 throw Failure(*bad);
             }
-            if (channel.hasDeviceError()) { // finish() throws it
-                break;
+            if (const auto error = channel.deviceError()) {
+                if (error->isLoss() || !error->isPassing()) {
+                    throw Failure(*error);
+                }
+                progress.finish();
+                report(settings, *error); // somebody was not let in
             }
         }
     });

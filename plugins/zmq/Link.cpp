@@ -2,6 +2,8 @@
 
 #include "Keys.hpp"
 
+#include "brenixcore/plugin/Make.hpp"
+
 #include <sys/eventfd.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
@@ -220,7 +222,12 @@ void Link::attend(bool isEmpty)
         answerStranger();
     }
     const std::uint64_t before = arrivals;
+    const std::uint64_t peers = getPeers();
     takeEvents([this](std::uint16_t event, std::uint32_t value) { take(event, value); });
+    if (getPeers() != peers) {
+        host.updateProperty(
+            brenixcore::plugin::makeScalar("Peers", static_cast<unsigned int>(getPeers())));
+    }
     if (arrivals != before) { // the socket is to know of them, too
         int ready = 0;
         std::size_t size = sizeof ready;

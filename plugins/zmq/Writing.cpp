@@ -128,15 +128,15 @@ void Writing::make(Frame& frame, const Kind& message, std::uint64_t counts)
     }
     auto* const head = new (memory) Head{&outstanding, counts};
     auto* const bytes = reinterpret_cast<unsigned char*>(head + 1);
+    messages::write(message, bytes);
     outstanding.counts += counts;
-    ++outstanding.messages;
+    ++outstanding.messages; // behind the bytes, for the thread that frees them
     zmq_msg_close(frame.get());
     if (zmq_msg_init_data(frame.get(), bytes, size, release, head) != 0) {
         release(bytes, head);
         zmq_msg_init(frame.get());
         throw std::bad_alloc();
     }
-    messages::write(message, bytes);
 }
 
 /// Whether libzmq has taken it.
