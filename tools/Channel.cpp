@@ -144,6 +144,7 @@ void Channel::finish(const std::optional<Failure>& failure, std::vector<Failure>
             (passing != nullptr && one->isPassing() ? *passing : failures).push_back(*one);
         }
     };
+    add(left);
     add(deviceError());
     const auto ended = failure ? failure : caught([&] {
         std::uint8_t isOpen = 0;

@@ -98,6 +98,9 @@ public:
     /// Takes the device's asynchronous error, if there is one.
     std::optional<Failure> deviceError();
 
+    /// Leaves an error that was taken for finish().
+    void leave(const Failure& error) { left = error; }
+
     /// The value of a property; nothing when there is none of that name and type.
     std::optional<Bytes> property(const std::string& name, const ElementType& type);
     std::optional<double> number(const std::string& name, const char* type);
@@ -131,6 +134,7 @@ private:
     std::string fieldsThere(double counts);
     std::optional<Field> findField(const std::string& name, double counts);
 
+    std::optional<Failure> left;
     void* handle = nullptr;
     void* input = nullptr;
     void* output = nullptr;

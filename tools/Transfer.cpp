@@ -244,7 +244,8 @@ ExitCode writeSamples(const Settings& given)
             }
             if (const auto error = channel.deviceError()) {
                 if (error->isLoss() || !error->isPassing()) {
-                    throw Failure(*error);
+                    channel.leave(*error);
+                    break;
                 }
                 progress.finish();
                 report(settings, *error); // somebody was not let in
