@@ -62,7 +62,7 @@ static int setUp(void* channel, uint64_t count, struct Option* options)
 {
     static const uint8_t stamps = 1;
     struct Option* const last = &options[count];
-    (void)strcpy(last->name, "Stamps");
+    memcpy(last->name, "Stamps", sizeof "Stamps");
     last->type = "logical";
     last->count = 1;
     last->value = &stamps;
@@ -85,7 +85,7 @@ static struct Source* findSource(const char* name)
     }
     if (source == sources + sourceCount) {
         ++sourceCount;
-        (void)strcpy(source->name, name);
+        memcpy(source->name, name, sizeof source->name);
     }
     return source;
 }

@@ -74,7 +74,7 @@ void refuse(const PropertyMap& options, std::initializer_list<const char*> names
             const std::string& reason)
 {
     for (const char* const name : names) {
-        if (options.count(name) > 0) {
+        if (options.contains(name)) {
             Options::fail(name, reason);
         }
     }

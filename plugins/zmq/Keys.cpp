@@ -14,6 +14,7 @@
 #include <stdexcept>
 #include <string_view>
 #include <system_error>
+#include <utility>
 
 namespace zeromq
 {
@@ -42,8 +43,8 @@ bool isKey(const std::string& text)
 class NewFile
 {
 public:
-    NewFile(const std::string& fileName, mode_t mode)
-        : name(fileName),
+    NewFile(std::string fileName, mode_t mode)
+        : name(std::move(fileName)),
           handle(::open(name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, mode))
     {
         if (handle == -1) {

@@ -4,7 +4,6 @@
 
 #include "brenixcore/plugin/Make.hpp"
 
-#include <sys/eventfd.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -55,34 +54,9 @@ bool isTaken(const std::string& endpoint)
 
 } // namespace
 
-WakeUp::WakeUp() : handle(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK))
-{
-    if (handle == -1) {
-        throw std::system_error(errno, std::generic_category(), "eventfd");
-    }
-}
-
-WakeUp::~WakeUp()
-{
-    ::close(handle);
-}
-
-void WakeUp::signal() noexcept
-{
-    if (!signalled.exchange(true)) { // or else it is on its way
-        ::eventfd_write(handle, 1);
-    }
-}
-
-void WakeUp::clear() noexcept
-{
-    eventfd_t times = 0;
-    ::eventfd_read(handle, &times);
-    signalled = false; // before anybody looks at what has changed
-}
-
-Link::Link(const Settings& linkSettings, brenixcore::plugin::DeviceHost& deviceHost)
-    : settings(linkSettings), host(deviceHost), context(zmq_ctx_new()), endpoint(settings.endpoint)
+Link::Link(Settings linkSettings, brenixcore::plugin::DeviceHost& deviceHost)
+    : settings(std::move(linkSettings)), host(deviceHost), context(zmq_ctx_new()),
+      endpoint(settings.endpoint), refusals(deviceHost, settings.binds)
 {
     if (!context) {
         fail("Could not start libzmq");
@@ -200,8 +174,8 @@ void Link::wait(WakeUp& wakeUp, short events, milliseconds time)
     const auto atMost = [&](Clock::time_point when) {
         time = std::clamp(std::chrono::ceil<milliseconds>(when - now), milliseconds(0), time);
     };
-    if (!refusals.empty()) {
-        atMost(nextTelling);
+    if (!refusals.isEmpty()) {
+        atMost(refusals.getNextTelling());
     }
     if (nextConnect) {
         atMost(*nextConnect);
@@ -237,7 +211,7 @@ void Link::attend(bool isEmpty)
     if (nextConnect && now >= *nextConnect && isEmpty) {
         connectAgain();
     }
-    if (now >= nextTelling) {
+    if (now >= refusals.getNextTelling()) {
         tellRefusals();
     }
 }
@@ -272,27 +246,30 @@ void Link::take(std::uint16_t event, std::uint32_t value)
     case ZMQ_EVENT_HANDSHAKE_FAILED_AUTH:
         ++failing;
         if (!settings.binds) {
-            refuse("it does not allow the key of " + settings.secretKeyFile);
+            refusals.add("it does not allow the key of " + settings.secretKeyFile);
         }
         break;
     case ZMQ_EVENT_HANDSHAKE_FAILED_PROTOCOL:
         ++failing;
         if (value == ZMQ_PROTOCOL_ERROR_ZMTP_MECHANISM_MISMATCH) {
-            refuse(hasKey ? "the other side has no key" : "the other side has a key");
+            refusals.add(hasKey ? "the other side has no key" : "the other side has a key");
         } else if (value == ZMQ_PROTOCOL_ERROR_ZMTP_CRYPTOGRAPHIC) {
-            refuse(settings.binds ? "it expected another key than that of " + settings.secretKeyFile
-                                  : "it has another key than that of " + settings.serverKeyFile);
+            refusals.add(settings.binds
+                             ? "it expected another key than that of " + settings.secretKeyFile
+                             : "it has another key than that of " + settings.serverKeyFile);
+        } else if (value == ZMQ_PROTOCOL_ERROR_ZMTP_INVALID_METADATA) {
+            refusals.add("the other side has no Pattern that fits");
         } else {
-            refuse("it does not keep to the protocol");
+            refusals.add("it does not keep to the protocol");
         }
         break;
     case ZMQ_EVENT_HANDSHAKE_FAILED_NO_DETAIL:
         ++failing;
         // One that has just gone away looks the same.
         if (!settings.binds && ++vain > 2) {
-            refuse(hasKey ? "it has another key than that of " + settings.serverKeyFile +
-                                ", has no key, or is no ZeroMQ socket"
-                          : "it has a key, or is no ZeroMQ socket");
+            refusals.add(hasKey ? "it has another key than that of " + settings.serverKeyFile +
+                                      ", has no key, or is no ZeroMQ socket"
+                                : "it has a key, or is no ZeroMQ socket");
         }
         break;
     case ZMQ_EVENT_DISCONNECTED:
@@ -341,10 +318,10 @@ void Link::answerStranger()
         // Version, request, domain, address, routing id, mechanism, key.
         const bool isKey = request.size() == 7 && request[5] == "CURVE";
         const std::string key = isKey ? keyText(request[6]) : "";
-        const bool isAllowed = isKey && allowedKeys.count(key) > 0;
+        const bool isAllowed = isKey && allowedKeys.contains(key);
         if (!isAllowed) {
-            refuse("the key " + key + " from " + (request.size() > 3 ? request[3] : "") +
-                   " is not in " + settings.allowedKeysFile);
+            refusals.add("the key " + key + " from " + (request.size() > 3 ? request[3] : "") +
+                         " is not in " + settings.allowedKeysFile);
         }
         const std::string id = request.size() > 1 ? request[1] : "";
         const std::array<std::string, 6> reply = {
@@ -355,36 +332,6 @@ void Link::answerStranger()
         }
         request.clear();
     }
-}
-
-void Link::refuse(const std::string& what)
-{
-    constexpr std::size_t most = 4; // that one text tells
-    if (refusals.size() < most || refusals.count(what) > 0) {
-        ++refusals[what];
-    } else {
-        ++refusals["others"];
-    }
-}
-
-void Link::tellRefusals()
-{
-    if (refusals.empty()) {
-        return;
-    }
-    std::string text =
-        (settings.binds ? "Peers were refused at " : "Could not be a peer of ") + endpoint + ": ";
-    const char* separator = "";
-    for (const auto& [what, times] : refusals) {
-        text += separator + what;
-        text += times > 1 ? " (" + std::to_string(times) + " times)" : "";
-        separator = "; ";
-    }
-    text += ".";
-    refusals.clear();
-    nextTelling = Clock::now() + std::chrono::seconds(1);
-    host.raise("error", settings.binds ? "brenix:Device:peerRefused" : "brenix:Device:refused",
-               text.c_str());
 }
 
 void Link::close(milliseconds linger)

@@ -2,22 +2,20 @@
 #ifndef BRENIX_PLUGINS_ZMQ_LINK_HPP
 #define BRENIX_PLUGINS_ZMQ_LINK_HPP
 
+#include "Refusals.hpp"
+#include "WakeUp.hpp"
 #include "Zmq.hpp"
 
 #include "brenixcore/plugin/Plugin.hpp"
 
-#include <atomic>
 #include <chrono>
 #include <cstdint>
-#include <map>
 #include <optional>
 #include <set>
 #include <string>
 
 namespace zeromq
 {
-
-using Clock = std::chrono::steady_clock;
 
 enum class Pattern { Push, Pull, Publish, Subscribe };
 
@@ -38,30 +36,12 @@ struct Settings {
     std::optional<std::size_t> maxMessage;
 };
 
-/// Ends the wait of another thread.
-class WakeUp
-{
-public:
-    WakeUp();
-    WakeUp(const WakeUp&) = delete;
-    WakeUp& operator=(const WakeUp&) = delete;
-    ~WakeUp();
-
-    void signal() noexcept;
-    void clear() noexcept;
-    int getHandle() const { return handle; }
-
-private:
-    const int handle;
-    std::atomic<bool> signalled = false;
-};
-
 /// Binds or connects, tells who was refused, connects again, and counts the peers.
 class Link
 {
 public:
     /// Throws when it cannot bind, and when keys are not as they should be.
-    Link(const Settings& linkSettings, brenixcore::plugin::DeviceHost& deviceHost);
+    Link(Settings linkSettings, brenixcore::plugin::DeviceHost& deviceHost);
 
     void* getSocket() const { return socket.get(); }
     const std::string& getEndpoint() const { return endpoint; }   ///< where it is bound
@@ -84,7 +64,7 @@ public:
     std::uint64_t getQueued() const;
 
     /// Raises an error for those that were refused and not told yet.
-    void tellRefusals();
+    void tellRefusals() { refusals.tell(endpoint); }
 
     /// Closes. The socket has so much time for what it still has to send.
     void close(std::chrono::milliseconds linger);
@@ -97,7 +77,6 @@ private:
     void setKeys();
     void take(std::uint16_t event, std::uint32_t value);
     void answerStranger();
-    void refuse(const std::string& what);
     void connect();
     void connectAgain();
 
@@ -119,8 +98,7 @@ private:
     std::uint64_t failing = 0; ///< connections that were refused and have not ended yet
     std::uint64_t vain = 0;    ///< attempts to connect, one after the other
 
-    std::map<std::string, std::uint64_t> refusals; ///< since they were told, by what they were
-    Clock::time_point nextTelling{};
+    Refusals refusals;
     std::optional<Clock::time_point> nextConnect; ///< when libzmq does not by itself
     Clock::duration patience = shortest;
     bool wasPeer = false; ///< and its connection has ended
