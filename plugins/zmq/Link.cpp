@@ -236,50 +236,54 @@ void Link::take(std::uint16_t event, std::uint32_t value)
     switch (event) {
     case ZMQ_EVENT_ACCEPTED:
     case ZMQ_EVENT_CONNECTED:
-        connections.insert(static_cast<int>(value));
+        connections[static_cast<int>(value)] = false;
+        handshaking.push_back(static_cast<int>(value));
         break;
     case ZMQ_EVENT_HANDSHAKE_SUCCEEDED:
         ++arrivals;
+        if (!handshaking.empty()) { // it is not told of which; one that takes long is a stranger
+            connections[handshaking.back()] = true;
+            handshaking.pop_back();
+        }
         vain = 0;
         patience = shortest;
         break;
     case ZMQ_EVENT_HANDSHAKE_FAILED_AUTH:
-        ++failing;
+        hasFailed = true;
         if (!settings.binds) {
             refusals.add("it does not allow the key of " + settings.secretKeyFile);
         }
         break;
     case ZMQ_EVENT_HANDSHAKE_FAILED_PROTOCOL:
-        ++failing;
+        hasFailed = true;
         if (value == ZMQ_PROTOCOL_ERROR_ZMTP_MECHANISM_MISMATCH) {
             refusals.add(hasKey ? "the other side has no key" : "the other side has a key");
         } else if (value == ZMQ_PROTOCOL_ERROR_ZMTP_CRYPTOGRAPHIC) {
             refusals.add(settings.binds
                              ? "it expected another key than that of " + settings.secretKeyFile
                              : "it has another key than that of " + settings.serverKeyFile);
-        } else if (value == ZMQ_PROTOCOL_ERROR_ZMTP_INVALID_METADATA) {
-            refusals.add("the other side has no Pattern that fits");
         } else {
             refusals.add("it does not keep to the protocol");
         }
         break;
     case ZMQ_EVENT_HANDSHAKE_FAILED_NO_DETAIL:
-        ++failing;
+        hasFailed = true;
         // One that has just gone away looks the same.
         if (!settings.binds && ++vain > 2) {
             refusals.add(hasKey ? "it has another key than that of " + settings.serverKeyFile +
-                                      ", has no key, or is no ZeroMQ socket"
-                                : "it has a key, or is no ZeroMQ socket");
+                                      ", has no key, no Pattern that fits, or is no ZeroMQ socket"
+                                : "it has a key, no Pattern that fits, or is no ZeroMQ socket");
         }
         break;
     case ZMQ_EVENT_DISCONNECTED:
-        connections.erase(static_cast<int>(value));
-        if (failing > 0) {
-            --failing;
-        } else {
+        if (connections[static_cast<int>(value)]) {
             ++departures;
             wasPeer = true;
+        } else if (!std::exchange(hasFailed, false)) {
+            refusals.add("the other side has no Pattern that fits");
         }
+        connections.erase(static_cast<int>(value));
+        std::erase(handshaking, static_cast<int>(value));
         if (!settings.binds) { // unless libzmq says that it tries again
             nextConnect = Clock::now() + patience;
             patience = std::min<Clock::duration>(2 * patience, std::chrono::seconds(16));
@@ -297,7 +301,7 @@ void Link::take(std::uint16_t event, std::uint32_t value)
 std::uint64_t Link::getQueued() const
 {
     std::uint64_t all = 0;
-    for (const int connection : connections) {
+    for (const auto& [connection, wasLetIn] : connections) {
         int queued = 0;
         ::ioctl(connection, TIOCOUTQ, &queued); // also the one of sockets
         all += static_cast<std::uint64_t>(std::max(queued, 0));

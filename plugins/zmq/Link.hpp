@@ -10,9 +10,11 @@
 
 #include <chrono>
 #include <cstdint>
+#include <map>
 #include <optional>
 #include <set>
 #include <string>
+#include <vector>
 
 namespace zeromq
 {
@@ -94,9 +96,10 @@ private:
 
     std::uint64_t arrivals = 0;
     std::uint64_t departures = 0;
-    std::set<int> connections; ///< of the system
-    std::uint64_t failing = 0; ///< connections that were refused and have not ended yet
-    std::uint64_t vain = 0;    ///< attempts to connect, one after the other
+    std::map<int, bool> connections; ///< of the system, and whether they were let in
+    std::vector<int> handshaking;    ///< those of which it is not known yet
+    bool hasFailed = false;          ///< it was told why
+    std::uint64_t vain = 0;          ///< attempts to connect, one after the other
 
     Refusals refusals;
     std::optional<Clock::time_point> nextConnect; ///< when libzmq does not by itself
