@@ -24,6 +24,9 @@ std::string lastErrorOf(natsConnection* connection)
 {
     const char* text = nullptr;
     const natsStatus status = natsConnection_GetLastError(connection, &text);
+    if (status == NATS_OK) {
+        return "the server ended it";
+    }
     return text != nullptr && *text != '\0' ? text : natsStatus_GetText(status);
 }
 
@@ -127,7 +130,11 @@ std::string reasonOf(natsStatus status)
 {
     natsStatus last = NATS_OK;
     const char* const text = nats_GetLastError(&last);
-    return last == status && text != nullptr && *text != '\0' ? text : natsStatus_GetText(status);
+    const std::string reason =
+        last == status && text != nullptr && *text != '\0' ? text : natsStatus_GetText(status);
+    const std::size_t place = reason.find("): "); // in the library's sources, which stands first
+    return reason.rfind('(', 0) == 0 && place != std::string::npos ? reason.substr(place + 3)
+                                                                   : reason;
 }
 
 Connection::Connection(const Settings& settings, std::shared_ptr<Mailbox> box)
@@ -140,6 +147,7 @@ Connection::Connection(const Settings& settings, std::shared_ptr<Mailbox> box)
     const std::int64_t each = std::max<std::int64_t>(1, count == 1 ? all : all / (2 * count));
     std::string reason = connect(settings, servers, each);
     if (reason.empty()) {
+        server();
         return;
     }
     std::string text;
@@ -161,7 +169,20 @@ std::string Connection::connect(const Settings& settings, const std::vector<std:
     natsConnection* made = nullptr;
     const natsStatus status = natsConnection_Connect(&made, options.get());
     connection.reset(made);
-    return status == NATS_OK ? std::string() : reasonOf(status);
+    if (status == NATS_OK) {
+        return {};
+    }
+    const std::string reason = reasonOf(status);
+    if (status == NATS_NO_SERVER) {
+        return "no server answers there";
+    }
+    if (reason == "Expected 'PONG', got ''") {
+        return usesTls(settings)
+                   ? "the server ended the connection, as it does if a certificate is missing or "
+                     "not good; its log says why"
+                   : "the server ended the connection";
+    }
+    return reason;
 }
 
 std::string Connection::server()
@@ -186,13 +207,23 @@ std::uint64_t Connection::reconnects() const
     return times;
 }
 
-void Connection::subscribe(const std::string& subject)
+Connection::Subscription Connection::subscribe(const std::string& subject, natsMsgHandler handler)
 {
     natsSubscription* made = nullptr;
-    require(natsConnection_Subscribe(&made, get(), subject.c_str(), onMessage, mailbox->number()),
+    require(natsConnection_Subscribe(&made, get(), subject.c_str(), handler, mailbox->number()),
             "Could not subscribe to " + subject);
-    subscription.reset(made);
     natsSubscription_SetPendingLimits(made, -1, -1); // the mailbox has one
+    return Subscription(made);
+}
+
+void Connection::subscribe(const std::string& subject)
+{
+    subscription = subscribe(subject, onMessage);
+}
+
+void Connection::watch(const std::string& subject)
+{
+    watches.push_back(subscribe(subject, onAnswer));
 }
 
 bool Connection::send(const std::string& subject, const std::string& text) const
@@ -207,11 +238,7 @@ bool Connection::ask(const std::string& subject, const std::string& text, const 
         require(natsInbox_Create(&name), "Could not ask");
         inbox = name;
         natsInbox_Destroy(name);
-        natsSubscription* made = nullptr;
-        require(natsConnection_Subscribe(&made, get(), (inbox + ".*").c_str(), onAnswer,
-                                         mailbox->number()),
-                "Could not subscribe to " + inbox + ".*");
-        answers.reset(made);
+        answers = subscribe(inbox + ".*", onAnswer);
     }
     return natsConnection_PublishRequestString(get(), subject.c_str(), (inbox + "." + word).c_str(),
                                                text.c_str()) == NATS_OK;

@@ -40,6 +40,12 @@ public:
     /// Has what arrives under a subject put into the mailbox. @throws std::runtime_error
     void subscribe(const std::string& subject);
 
+    /// Has what a server tells under a subject put into the mailbox, as an answer without a question.
+    void watch(const std::string& subject);
+
+    /// What arrives from now on is of no use.
+    void unsubscribe() const { natsSubscription_Unsubscribe(subscription.get()); }
+
     /// Sends to a subject. Returns whether the library took it.
     bool send(const std::string& subject, const std::string& text) const;
 
@@ -56,7 +62,12 @@ private:
 
     std::shared_ptr<Mailbox> mailbox;
     Handle connection;
-    std::unique_ptr<natsSubscription, Destroy<natsSubscription_Destroy>> subscription, answers;
+    using Subscription = std::unique_ptr<natsSubscription, Destroy<natsSubscription_Destroy>>;
+
+    Subscription subscribe(const std::string& subject, natsMsgHandler handler);
+
+    Subscription subscription, answers;
+    std::vector<Subscription> watches;
     std::string inbox;
     std::string lastServer;
 };

@@ -67,21 +67,23 @@ std::shared_ptr<Mailbox> Mailbox::find(void* number)
 bool Mailbox::isFullFor(const Event& event) const
 {
     constexpr std::size_t most = 65536; // messages
-    return limit > 0 && event.kind == Event::Kind::Message && !events.empty() &&
-           (isShort(event) ? events.size() >= 2 * most
-                           : events.size() >= most || bytes + sizeOf(event) > limit);
+    return limit > 0 && !messages.empty() &&
+           (isShort(event) ? messages.size() >= 2 * most
+                           : messages.size() >= most || bytes + sizeOf(event) > limit);
 }
 
 void Mailbox::put(Event event) noexcept
 {
     try {
         const std::lock_guard lock(mutex);
-        if (!isFullFor(event)) {
-            const std::size_t size = sizeOf(event);
+        if (event.kind != Event::Kind::Message) {
             events.push_back(std::move(event));
+        } else if (!isFullFor(event)) {
+            const std::size_t size = sizeOf(event);
+            messages.push_back(std::move(event));
             bytes += size;
-            changed.notify_all();
         }
+        changed.notify_all();
     } catch (...) { // no memory: it is as if it had got lost on its way
     }
 }
@@ -93,13 +95,22 @@ void Mailbox::wake() noexcept
     changed.notify_all();
 }
 
-std::deque<Event> Mailbox::take(Moment until)
+std::deque<Event> Mailbox::take(Moment until, bool withMessages)
 {
+    constexpr std::size_t few = 1U << 20U; // bytes
     std::unique_lock lock(mutex);
-    changed.wait_until(lock, until, [this] { return woken || !events.empty(); });
+    changed.wait_until(lock, until, [&] {
+        return woken || !events.empty() || (withMessages && !messages.empty());
+    });
     woken = false;
-    bytes = 0;
-    return std::exchange(events, {});
+    std::deque<Event> taken = std::exchange(events, {});
+    for (std::size_t size = 0; withMessages && !messages.empty() && size < few;) {
+        size += sizeOf(messages.front());
+        bytes -= sizeOf(messages.front());
+        taken.push_back(std::move(messages.front()));
+        messages.pop_front();
+    }
+    return taken;
 }
 
 } // namespace natsio

@@ -67,8 +67,9 @@ public:
     /// Ends a wait.
     void wake() noexcept;
 
-    /// What has come, as soon as there is something, or it was woken, or at that time.
-    std::deque<Event> take(Moment until);
+    /// What has come, as soon as there is something, or it was woken, or at that time. Of messages a few, or
+    /// none where they are to wait.
+    std::deque<Event> take(Moment until, bool withMessages = true);
 
 private:
     explicit Mailbox(std::size_t mostBytes) : limit(mostBytes) {}
@@ -78,8 +79,9 @@ private:
     void* place = nullptr;
     std::mutex mutex;
     std::condition_variable changed;
-    std::deque<Event> events;
-    std::size_t bytes = 0; ///< of their messages
+    std::deque<Event> events;   ///< all but messages
+    std::deque<Event> messages; ///< that have arrived
+    std::size_t bytes = 0;      ///< of them
     const std::size_t limit;
     bool woken = false;
 };

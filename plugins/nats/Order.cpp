@@ -88,6 +88,7 @@ void Order::settle(Moment now)
     for (auto& [name, writer] : writers) {
         if (!writer.begun &&
             (writer.stored >= writer.held.begin()->first.seq || now - writer.since >= patience)) {
+            writer.read = writer.stored;
             begin(writer, now);
         }
     }
@@ -132,10 +133,11 @@ void Order::release(Writer& writer, Moment now)
     while (!writer.held.empty()) {
         const auto first = writer.held.begin();
         const auto [seq, rank] = first->first;
-        if (seq > writer.next) {
+        if (seq > writer.next && seq > writer.read) {
             return;
         }
-        writer.next = rank == Rank::Data ? seq + 1 : writer.next;
+        first->second.follows = seq <= writer.next;
+        writer.next = std::max(writer.next, rank == Rank::Data ? seq + 1 : seq);
         writer.since = now;
         writer.place = first->second.sort = std::max(writer.place, first->second.place);
         ready.push_back(std::move(first->second));

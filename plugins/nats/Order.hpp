@@ -53,6 +53,7 @@ public:
         MessagePointer message;
         std::uint64_t place = 0; ///< in the stream
         std::uint64_t sort = 0;  ///< the largest place of its writer so far
+        bool follows = true;     ///< or else those before it were read at an earlier opening
     };
 
     /// Takes a message over. False: it was there before.
@@ -68,7 +69,7 @@ public:
     bool isBeginning() const;
 
     /// All that was delivered and not acknowledged is here: writers may begin, unless one of them may still
-    /// have an earlier message to store.
+    /// have an earlier message to store. What is missing of what they had stored was acknowledged.
     void settle(Moment now);
 
     /// Passes what did not come for so long, or where so many wait.
@@ -84,6 +85,7 @@ private:
         std::map<Label::Turn, Item> held;
         std::uint64_t next = 0;   ///< of the next packet
         std::uint64_t stored = 0; ///< of all messages of it
+        std::uint64_t read = 0;   ///< of those before this one, what is not here was read earlier
         std::uint64_t place = 0;  ///< the largest that had its turn
         bool begun = false;
         Moment since; ///< it waits

@@ -57,6 +57,8 @@ Reader::Reader(const Settings& deviceSettings, messages::Receiver& deviceReceive
         stream.emplace(connection, settings, until);
         place.emplace(*stream, settings, until);
         connection.subscribe(place->subject);
+        connection.watch("$JS.EVENT.ADVISORY.STREAM.DELETED." + stream->name);
+        connection.watch("$JS.EVENT.ADVISORY.CONSUMER.DELETED." + stream->name + "." + place->name);
     } else {
         connection.subscribe(settings.subject);
         natsConnection_FlushTimeout(connection.get(),
@@ -79,7 +81,9 @@ void Reader::run(DeviceStreams& deviceStreams)
         if (isDone() && !std::exchange(inputEnded, true)) {
             streams->endInput(); // the caller has yet to read what is to be acknowledged
         }
-        for (Event& event : mailbox->take(nextTime())) {
+        const bool takesMessages =
+            stream || !waiting; // of a stream, there are no more than the window
+        for (Event& event : mailbox->take(nextTime(), takesMessages)) {
             handle(event);
         }
     }
@@ -102,8 +106,10 @@ void Reader::handle(Event& event)
     case Event::Kind::Answer:
         if (event.text == "state") {
             handleState(event.message.get());
-        } else {
+        } else if (event.text == "acknowledged") {
             confirmed = true;
+        } else { // something was deleted
+            askTime = {};
         }
         break;
     case Event::Kind::Disconnected:
@@ -149,7 +155,7 @@ void Reader::handleMessage(MessagePointer message)
     }
     const auto label =
         Label::read(headerOf(message.get(), idHeader), headerOf(message.get(), storedHeader));
-    Order::Item item{std::move(message), number, number};
+    Order::Item item{std::move(message), number, number, true};
     if (!label) {
         order.putBack(std::move(item)); // of another maker: as it comes
     } else if (!order.take(*label, item, now)) {
@@ -189,6 +195,7 @@ void Reader::deliver()
             arrived.pop_front();
             take(std::move(message), 0);
         } else if (auto item = order.next()) {
+            receiver.shares = !item->follows;
             take(std::move(item->message), item->place);
         } else {
             return;
@@ -260,7 +267,7 @@ void Reader::touch()
 std::chrono::milliseconds Reader::askPause() const
 {
     if (!order.isBeginning()) {
-        return 1000ms;
+        return goneAnswers > 0 ? 500ms : 30000ms;
     }
     return openWhenAsked > 0 ? 200ms : last != lastWhenAsked ? 5ms : 100ms;
 }
@@ -283,6 +290,7 @@ void Reader::askForPlace()
 void Reader::handBack()
 {
     const Moment until = Clock::now() + settings.closeTimeout;
+    connection.unsubscribe(); // or it would come here again
     for (const auto& [number, entry] : open) {
         connection.send(entry.reply, notYet);
     }

@@ -19,7 +19,9 @@ constexpr std::size_t headerRoom = 512;            // bytes that headers take, a
 constexpr std::size_t mostUnconfirmed = 4U << 20U; // bytes, without a stream
 constexpr std::size_t mostUnstored = 64U << 20U;   // bytes, with one
 constexpr std::int64_t storeWait = 3000;           // ms, after which a message is sent again
-constexpr auto retryWait = 200ms;                  // before one is sent again that was refused
+constexpr auto idleTime = 20ms; // after which the server is asked whether it has all
+constexpr const char* noConnection = "there is no connection with a server";
+constexpr auto retryWait = 200ms; // before one is sent again that was refused
 
 void onStored(jsCtx* /*js*/, natsMsg* message, jsPubAck* /*stored*/, jsPubAckErr* error,
               void* number)
@@ -74,7 +76,7 @@ bool Writer::publish(const Message& message, Label::Turn turn, std::uint64_t cou
                                                      bytes.data(), static_cast<int>(size));
     if (status != NATS_OK) {
         connected = false; // until it is told that there is another one
-        whyNot = reasonOf(status);
+        whyNot = noConnection;
         return false;
     }
     unconfirmed += counts;
@@ -103,6 +105,8 @@ void Writer::run(DeviceStreams& deviceStreams)
                 ended = publish(sender.end(), {sender.end().seq, Rank::End}, 0);
                 continue;
             }
+        } else if (isEmpty && unconfirmedBytes > 0 && Clock::now() - lastSent >= idleTime) {
+            confirm(50);
         }
         if (deadline && Clock::now() >= *deadline) {
             break;
@@ -128,6 +132,7 @@ void Writer::handle(Event& event)
         break;
     case Event::Kind::Disconnected:
         connected = false;
+        whyNot = noConnection;
         host.raise(
             "warning", "brenix:Device:disconnected",
             ("The connection with " + connection.server() + " has ended: " + event.text).c_str());
@@ -135,6 +140,7 @@ void Writer::handle(Event& event)
         break;
     case Event::Kind::Reconnected:
         connected = true;
+        whyNot.clear();
         dropUnconfirmed();
         host.updateProperty(makeScalar("Server", connection.server()));
         for (Again& message : again) {
@@ -183,7 +189,7 @@ void Writer::handleState(const natsMsg* answer)
 void Writer::askForStream()
 {
     if (Clock::now() >= askTime) {
-        askTime = Clock::now() + 1s;
+        askTime = Clock::now() + 500ms;
         connection.ask("$JS.API.STREAM.INFO." + stream->name, "", "state");
     }
 }
@@ -343,7 +349,7 @@ natsStatus Writer::hand(MessagePointer& message)
         std::ignore = message.release(); // the library has it
     }
     if (status != NATS_OK) {
-        whyNot = reasonOf(status);
+        whyNot = connected ? reasonOf(status) : noConnection;
     }
     return status;
 }
@@ -367,7 +373,7 @@ void Writer::confirm(std::int64_t milliseconds)
         dropUnconfirmed();
     } else if (status == NATS_OK) {
         unconfirmed = unconfirmedBytes = 0;
-    } else {
+    } else if (connected) {
         whyNot = reasonOf(status);
     }
 }
@@ -394,7 +400,7 @@ Moment Writer::nextTime() const
     const auto now = Clock::now();
     Moment time = now + 2s;
     if (!stream && unconfirmed > 0 && connected) {
-        time = now + 20ms;
+        time = std::max(now, lastSent + idleTime);
     }
     if (!again.empty() && connected) {
         time = std::min(time, again.front().at);
