@@ -244,6 +244,7 @@ struct Notes final : DeviceHost, DeviceStreams {
         log += "-" + std::to_string(counts) + (isWriters ? "(at the writer)" : "");
     }
     std::uint64_t takenCounts() const override { return 0; }
+    std::uint64_t pushedCounts() const override { return 0; }
 
     std::string log;
 };

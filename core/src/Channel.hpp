@@ -61,6 +61,7 @@ struct BRENIXCORE_INTERNAL Channel::Impl final : Reporter, plugin::DeviceStreams
     void endInput() override;
     void tellLost(std::uint64_t counts, const char* reason) override;
     std::uint64_t takenCounts() const override;
+    std::uint64_t pushedCounts() const override;
 
     bool enter(plugin::Packet& packet, bool waits);
     std::optional<plugin::Packet> leave(bool waits);

@@ -203,6 +203,11 @@ std::uint64_t Channel::Impl::takenCounts() const
     return input ? input->impl->queue.takenCounts() : 0;
 }
 
+std::uint64_t Channel::Impl::pushedCounts() const
+{
+    return input ? input->impl->queue.pushedCounts() : 0;
+}
+
 // --- The device's thread ---
 
 void Channel::Impl::tellInputLosses() noexcept

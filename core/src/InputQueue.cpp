@@ -145,6 +145,12 @@ std::uint64_t Queue::takenCounts() const
     return next == nullptr ? numbered : positionOf(*next);
 }
 
+std::uint64_t Queue::pushedCounts() const
+{
+    const std::lock_guard guard(mutex);
+    return numbered;
+}
+
 // --- What the caller takes ---
 
 Queue::Packets Queue::take(std::uint64_t count)

@@ -81,6 +81,9 @@ public:
     /// All counts before it, from open on and lost ones included, the caller has done with.
     std::uint64_t takenCounts() const;
 
+    /// The number of the next count.
+    std::uint64_t pushedCounts() const;
+
     /// What is lost behind the last packet, for a reason or, with null, told otherwise.
     void lose(std::uint64_t count, const char* reason);
 

@@ -70,6 +70,7 @@ struct Bench : Base, DeviceStreams, DeviceHost {
     void endInput() override { inputEnded = true; }
     void tellLost(std::uint64_t /*counts*/, const char* /*reason*/) override {}
     std::uint64_t takenCounts() const override { return 0; }
+    std::uint64_t pushedCounts() const override { return 0; }
 
     bool isClosing() const override
     {

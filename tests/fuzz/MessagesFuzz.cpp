@@ -76,6 +76,7 @@ struct Host final : DeviceHost, DeviceStreams {
     void refuseOutput() override { std::abort(); }
     void endInput() override { std::abort(); }
     std::uint64_t takenCounts() const override { std::abort(); }
+    std::uint64_t pushedCounts() const override { std::abort(); }
 
     std::uint64_t lost = 0;
     bool hasFailed = false;

@@ -92,6 +92,10 @@ public:
     /// drops what has waited longest changes it, too. For a device that keeps its place elsewhere.
     virtual std::uint64_t takenCounts() const = 0;
 
+    /// The number of the next count, by which takenCounts() goes: what was pushed or told lost so far is before it,
+    /// as the stream's filters have left it.
+    virtual std::uint64_t pushedCounts() const = 0;
+
 protected:
     ~DeviceStreams() = default;
 };
