@@ -42,6 +42,13 @@ Writing::Writing(Link& deviceLink, const Settings& linkSettings,
 {
 }
 
+/// libzmq tells that a peer has gone, and a little later gives up what is on the way to it: until then it
+/// would take more for it.
+bool Writing::isSettled() const
+{
+    return settings.pattern == Pattern::Publish || (link.getPeers() > 0 && Clock::now() >= settled);
+}
+
 std::uint64_t Writing::getReaders() const
 {
     return settings.pattern == Pattern::Publish ? subscriptions : link.getPeers();
@@ -57,7 +64,7 @@ void Writing::run(DeviceStreams& streams)
         }
         hasBegun = hasBegun || getReaders() >= limits.readers;
         State state = State::Blocked;
-        if (hasBegun) {
+        if (hasBegun && isSettled()) {
             state = sendSome(streams);
         } else if (closing && !waiting && !pull(streams)) {
             state = State::Idle;
@@ -171,7 +178,10 @@ void Writing::wait(State state, milliseconds time)
                           milliseconds(0), time);
     }
     const bool publishes = settings.pattern == Pattern::Publish;
-    const bool isFull = state == State::Blocked && hasBegun;
+    const bool isFull = state == State::Blocked && hasBegun && isSettled();
+    if (Clock::now() < settled) {
+        time = std::min(time, milliseconds(20));
+    }
     outstanding.isAwaited = !publishes;
     link.wait(wakeUp, static_cast<short>(publishes ? ZMQ_POLLIN : isFull ? ZMQ_POLLOUT : 0), time);
     outstanding.isAwaited = false;
@@ -189,7 +199,10 @@ void Writing::wait(State state, milliseconds time)
     // When a peer goes, libzmq drops what was on the way to it as if it had been sent.
     if (link.getDepartures() == departures) {
         handedOver = before;
-    } else if (const std::uint64_t lost = sent - std::exchange(handedOver, sent); lost > 0) {
+        return;
+    }
+    settled = Clock::now() + milliseconds(100);
+    if (const std::uint64_t lost = sent - std::exchange(handedOver, sent); lost > 0) {
         doubtful += lost;
         tell();
     }

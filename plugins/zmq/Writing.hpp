@@ -56,6 +56,7 @@ private:
     void tell();
 
     std::uint64_t getReaders() const;
+    bool isSettled() const;
 
     Link& link;
     const Settings& settings;
@@ -66,6 +67,7 @@ private:
     Outstanding& outstanding;
 
     bool hasBegun = false;
+    Clock::time_point settled{}; ///< after a peer has gone
     std::uint64_t subscriptions = 0;
     std::uint64_t hellos = 1;                ///< to be sent
     std::optional<messages::Hello> greeting; ///< as it was before `outgoing`
