@@ -78,6 +78,7 @@ OptionsHandle makeOptions(const Settings& settings, const std::vector<std::strin
     require(natsOptions_Create(&made), "Could not begin");
     OptionsHandle options(made);
     std::vector<const char*> urls;
+    urls.reserve(servers.size());
     for (const std::string& url : servers) {
         urls.push_back(url.c_str());
     }
@@ -130,7 +131,7 @@ std::string reasonOf(natsStatus status)
 {
     natsStatus last = NATS_OK;
     const char* const text = nats_GetLastError(&last);
-    const std::string reason =
+    std::string reason =
         last == status && text != nullptr && *text != '\0' ? text : natsStatus_GetText(status);
     const std::size_t place = reason.find("): "); // in the library's sources, which stands first
     return reason.rfind('(', 0) == 0 && place != std::string::npos ? reason.substr(place + 3)
@@ -172,7 +173,7 @@ std::string Connection::connect(const Settings& settings, const std::vector<std:
     if (status == NATS_OK) {
         return {};
     }
-    const std::string reason = reasonOf(status);
+    std::string reason = reasonOf(status);
     if (status == NATS_NO_SERVER) {
         return "no server answers there";
     }

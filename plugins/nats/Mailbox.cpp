@@ -40,10 +40,10 @@ bool isShort(const Event& event)
 
 std::shared_ptr<Mailbox> Mailbox::make(std::size_t limit)
 {
-    const std::shared_ptr<Mailbox> box(new Mailbox(limit));
+    std::shared_ptr<Mailbox> box(new Mailbox(limit));
     Registry& all = registry();
     const std::lock_guard lock(all.mutex);
-    auto* const place = reinterpret_cast<void*>(++all.last);
+    auto* const place = reinterpret_cast<void*>(++all.last); // NOLINT(performance-no-int-to-ptr)
     all.boxes.emplace(place, box);
     box->place = place;
     return box;

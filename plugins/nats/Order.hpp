@@ -6,7 +6,6 @@
 #include "Mailbox.hpp"
 
 #include <algorithm>
-#include <compare>
 #include <cstddef>
 #include <cstdint>
 #include <deque>
@@ -32,7 +31,10 @@ struct Label {
         std::uint64_t seq = 0;
         Rank rank = Rank::Hello;
 
-        auto operator<=>(const Turn&) const = default;
+        bool operator<(const Turn& other) const
+        {
+            return std::pair(seq, rank) < std::pair(other.seq, other.rank);
+        }
     };
 
     std::string writer; ///< differs from all others

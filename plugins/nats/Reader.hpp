@@ -45,8 +45,8 @@ private:
 
     // What goes into the input stream:
     void deliver();
-    void take(MessagePointer message, std::uint64_t place);
-    void pass(std::uint64_t place);
+    void take(MessagePointer message, std::uint64_t number);
+    void pass(std::uint64_t number);
 
     // What a stream is told:
     void acknowledge();

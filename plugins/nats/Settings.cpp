@@ -82,7 +82,7 @@ std::chrono::milliseconds readSeconds(Options& options, const std::string& name,
 
 std::string readFileName(Options& options, const std::string& name)
 {
-    const std::string file = options.text(name).value_or("");
+    std::string file = options.text(name).value_or("");
     if (!file.empty() && !std::ifstream(file)) {
         Options::fail(name, "could not read " + file);
     }

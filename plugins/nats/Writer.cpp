@@ -148,8 +148,6 @@ void Writer::handle(Event& event)
         }
         break;
     case Event::Kind::Closed:
-        failure = event.text;
-        break;
     case Event::Kind::Error:
         failure = event.text;
         break;
