@@ -96,7 +96,8 @@ TEST(LoadTest, PluginsAreUnloaded)
         void* const library = dlopen(entry.path().c_str(), RTLD_NOW | RTLD_LOCAL);
         EXPECT_NE(library, nullptr) << dlerror();
         dlclose(library);
-        EXPECT_FALSE(isLoaded(entry.path())) << entry.path();
+        const bool stays = entry.path().stem() == "nats"; // plugins/CMakeLists.txt says why
+        EXPECT_EQ(isLoaded(entry.path()), stays) << entry.path();
         ++plugins;
     }
     EXPECT_GT(plugins, 0);
