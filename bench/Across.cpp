@@ -4,6 +4,7 @@
 
 #include "Echo.hpp"
 
+#include <malloc.h>
 #include <netinet/in.h>
 
 #include <cstdlib>
@@ -282,6 +283,9 @@ private:
 
 int main(int argc, char** argv)
 {
+    // Blocks are allocated in one thread and freed in another: what is free stays at hand, for the libraries too.
+    mallopt(M_MMAP_THRESHOLD, 32 << 20);
+    mallopt(M_TRIM_THRESHOLD, 256 << 20);
     for (const std::size_t bytes : {4UL << 10, 64UL << 10, 1UL << 20}) {
         const std::size_t elements = bytes / sizeof(double);
         const std::string size = std::to_string(bytes);

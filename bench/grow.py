@@ -77,7 +77,8 @@ def run(brenix, server, data, writers, readers, messages):
     common = ["-q", "-o", f"Servers={server.url}"]
     reading = [subprocess.Popen([brenix, "read", "nats", *common, "-o", "Subject=grow.*", "-o",
                                  f"Writers={writers}", "--limit", "1000000000", "--fail-on-loss",
-                                 "--format", "raw", "--field", "data:double", "--to", "/dev/null"])
+                                 "--format", "raw",
+                                 "--to", "/dev/null"])
                for _ in range(readers)]
     wait_for(lambda: server.subscriptions() >= none + readers)
     served = server.seconds()
