@@ -169,6 +169,24 @@ def message_rows(report):
                 f"messages:message/{size}/copy"), " x", limit)
 
 
+def across_rows(report):
+    for device, what, sizes in (("zmq", "zmq, push and pull over tcp", ("4096", "65536", "1048576")),
+                                ("nats", "nats, core", ("4096", "65536")),
+                                ("jetstream", "nats, published to a stream", ("4096", "65536"))):
+        raw = {"zmq": "libzmq", "nats": "libnats", "jetstream": "js_PublishAsync"}[device]
+        for size in sizes:
+            name = f"across:{device}/{size}/"
+            if not report.has(name + "ours") or not report.has(name + "raw"):
+                report.left_out(f"{what}, {SIZES[size]}: bytes a second", raw)
+            elif size == "4096":
+                report.row(f"{what}, {SIZES[size]}: time of a packet beyond that of its bytes", raw, report.combine(
+                    lambda ours, theirs: (ours - theirs) / 1000, name + "ours", name + "raw"), " us", 20)
+            else:
+                report.row(f"{what}, {SIZES[size]}: bytes a second", raw, report.combine(
+                    lambda ours, theirs: ours / theirs, f"{name}ours#bytes_per_second",
+                    f"{name}raw#bytes_per_second"), " x", 0.8, at_least=True)
+
+
 def machine(folder):
     """One line: processor, compiler, rounds, and how busy the machine was."""
     runs = [json.loads(file.read_text())["context"] for file in (folder / "rounds").glob("two-*")]
@@ -227,6 +245,7 @@ def main():
     call_rows(report)
     stream_rows(report)
     message_rows(report)
+    across_rows(report)
     (folder / "results.json").write_text(
         json.dumps({"figures": report.figures, "rows": report.rows}, indent=1))
     text = machine(folder) + table(report.rows)
