@@ -16,7 +16,7 @@ void Reading::run(DeviceStreams& streams)
         bool isIdle = false;
         deliver(streams);
         for (int i = 0; i < some && !waiting && !isIdle && !receiver.isDone(); ++i) {
-            isIdle = !isSoon([&] { return receive(streams); });
+            isIdle = !receive(streams);
             deliver(streams);
         }
         const bool isDone = !waiting && receiver.isDone();

@@ -2,7 +2,6 @@
 #ifndef BRENIX_PLUGINS_ZMQ_WAKEUP_HPP
 #define BRENIX_PLUGINS_ZMQ_WAKEUP_HPP
 
-#include <sched.h>
 #include <sys/eventfd.h>
 #include <unistd.h>
 
@@ -47,20 +46,6 @@ private:
     const int handle;
     std::atomic<bool> signalled = false;
 };
-
-/// Asks again and again whether there is something, giving way to the others: while data flows there is seldom
-/// long to wait, and to sleep and be woken takes longer than a packet does.
-template <typename Condition>
-bool isSoon(const Condition& condition)
-{
-    for (int times = 0; times < 10; ++times) {
-        if (condition()) {
-            return true;
-        }
-        ::sched_yield();
-    }
-    return condition();
-}
 
 } // namespace zeromq
 

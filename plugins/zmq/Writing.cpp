@@ -82,7 +82,7 @@ Writing::State Writing::sendSome(DeviceStreams& streams)
 {
     constexpr int some = 256;
     for (int i = 0; i < some; ++i) {
-        const bool isIdle = !waiting && !isSoon([&] { return pull(streams); });
+        const bool isIdle = !waiting && !pull(streams);
         if (!sendHellos() && !isIdle) {
             return State::Blocked;
         }
