@@ -2,6 +2,7 @@
 
 #include "Driver.hpp"
 
+#include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -269,6 +270,7 @@ TEST_F(Hdf5Test, TheFileOfAKilledProgramOpens)
         ASSERT_EQ(pipe(ends.data()), 0);
         const pid_t child = fork();
         if (child == 0) {
+            prctl(PR_SET_PDEATHSIG, SIGKILL); // a test that fails leaves nobody behind
             Channel writer("hdf5", infinity, 100000);
             record(writer, {"Compression", round % 2 * 6}, {"SampleRate", round % 3 * 50000});
             for (double next = 0;; next += 1000) {
