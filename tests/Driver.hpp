@@ -39,21 +39,19 @@ inline std::string create(void*& channel, const std::string& device, const std::
 /// An option whose value is a text or a number. Needs no memory.
 struct Option {
     const char* name;
-    std::variant<std::string_view, double, int> value;
+    std::variant<std::string_view, double, int, std::int64_t> value;
 
     const char* type() const
     {
-        constexpr const char* types[] = {"char", "double", "int32"};
+        constexpr const char* types[] = {"char", "double", "int32", "int64"};
         return types[value.index()];
     }
     std::size_t count() const { return value.index() == 0 ? std::get<0>(value).size() : 1; }
     const void* data() const
     {
-        const void* const number = std::get_if<double>(&value);
-        if (value.index() == 0) {
-            return std::get<0>(value).data();
-        }
-        return number != nullptr ? number : std::get_if<int>(&value);
+        const auto* const text = std::get_if<0>(&value);
+        const auto address = [](const auto& number) { return static_cast<const void*>(&number); };
+        return text != nullptr ? text->data() : std::visit(address, value);
     }
 };
 using Options = std::initializer_list<Option>;

@@ -52,7 +52,7 @@ struct Bench : Base, DeviceStreams, DeviceHost {
         const auto data = element.find(brenixplugin::asProperty(packet.fields->at(dataField)));
         REQUIRE(data && data->size() == packet.counts * element.size);
         REQUIRE(packet.counts > 0 && packet.counts <= largest);
-        received.append(static_cast<const char*>(data->data()), data->size());
+        received.append(reinterpret_cast<const char*>(data->data()), data->size());
         return true;
     }
 

@@ -11,6 +11,7 @@
 #include <set>
 #include <stdexcept>
 #include <string>
+#include <type_traits>
 
 namespace brenixcore::plugin
 {
@@ -43,24 +44,12 @@ public:
     }
 
     /// One number of any numeric type.
-    std::optional<double> number(const std::string& name)
-    {
-        auto* const property = find(name);
-        if (property == nullptr) {
-            return std::nullopt;
-        }
-        ReadScalar reader;
-        visitNumbers(property, reader);
-        if (!reader.value || std::isnan(*reader.value)) {
-            fail(name, "must be one number");
-        }
-        return reader.value;
-    }
+    std::optional<double> number(const std::string& name) { return readNumber(name).value; }
 
-    /// One whole number in a range.
+    /// One whole number in a range. An integer is taken to its last digit.
     std::optional<long> wholeNumber(const std::string& name, long least, long most)
     {
-        const std::optional<double> value = number(name);
+        const auto [value, integer] = readNumber(name);
         if (!value) {
             return std::nullopt;
         }
@@ -69,7 +58,7 @@ public:
             fail(name, "must be a whole number from " + std::to_string(least) + " to " +
                            std::to_string(most));
         }
-        return static_cast<long>(*value);
+        return integer.value_or(static_cast<long>(*value));
     }
 
     /// True or false: "logical", or the number 1 or 0.
@@ -113,13 +102,29 @@ private:
         void operator()(const brenixplugin::kit::device::TScalarProperty<T>& scalar)
         {
             value = static_cast<double>(scalar.value);
+            if constexpr (std::is_integral_v<T>) {
+                integer = static_cast<long>(scalar.value);
+            }
         }
         template <typename Other>
         void operator()(const Other& /*several*/)
         {
         }
         std::optional<double> value;
+        std::optional<long> integer; ///< the same; of no use where it is beyond its range
     };
+
+    ReadScalar readNumber(const std::string& name)
+    {
+        ReadScalar reader;
+        if (auto* const property = find(name); property != nullptr) {
+            visitNumbers(property, reader);
+            if (!reader.value || std::isnan(*reader.value)) {
+                fail(name, "must be one number");
+            }
+        }
+        return reader;
+    }
 
     brenixplugin::interfaces::IPropertyInfo* find(const std::string& name)
     {
