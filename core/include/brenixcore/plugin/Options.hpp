@@ -53,8 +53,9 @@ public:
         if (!value) {
             return std::nullopt;
         }
+        const double beyond = 0x1p63; // the last in this range is no double
         if (!(*value >= static_cast<double>(least) && *value <= static_cast<double>(most)) ||
-            std::floor(*value) != *value) {
+            *value >= beyond || std::floor(*value) != *value) {
             fail(name, "must be a whole number from " + std::to_string(least) + " to " +
                            std::to_string(most));
         }
@@ -111,7 +112,7 @@ private:
         {
         }
         std::optional<double> value;
-        std::optional<long> integer; ///< the same; of no use where it is beyond its range
+        std::optional<long> integer; ///< the same; wraps beyond its range
     };
 
     ReadScalar readNumber(const std::string& name)
