@@ -124,6 +124,8 @@ constexpr OptionInfo optionTable[] = {
     {"CaFile", "text", "", "the system's", "for TLS: whose certificates of servers are good, PEM"},
     {"CertificateFile", "text", "", "none", "for TLS: its own certificate, PEM"},
     {"KeyFile", "text", "", "none", "for TLS: the key of that, PEM"},
+    {"ServerName", "text", "", "the host, where Servers has only one",
+     "for TLS: whom the certificates of all servers must be for"},
     {"ConnectTimeout", "number", "seconds", "10",
      "for open, up to 86400; look-ups of names are apart"},
     {"CloseTimeout", "number", "seconds", "10",

@@ -57,13 +57,6 @@ void onChange(natsConnection* connection, void* number)
 
 using OptionsHandle = std::unique_ptr<natsOptions, Destroy<natsOptions_Destroy>>;
 
-bool usesTls(const Settings& settings)
-{
-    return !settings.caFile.empty() || !settings.certificateFile.empty() ||
-           std::any_of(settings.servers.begin(), settings.servers.end(),
-                       [](const std::string& url) { return url.rfind("tls://", 0) == 0; });
-}
-
 void require(natsStatus status, const std::string& what)
 {
     if (status != NATS_OK) {
@@ -105,8 +98,12 @@ OptionsHandle makeOptions(const Settings& settings, const std::vector<std::strin
                                      ": " + reasonOf(status));
         }
     };
-    if (usesTls(settings)) {
+    if (settings.usesTls()) {
         require(natsOptions_SetSecure(made, true), "Could not use TLS");
+    }
+    if (!settings.serverName.empty()) {
+        require(natsOptions_SetExpectedHostname(made, settings.serverName.c_str()),
+                "Could not use the server's name");
     }
     if (!settings.caFile.empty()) {
         useFile("CaFile", settings.caFile,
@@ -139,7 +136,7 @@ std::string reasonOf(natsStatus status)
 }
 
 Connection::Connection(const Settings& settings, std::shared_ptr<Mailbox> box)
-    : mailbox(std::move(box))
+    : until(Clock::now() + settings.connectTimeout), mailbox(std::move(box))
 {
     const auto& servers = settings.servers;
     const auto count = static_cast<std::int64_t>(servers.size());
@@ -178,7 +175,7 @@ std::string Connection::connect(const Settings& settings, const std::vector<std:
         return "no server answers there";
     }
     if (reason == "Expected 'PONG', got ''") {
-        return usesTls(settings)
+        return settings.usesTls()
                    ? "the server ended the connection, as it does if a certificate is missing or "
                      "not good; its log says why"
                    : "the server ended the connection";
@@ -189,7 +186,8 @@ std::string Connection::connect(const Settings& settings, const std::vector<std:
 std::string Connection::server()
 {
     std::array<char, 1024> url{};
-    if (natsConnection_GetConnectedUrl(get(), url.data(), url.size()) == NATS_OK) {
+    if (natsConnection_GetConnectedUrl(get(), url.data(), url.size()) == NATS_OK &&
+        url[0] != '\0') {
         lastServer = publicName(url.data());
     }
     return lastServer;
@@ -206,6 +204,17 @@ std::uint64_t Connection::reconnects() const
     natsConnection_GetStats(get(), made);
     natsStatistics_GetCounts(made, nullptr, nullptr, nullptr, nullptr, &times);
     return times;
+}
+
+natsStatus Connection::flush(std::int64_t milliseconds) const
+{
+    // When it fails to send, the library says that all went well, and has the error of the thread only.
+    nats_ReleaseThreadMemory();
+    natsStatus status = natsConnection_FlushTimeout(get(), milliseconds);
+    if (status == NATS_OK) {
+        nats_GetLastError(&status);
+    }
+    return status;
 }
 
 Connection::Subscription Connection::subscribe(const std::string& subject, natsMsgHandler handler)

@@ -31,11 +31,16 @@ public:
 
     natsConnection* get() const { return connection.get(); }
 
+    const Moment until; ///< when open has to be done
+
     /// Where it goes, or went last.
     std::string server();
 
     /// How often it was made anew.
     std::uint64_t reconnects() const;
+
+    /// Waits until the server has taken what was sent.
+    natsStatus flush(std::int64_t milliseconds) const;
 
     /// Has what arrives under a subject put into the mailbox. @throws std::runtime_error
     void subscribe(const std::string& subject);

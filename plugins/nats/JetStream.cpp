@@ -105,9 +105,10 @@ findOrMake(jsCtx* context, const std::string& name, const Settings& settings, Mo
 
 } // namespace
 
-KeptStream::KeptStream(Connection& connection, const Settings& settings, Moment until)
+KeptStream::KeptStream(const Connection& connection, const Settings& settings)
     : name(settings.stream)
 {
+    const Moment until = connection.until;
     jsCtx* made = nullptr;
     jsOptions options;
     jsOptions_Init(&options);

@@ -22,7 +22,7 @@ constexpr std::chrono::seconds patience(30);
 struct KeptStream {
     /// Without a name in the settings, finds the one that has the subject.
     /// @throws std::runtime_error
-    KeptStream(Connection& connection, const Settings& settings, Moment until);
+    KeptStream(const Connection& connection, const Settings& settings);
 
     std::unique_ptr<jsCtx, Destroy<jsCtx_Destroy>> context;
     std::string name;

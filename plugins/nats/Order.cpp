@@ -50,7 +50,9 @@ std::optional<Label> Label::read(const std::string& id, const std::string& store
 
 bool Order::take(const Label& label, Item& item, Moment now)
 {
-    Writer& writer = writers[label.writer];
+    const auto [entry, isNew] = writers.try_emplace(label.writer);
+    Writer& writer = entry->second;
+    beginners += isNew ? 1 : 0;
     writer.stored = std::max(writer.stored, label.stored);
     if (writer.begun && label.turn.rank == Rank::Data && label.turn.seq < writer.next) {
         return false;
@@ -77,18 +79,11 @@ std::optional<Order::Item> Order::next()
     return item;
 }
 
-bool Order::isBeginning() const
-{
-    return std::any_of(writers.begin(), writers.end(),
-                       [](const auto& writer) { return !writer.second.begun; });
-}
-
 void Order::settle(Moment now)
 {
     for (auto& [name, writer] : writers) {
         if (!writer.begun &&
             (writer.stored >= writer.held.begin()->first.seq || now - writer.since >= patience)) {
-            writer.read = writer.stored;
             begin(writer, now);
         }
     }
@@ -100,8 +95,8 @@ void Order::settle(Moment now)
 void Order::giveUp(Moment now, std::size_t most)
 {
     for (auto& [name, writer] : writers) {
-        if (!writer.held.empty() && writer.begun &&
-            (now - writer.since >= patience || writer.held.size() >= most)) {
+        if (!writer.held.empty() &&
+            (now - writer.since >= patience || (writer.begun && writer.held.size() >= most))) {
             begin(writer, now);
         }
     }
@@ -114,16 +109,13 @@ void Order::excuse(Moment now)
     }
 }
 
-bool Order::isWaiting() const
-{
-    return std::any_of(writers.begin(), writers.end(),
-                       [](const auto& writer) { return !writer.second.held.empty(); });
-}
-
 /// With the first of those that it has.
 void Order::begin(Writer& writer, Moment now)
 {
-    writer.begun = true;
+    if (!std::exchange(writer.begun, true)) {
+        --beginners;
+        writer.read = writer.stored;
+    }
     writer.next = writer.held.begin()->first.seq;
     release(writer, now);
 }

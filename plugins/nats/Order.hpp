@@ -64,11 +64,11 @@ public:
     /// The next one whose turn it is.
     std::optional<Item> next();
 
-    /// Puts one back that could not be used yet.
-    void putBack(Item item) { ready.push_front(std::move(item)); }
+    /// Takes one over that says nothing of its place: it has its turn at once.
+    void add(Item item) { ready.push_back(std::move(item)); }
 
     /// Whether there are writers of which it is not known where they begin.
-    bool isBeginning() const;
+    bool isBeginning() const { return beginners > 0; }
 
     /// All that was delivered and not acknowledged is here: writers may begin, unless one of them may still
     /// have an earlier message to store. What is missing of what they had stored was acknowledged.
@@ -79,8 +79,6 @@ public:
 
     /// It cannot come now: the time begins anew.
     void excuse(Moment now);
-
-    bool isWaiting() const;
 
 private:
     struct Writer {
@@ -97,6 +95,7 @@ private:
     void release(Writer& writer, Moment now);
 
     std::map<std::string, Writer> writers;
+    std::size_t beginners = 0; ///< writers that have not begun
     std::deque<Item> ready;
 };
 

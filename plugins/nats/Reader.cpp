@@ -53,16 +53,20 @@ Reader::Reader(const Settings& deviceSettings, messages::Receiver& deviceReceive
       connection(settings, mailbox)
 {
     if (settings.keeps) {
-        const Moment until = Clock::now() + settings.connectTimeout;
-        stream.emplace(connection, settings, until);
-        place.emplace(*stream, settings, until);
+        stream.emplace(connection, settings);
+        place.emplace(*stream, settings, connection.until);
         connection.subscribe(place->subject);
         connection.watch("$JS.EVENT.ADVISORY.STREAM.DELETED." + stream->name);
         connection.watch("$JS.EVENT.ADVISORY.CONSUMER.DELETED." + stream->name + "." + place->name);
     } else {
         connection.subscribe(settings.subject);
-        natsConnection_FlushTimeout(connection.get(),
-                                    settings.connectTimeout.count()); // from here on all arrives
+        using std::chrono::milliseconds;
+        const auto left = std::chrono::duration_cast<milliseconds>(connection.until - Clock::now());
+        const natsStatus status = connection.flush(std::max(left, 1ms).count());
+        if (status != NATS_OK) { // or else all arrives from here on
+            throw std::runtime_error("Could not subscribe to " + settings.subject + ": " +
+                                     reasonOf(status));
+        }
     }
 }
 
@@ -72,8 +76,14 @@ void Reader::run(DeviceStreams& deviceStreams)
     receiver.begin();
     while (true) {
         const bool closing = streams->isClosing();
-        deliver();
-        acknowledge();
+        if (!inputEnded) {
+            deliver();
+        }
+        if (order.isBeginning()) {
+            askForPlace(); // and what is open stays so until the answer comes
+        } else {
+            acknowledge();
+        }
         touch();
         if (closing || !failure.empty() || (isDone() && open.empty())) {
             break;
@@ -120,6 +130,7 @@ void Reader::handle(Event& event)
         break;
     case Event::Kind::Reconnected:
         connected = true;
+        order.excuse(Clock::now());
         openWhenAsked = 0;
         askTime = {};
         host.updateProperty(makeScalar("Server", connection.server()));
@@ -157,7 +168,7 @@ void Reader::handleMessage(MessagePointer message)
         Label::read(headerOf(message.get(), idHeader), headerOf(message.get(), storedHeader));
     Order::Item item{std::move(message), number, number, true};
     if (!label) {
-        order.putBack(std::move(item)); // of another maker: as it comes
+        order.add(std::move(item)); // of another maker: as it comes
     } else if (!order.take(*label, item, now)) {
         pass(number);
     }
@@ -225,22 +236,21 @@ void Reader::pass(std::uint64_t number)
 
 // --- What a stream is told ---
 
-void Reader::acknowledge()
+/// Returns whether nothing that was read is left, since there is a connection.
+bool Reader::acknowledge()
 {
-    if (order.isBeginning()) {
-        askForPlace(); // and what is open stays so until the answer comes
-        return;
-    }
     const std::uint64_t taken = pushed.empty() ? 0 : streams->takenCounts();
-    while (connected && !pushed.empty() && pushed.front().end <= taken) {
+    while (!pushed.empty() && pushed.front().end <= taken) {
         const auto found = open.find(pushed.front().place);
-        if (!connection.send(found->second.reply, ack)) {
-            return; // the connection has ended
+        if (!connected || !connection.send(found->second.reply, ack)) {
+            return false;
         }
+        confirmed = false;
         lastReply = found->second.reply;
         open.erase(found);
         pushed.pop_front();
     }
+    return true;
 }
 
 /// Tells that it still waits for the program, or for its turn, before the server thinks that it got lost.
@@ -256,7 +266,7 @@ void Reader::touch()
             entry.touched = now;
         }
     }
-    if (open.size() >= settings.window && !pushed.empty()) {
+    if (open.size() >= settings.window && !pushed.empty() && !order.isBeginning()) {
         order.excuse(now); // nothing comes before the program reads
     }
     order.giveUp(now, settings.window);
@@ -291,13 +301,22 @@ void Reader::handBack()
 {
     const Moment until = Clock::now() + settings.closeTimeout;
     connection.unsubscribe(); // or it would come here again
-    for (const auto& [number, entry] : open) {
-        connection.send(entry.reply, notYet);
-    }
-    confirmed = lastReply.empty();
+    bool isBack = false;
     askTime = {};
-    while (!confirmed && failure.empty() && Clock::now() < until) {
-        if (connected && Clock::now() >= askTime + 500ms) {
+    while (failure.empty()) {
+        const bool isAcknowledged = acknowledge();
+        if (connected && !isBack) {
+            isBack = std::all_of(open.begin(), open.end(), [&](const auto& each) {
+                return connection.send(each.second.reply, notYet);
+            });
+        }
+        if (isAcknowledged && confirmed) {
+            return;
+        }
+        if (Clock::now() >= until) {
+            break;
+        }
+        if (connected && !confirmed && Clock::now() >= askTime + 500ms) {
             askTime = Clock::now();
             connection.ask(lastReply, ack, "acknowledged"); // once more, for an answer
         }
@@ -307,12 +326,10 @@ void Reader::handBack()
             }
         }
     }
-    if (!confirmed) {
-        host.raise("warning", "brenix:Device:notAcknowledged",
-                   ("What was read of stream " + stream->name +
-                    " last was not acknowledged in time: it may come again.")
-                       .c_str());
-    }
+    host.raise("warning", "brenix:Device:notAcknowledged",
+               ("What was read of stream " + stream->name +
+                " last was not acknowledged in time: it may come again.")
+                   .c_str());
 }
 
 Moment Reader::nextTime() const

@@ -49,7 +49,7 @@ private:
     void pass(std::uint64_t number);
 
     // What a stream is told:
-    void acknowledge();
+    bool acknowledge();
     void touch();
     std::chrono::milliseconds askPause() const;
     void askForPlace();
@@ -78,7 +78,7 @@ private:
     std::uint64_t last = 0;                       ///< of all places that have come
     std::deque<Pushed> pushed;       ///< of the open ones, those that are in the input stream
     std::string lastReply;           ///< to which one was acknowledged
-    bool confirmed = false;          ///< the acknowledgement of that
+    bool confirmed = true;           ///< the acknowledgement of that
     Moment touchTime, askTime;       ///< of the last time
     std::uint64_t openWhenAsked = 0; ///< 0: not asked
     std::uint64_t lastWhenAsked = 0;

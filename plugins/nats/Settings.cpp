@@ -137,6 +137,36 @@ void readStart(Options& options, Settings& settings)
     settings.startTime = time ? readTime(*time) : 0;
 }
 
+/// Of a URL: without its scheme, what its owner keeps to himself, its port, and the brackets of IPv6.
+std::string hostOf(const std::string& url)
+{
+    std::string host = publicName(url);
+    const std::size_t scheme = host.find("://");
+    host.erase(0, scheme == std::string::npos ? 0 : scheme + 3);
+    if (host.rfind('[', 0) == 0) {
+        return host.substr(1, host.find(']') - 1);
+    }
+    return host.substr(0, host.find(':'));
+}
+
+/// The library looks for one name only.
+std::string readServerName(Options& options, const Settings& settings)
+{
+    if (const auto given = options.text("ServerName")) {
+        if (given->empty()) {
+            Options::fail("ServerName", "must not be empty");
+        }
+        return *given;
+    }
+    const std::string first = hostOf(settings.servers.front());
+    const bool isOne = std::all_of(settings.servers.begin(), settings.servers.end(),
+                                   [&](const std::string& url) { return hostOf(url) == first; });
+    if (!isOne && settings.usesTls()) {
+        Options::fail("ServerName", "is required for TLS with servers on several hosts");
+    }
+    return isOne ? first : "";
+}
+
 /// Options that would have no effect are mistakes.
 void refuse(Options& options, const std::vector<const char*>& texts,
             const std::vector<const char*>& numbers, const std::string& why)
@@ -200,9 +230,17 @@ Settings readSettings(Options& options)
         Options::fail(settings.keyFile.empty() ? "KeyFile" : "CertificateFile",
                       "is missing: a certificate has a key");
     }
+    settings.serverName = readServerName(options, settings);
     settings.connectTimeout = readSeconds(options, "ConnectTimeout", 10);
     settings.closeTimeout = readSeconds(options, "CloseTimeout", 10);
     return settings;
+}
+
+bool Settings::usesTls() const
+{
+    return !caFile.empty() || !certificateFile.empty() ||
+           std::any_of(servers.begin(), servers.end(),
+                       [](const std::string& url) { return url.rfind("tls://", 0) == 0; });
 }
 
 std::string publicName(const std::string& url)

@@ -20,6 +20,7 @@ struct Settings {
     std::vector<std::string> servers; ///< URLs
     std::string subject;
     std::string credentialsFile, caFile, certificateFile, keyFile; ///< empty: none
+    std::string serverName; ///< what certificates of servers have to be for; empty: anything
     std::chrono::milliseconds connectTimeout{};
     std::chrono::milliseconds closeTimeout{};
 
@@ -34,6 +35,8 @@ struct Settings {
     std::uint64_t startIndex = 0;
     std::int64_t startTime = 0; ///< nanoseconds since 1970
     std::size_t window = 0;     ///< messages that are not acknowledged
+
+    bool usesTls() const;
 };
 
 /// Reads the options, but for those of what sends and receives messages.

@@ -47,7 +47,7 @@ Writer::Writer(const Settings& deviceSettings, messages::Sender& deviceSender,
       connection(settings, mailbox)
 {
     if (settings.keeps) {
-        stream.emplace(connection, settings, Clock::now() + settings.connectTimeout);
+        stream.emplace(connection, settings);
         jsOptions options;
         jsOptions_Init(&options);
         options.PublishAsync.AckHandler = onStored;
@@ -354,7 +354,7 @@ natsStatus Writer::hand(MessagePointer& message)
 
 void Writer::sendAgain()
 {
-    while (connected && !again.empty() && again.front().at <= Clock::now()) {
+    while (connected && !again.empty() && again.front().at <= Clock::now() && !mayEnd()) {
         if (hand(again.front().message) != NATS_OK && again.front().message) {
             again.front().at = Clock::now() + retryWait;
             return;
@@ -366,7 +366,7 @@ void Writer::sendAgain()
 /// Waits until the server has taken what was sent.
 void Writer::confirm(std::int64_t milliseconds)
 {
-    const natsStatus status = natsConnection_FlushTimeout(connection.get(), milliseconds);
+    const natsStatus status = connection.flush(milliseconds);
     if (connection.reconnects() != reconnects) {
         dropUnconfirmed();
     } else if (status == NATS_OK) {
