@@ -708,6 +708,10 @@ TEST(NatsAccessTest, WhoIsRefusedAndWhy)
          {file("CaFile", "/ca.pem"), none, none},
          "certificate has expired"},
         {"no CA", good.url, {none, none, none}, "certificate"},
+        {"for another host",
+         good.url,
+         {file("CaFile", "/ca.pem"), {"ServerName", "127.0.0.2"}, none},
+         "mismatch"},
         {"nobody", "nats://127.0.0.1:1", {none, none, none}, "no server answers there"},
         {"the second of two",
          "nats://127.0.0.1:1,nats://secret@127.0.0.1:" + tokens.port,
@@ -777,6 +781,7 @@ TEST(NatsTest, OptionsThatAreOfNoUse)
          "StartTime: must be a time of UTC"},
         {{"Subject", "a"}, {"KeyFile", "/dev/null"}, none, "CertificateFile: is missing"},
         {{"Subject", "a"}, {"CaFile", "/nowhere"}, none, "CaFile: could not read /nowhere"},
+        {{"Subject", "a"}, {"Servers", "tls://a,tls://b"}, none, "ServerName: is required for TLS"},
         {{"Subject", "a"}, {"CloseTimeout", 0}, none, "CloseTimeout: must be 0.001 to 86400"},
         {{"Subject", "a"}, {"Subjects", "b"}, none, "Subjects: is not known"},
     };
