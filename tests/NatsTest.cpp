@@ -751,19 +751,15 @@ TEST(NatsTest, OptionsThatAreOfNoUse)
     } rows[] = {
         {none, none, none, "Subject: is required"},
         {{"Subject", "a..b"}, none, none, "Subject: must be tokens"},
-        {{"Subject", "a b"}, none, none, "Subject: must be tokens"},
         {{"Subject", "a.>.b"}, none, none, "Subject: may have > at its end only"},
         {{"Subject", "a.*"}, writing, none, "Subject: may have wildcards for reading only"},
         {{"Subject", "a"}, {"Mode", "both"}, none, "Mode: must be read or write, not both"},
         {{"Subject", "a"}, {"Servers", "a, ,b"}, none, "Servers: must be URLs"},
-        {{"Subject", "a"}, {"Servers", ""}, none, "Servers: must name a server"},
         {{"Subject", "a"}, {"Stream", "a.b"}, none, "Stream: must be a name"},
         {{"Subject", "a"}, {"Replicas", 3}, none, "Replicas: is of a Stream"},
         {{"Subject", "a"}, {"Window", 3}, none, "Window: is of no use without a Stream"},
-        {{"Subject", "a"}, stream, {"Replicas", 6}, "Replicas: must be a whole number from 1 to 5"},
         {{"Subject", "a"}, stream, {"MaxAge", 0.01}, "MaxAge: must be 0.1 to"},
         {{"Subject", "a"}, writing, {"Durable", "d"}, "Durable: is for reading"},
-        {{"Subject", "a"}, writing, {"Writers", 1}, "Writers: is for reading"},
         {{"Subject", "a"}, read, {"Name", "n"}, "Name: is for writing"},
         {{"Subject", "a"},
          {"Start", "soon"},
@@ -848,14 +844,11 @@ TEST(NatsClusterTest, LeadersAndReadersAreKilledAndNothingIsMissing)
         }
     });
 
-    natsConnection* connection = nullptr;
-    jsCtx* context = nullptr;
-    ASSERT_EQ(natsConnection_ConnectTo(&connection, servers.c_str()), NATS_OK);
-    ASSERT_EQ(natsConnection_JetStream(&context, connection, nullptr), NATS_OK);
+    const Raw raw(servers);
     const auto leader = [&] {
         std::string name;
         jsStreamInfo* info = nullptr;
-        if (js_GetStreamInfo(&info, context, "CLUSTER", nullptr, nullptr) == NATS_OK &&
+        if (js_GetStreamInfo(&info, raw.context, "CLUSTER", nullptr, nullptr) == NATS_OK &&
             info->Cluster->Leader != nullptr) {
             name = info->Cluster->Leader;
         }
@@ -887,13 +880,11 @@ TEST(NatsClusterTest, LeadersAndReadersAreKilledAndNothingIsMissing)
     }
     EXPECT_EQ(writer.close(), 1) << writer.error();
     EXPECT_EQ(writer.error(coderChannelGetLastAsyncError), "|");
-    jsCtx_Destroy(context);
-    natsConnection_Destroy(connection);
 
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(60);
+    const auto end = Clock::now() + std::chrono::seconds(60);
     int status = 0;
     while (waitpid(second.id, &status, WNOHANG) == 0) {
-        ASSERT_LT(std::chrono::steady_clock::now(), end) << countRead();
+        ASSERT_LT(Clock::now(), end) << countRead();
         std::this_thread::sleep_for(std::chrono::milliseconds(10));
     }
     second.id = 0;
