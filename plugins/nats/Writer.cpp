@@ -75,8 +75,10 @@ bool Writer::publish(const Message& message, Label::Turn turn, std::uint64_t cou
     const natsStatus status = natsConnection_Publish(connection.get(), settings.subject.c_str(),
                                                      bytes.data(), static_cast<int>(size));
     if (status != NATS_OK) {
-        connected = false; // until it is told that there is another one
+        // A write that took too long leaves the connection as it is, but drops what was to be sent.
+        connected = natsConnection_Status(connection.get()) == NATS_CONN_STATUS_CONNECTED;
         whyNot = noConnection;
+        dropUnconfirmed();
         return false;
     }
     unconfirmed += counts;
