@@ -183,7 +183,8 @@ void Writing::wait(State state, milliseconds time)
         time = std::min(time, milliseconds(20));
     }
     outstanding.isAwaited = !publishes;
-    link.wait(wakeUp, static_cast<short>(publishes ? ZMQ_POLLIN : isFull ? ZMQ_POLLOUT : 0), time);
+    link.wait(wakeUp, static_cast<short>(publishes ? ZMQ_POLLIN : isFull ? ZMQ_POLLOUT : 0), time,
+              true);
     outstanding.isAwaited = false;
     const std::uint64_t before = sent - outstanding.counts + waiting.value_or(0);
     const std::uint64_t arrivals = link.getArrivals();
