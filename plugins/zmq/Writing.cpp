@@ -183,8 +183,14 @@ void Writing::wait(State state, milliseconds time)
         time = std::min(time, milliseconds(20));
     }
     outstanding.isAwaited = !publishes;
-    link.wait(wakeUp, static_cast<short>(publishes ? ZMQ_POLLIN : isFull ? ZMQ_POLLOUT : 0), time,
-              true);
+    if (!publishes && handedOver != sent && outstanding.messages == 0) {
+        time = milliseconds(0); // it will not be signalled any more
+    }
+    link.wait(wakeUp,
+              static_cast<short>(publishes ? ZMQ_POLLIN
+                                 : isFull  ? ZMQ_POLLOUT
+                                           : 0),
+              time, true);
     outstanding.isAwaited = false;
     const std::uint64_t before = sent - outstanding.counts + waiting.value_or(0);
     const std::uint64_t arrivals = link.getArrivals();
@@ -238,7 +244,8 @@ bool Writing::waitUntilHandedOver()
     return isOver();
 }
 
-/// To each peer, if nothing is before it: then they have their turns. One that is behind gets none.
+/// To each peer, if nothing is before it: then they have their turns. One that is behind gets none; one that
+/// gets two takes the second for nothing.
 void Writing::sendEnd()
 {
     wait(State::Idle, milliseconds(0)); // libzmq is to know who has room again
@@ -254,6 +261,7 @@ void Writing::finish(DeviceStreams& streams)
 {
     undelivered = discardOutput(streams);
     sender.lose(undelivered);
+    sendEnd(); // one who is behind does not keep it from the others
     if (waitUntilHandedOver()) {
         sendEnd();
         waitUntilHandedOver();
@@ -277,9 +285,9 @@ void Writing::tell()
     };
     const std::string& endpoint = link.getEndpoint();
     add(unfit, " counts were not sent to " + endpoint + ": " + why + ".");
-    add(doubtful, " counts, or some of them, were lost with a reader at " + endpoint +
-                      " that went when they were on their way.");
-    add(undelivered, " counts were not sent to " + endpoint + ": nobody took them in time.");
+    add(doubtful, " counts were on their way when a reader at " + endpoint +
+                      " went, and may be lost with it.");
+    add(undelivered, " counts were not sent to " + endpoint + ": they were not taken in time.");
     add(unconfirmed, " bytes of the last packets had not arrived from " + endpoint + " in time.");
     if (text != std::exchange(told, text)) {
         const bool isLoss = doubtful + undelivered + unconfirmed > 0;
