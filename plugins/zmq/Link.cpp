@@ -175,11 +175,17 @@ void Link::wait(WakeUp& wakeUp, short events, milliseconds time, bool isEmpty)
         atMost(*nextConnect);
     }
     std::array<zmq_pollitem_t, 4> items = {
-        zmq_pollitem_t{socket.get(), 0, events, 0}, zmq_pollitem_t{monitor.get(), 0, ZMQ_POLLIN, 0},
         zmq_pollitem_t{nullptr, wakeUp.getHandle(), ZMQ_POLLIN, 0},
-        zmq_pollitem_t{admission ? admission->getSocket() : nullptr, 0, ZMQ_POLLIN, 0}};
-    const int count = admission ? 4 : 3;
-    if (zmq_poll(items.data(), count, time.count()) > 0 && items[2].revents != 0) {
+        zmq_pollitem_t{monitor.get(), 0, ZMQ_POLLIN, 0}};
+    std::size_t count = 2;
+    if (admission) {
+        items.at(count++) = {admission->getSocket(), 0, ZMQ_POLLIN, 0};
+    }
+    if (events != 0) {
+        items.at(count++) = {socket.get(), 0, events, 0};
+    }
+    if (zmq_poll(items.data(), static_cast<int>(count), time.count()) > 0 &&
+        items[0].revents != 0) {
         wakeUp.clear();
     }
 }

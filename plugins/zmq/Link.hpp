@@ -50,7 +50,8 @@ public:
     const std::string& getPublicKey() const { return publicKey; } ///< empty: none
 
     /// Waits for one of the events of libzmq's poll, for something to attend to, or for somebody who wakes
-    /// the device, and no longer than the time. `isEmpty` as for attend().
+    /// the device, and no longer than the time. Without events the socket is left alone: it hears nothing of
+    /// its peers. `isEmpty` as for attend().
     void wait(WakeUp& wakeUp, short events, std::chrono::milliseconds time, bool isEmpty);
 
     /// Looks after the peers. A connection that has ended is made anew only when the socket is empty, as

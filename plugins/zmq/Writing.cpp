@@ -150,6 +150,7 @@ void Writing::make(Frame& frame, const Kind& message, std::uint64_t counts)
 bool Writing::send(Frame& frame)
 {
     void* const socket = link.getSocket();
+    hear();
     if (settings.pattern == Pattern::Publish &&
         zmq_send(socket, settings.topic.data(), settings.topic.size(), ZMQ_DONTWAIT | ZMQ_SNDMORE) <
             0) {
@@ -171,6 +172,13 @@ bool Writing::sendHellos()
     return true;
 }
 
+/// What is on its way to a peer that has gone is dropped when the socket hears of that, and not before: until
+/// then, all that libzmq has released was sent.
+void Writing::hear()
+{
+    hasHeard = hasHeard || outstanding.counts > waiting.value_or(0);
+}
+
 void Writing::wait(State state, milliseconds time)
 {
     if (deadline) {
@@ -182,13 +190,20 @@ void Writing::wait(State state, milliseconds time)
     if (Clock::now() < settled) {
         time = std::min(time, milliseconds(20));
     }
-    outstanding.isAwaited = !publishes;
-    if (!publishes && handedOver != sent && outstanding.messages == 0) {
-        time = milliseconds(0); // it will not be signalled any more
+    const bool isHeard = publishes || isFull || !isSettled();
+    if (hasHeard && !isHeard) {
+        time = milliseconds(0); // to know whether somebody had gone by then
     }
+    const bool wasHeard = std::exchange(hasHeard, false);
+    if (isHeard) {
+        hear();
+    }
+    const bool isQuiet = !wasHeard && !hasHeard;
+    outstanding.isAwaited = !publishes;
     link.wait(wakeUp,
               static_cast<short>(publishes ? ZMQ_POLLIN
                                  : isFull  ? ZMQ_POLLOUT
+                                 : isHeard ? ZMQ_POLLERR
                                            : 0),
               time, true);
     outstanding.isAwaited = false;
@@ -202,10 +217,12 @@ void Writing::wait(State state, milliseconds time)
     }
     if (link.getArrivals() != arrivals) {
         hellos = link.getPeers(); // they go round
+        hear();
     }
-    // When a peer goes, libzmq drops what was on the way to it as if it had been sent.
-    if (link.getDepartures() == departures) {
+    if (isQuiet || link.getDepartures() == departures) {
         handedOver = before;
+    }
+    if (link.getDepartures() == departures) {
         return;
     }
     settled = Clock::now() + milliseconds(100);
