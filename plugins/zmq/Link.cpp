@@ -131,10 +131,8 @@ void Link::setOptions()
     set(to, ZMQ_TCP_KEEPALIVE_IDLE, 10);
     set(to, ZMQ_TCP_KEEPALIVE_INTVL, 5);
     set(to, ZMQ_TCP_KEEPALIVE_CNT, 4);
-    if (settings.maxMessage) {
-        const auto most = static_cast<std::int64_t>(*settings.maxMessage);
-        zmq_setsockopt(to, ZMQ_MAXMSGSIZE, &most, sizeof most);
-    }
+    const auto most = static_cast<std::int64_t>(settings.maxMessage);
+    zmq_setsockopt(to, ZMQ_MAXMSGSIZE, &most, sizeof most);
     if (settings.pattern == Pattern::Subscribe) {
         set(to, ZMQ_SUBSCRIBE, settings.topic);
     } else if (settings.pattern == Pattern::Publish) {
@@ -152,11 +150,7 @@ void Link::setKeys()
         set(socket.get(), ZMQ_CURVE_SERVERKEY, readPublicKey(settings.serverKeyFile));
         return;
     }
-    allowedKeys = readPublicKeys(settings.allowedKeysFile);
-    admission = makeSocket(context.get(), ZMQ_REP);
-    if (zmq_bind(admission.get(), "inproc://zeromq.zap.01") != 0) {
-        fail("Could not look after keys");
-    }
+    admission.emplace(context.get(), settings.allowedKeysFile);
     set(socket.get(), ZMQ_CURVE_SERVER, 1);
     set(socket.get(), ZMQ_ZAP_DOMAIN, std::string("brenix"));
 }
@@ -168,7 +162,7 @@ void Link::connect()
     }
 }
 
-void Link::wait(WakeUp& wakeUp, short events, milliseconds time)
+void Link::wait(WakeUp& wakeUp, short events, milliseconds time, bool isEmpty)
 {
     const auto now = Clock::now();
     const auto atMost = [&](Clock::time_point when) {
@@ -177,15 +171,21 @@ void Link::wait(WakeUp& wakeUp, short events, milliseconds time)
     if (!refusals.isEmpty()) {
         atMost(refusals.getNextTelling());
     }
-    if (nextConnect) {
+    if (nextConnect && isEmpty) {
         atMost(*nextConnect);
     }
     std::array<zmq_pollitem_t, 4> items = {
-        zmq_pollitem_t{socket.get(), 0, events, 0}, zmq_pollitem_t{monitor.get(), 0, ZMQ_POLLIN, 0},
         zmq_pollitem_t{nullptr, wakeUp.getHandle(), ZMQ_POLLIN, 0},
-        zmq_pollitem_t{admission.get(), 0, ZMQ_POLLIN, 0}};
-    const int count = admission ? 4 : 3;
-    if (zmq_poll(items.data(), count, time.count()) > 0 && items[2].revents != 0) {
+        zmq_pollitem_t{monitor.get(), 0, ZMQ_POLLIN, 0}};
+    std::size_t count = 2;
+    if (admission) {
+        items.at(count++) = {admission->getSocket(), 0, ZMQ_POLLIN, 0};
+    }
+    if (events != 0) {
+        items.at(count++) = {socket.get(), 0, events, 0};
+    }
+    if (zmq_poll(items.data(), static_cast<int>(count), time.count()) > 0 &&
+        items[0].revents != 0) {
         wakeUp.clear();
     }
 }
@@ -193,7 +193,7 @@ void Link::wait(WakeUp& wakeUp, short events, milliseconds time)
 void Link::attend(bool isEmpty)
 {
     if (admission) {
-        answerStranger();
+        admission->answer(refusals);
     }
     const std::uint64_t before = arrivals;
     const std::uint64_t peers = getPeers();
@@ -267,7 +267,7 @@ void Link::take(std::uint16_t event, std::uint32_t value)
         }
         break;
     case ZMQ_EVENT_HANDSHAKE_FAILED_NO_DETAIL:
-        hasFailed = true;
+        hasFailed = isStranger = true;
         // One that has just gone away looks the same.
         if (!settings.binds && ++vain > 2) {
             refusals.add(hasKey ? "it has another key than that of " + settings.serverKeyFile +
@@ -276,6 +276,12 @@ void Link::take(std::uint16_t event, std::uint32_t value)
         }
         break;
     case ZMQ_EVENT_DISCONNECTED:
+        if (std::exchange(isStranger, false) && connections[static_cast<int>(value)] &&
+            !handshaking.empty()) { // another was let in
+            connections[handshaking.back()] = true;
+            handshaking.pop_back();
+            connections[static_cast<int>(value)] = false;
+        }
         if (connections[static_cast<int>(value)]) {
             ++departures;
             wasPeer = true;
@@ -307,35 +313,6 @@ std::uint64_t Link::getQueued() const
         all += static_cast<std::uint64_t>(std::max(queued, 0));
     }
     return all;
-}
-
-/// As https://rfc.zeromq.org/spec/27 has it.
-void Link::answerStranger()
-{
-    std::vector<std::string> request;
-    Frame frame;
-    while (frame.receive(admission.get())) {
-        request.push_back(frame.text());
-        if (frame.hasMore()) {
-            continue;
-        }
-        // Version, request, domain, address, routing id, mechanism, key.
-        const bool isKey = request.size() == 7 && request[5] == "CURVE";
-        const std::string key = isKey ? keyText(request[6]) : "";
-        const bool isAllowed = isKey && allowedKeys.contains(key);
-        if (!isAllowed) {
-            refusals.add("the key " + key + " from " + (request.size() > 3 ? request[3] : "") +
-                         " is not in " + settings.allowedKeysFile);
-        }
-        const std::string id = request.size() > 1 ? request[1] : "";
-        const std::array<std::string, 6> reply = {
-            "1.0", id, isAllowed ? "200" : "400", isAllowed ? "OK" : "not allowed", key, ""};
-        for (std::size_t i = 0; i < reply.size(); ++i) {
-            zmq_send(admission.get(), reply.at(i).data(), reply.at(i).size(),
-                     ZMQ_DONTWAIT | (i + 1 < reply.size() ? ZMQ_SNDMORE : 0));
-        }
-        request.clear();
-    }
 }
 
 void Link::close(milliseconds linger)

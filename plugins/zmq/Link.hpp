@@ -2,6 +2,7 @@
 #ifndef BRENIX_PLUGINS_ZMQ_LINK_HPP
 #define BRENIX_PLUGINS_ZMQ_LINK_HPP
 
+#include "Admission.hpp"
 #include "Refusals.hpp"
 #include "WakeUp.hpp"
 #include "Zmq.hpp"
@@ -12,7 +13,6 @@
 #include <cstdint>
 #include <map>
 #include <optional>
-#include <set>
 #include <string>
 #include <vector>
 
@@ -32,10 +32,10 @@ struct Settings {
     bool binds = true;
     std::string topic;
     int highWater = 1000;
-    std::string secretKeyFile;   ///< empty: no keys
-    std::string serverKeyFile;   ///< of a side that goes to the endpoint
-    std::string allowedKeysFile; ///< of a side that binds
-    std::optional<std::size_t> maxMessage;
+    std::string secretKeyFile;                     ///< empty: no keys
+    std::string serverKeyFile;                     ///< of a side that goes to the endpoint
+    std::string allowedKeysFile;                   ///< of a side that binds
+    std::size_t maxMessage = std::size_t{1} << 20; ///< bytes that a peer may send at once
 };
 
 /// Binds or connects, tells who was refused, connects again, and counts the peers.
@@ -50,8 +50,9 @@ public:
     const std::string& getPublicKey() const { return publicKey; } ///< empty: none
 
     /// Waits for one of the events of libzmq's poll, for something to attend to, or for somebody who wakes
-    /// the device, and no longer than the time.
-    void wait(WakeUp& wakeUp, short events, std::chrono::milliseconds time);
+    /// the device, and no longer than the time. Without events the socket is left alone: it hears nothing of
+    /// its peers. `isEmpty` as for attend().
+    void wait(WakeUp& wakeUp, short events, std::chrono::milliseconds time, bool isEmpty);
 
     /// Looks after the peers. A connection that has ended is made anew only when the socket is empty, as
     /// libzmq then drops what has arrived.
@@ -78,7 +79,6 @@ private:
     void setOptions();
     void setKeys();
     void take(std::uint16_t event, std::uint32_t value);
-    void answerStranger();
     void connect();
     void connectAgain();
 
@@ -86,11 +86,10 @@ private:
 
     const Settings settings;
     brenixcore::plugin::DeviceHost& host;
-    OwnedContext context;  // is to end last
-    OwnedSocket admission; ///< where libzmq asks whether a key is allowed
+    OwnedContext context; // is to end last
+    std::optional<Admission> admission;
     OwnedSocket socket;
     OwnedSocket monitor;
-    std::set<std::string> allowedKeys;
     std::string publicKey;
     std::string endpoint;
 
@@ -99,6 +98,7 @@ private:
     std::map<int, bool> connections; ///< of the system, and whether they were let in
     std::vector<int> handshaking;    ///< those of which it is not known yet
     bool hasFailed = false;          ///< it was told why
+    bool isStranger = false;         ///< whose connection ends next: libzmq says the two at once
     std::uint64_t vain = 0;          ///< attempts to connect, one after the other
 
     Refusals refusals;

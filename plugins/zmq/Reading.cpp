@@ -21,7 +21,7 @@ void Reading::run(DeviceStreams& streams)
         }
         const bool isDone = !waiting && receiver.isDone();
         link.wait(wakeUp, isIdle ? ZMQ_POLLIN : 0,
-                  milliseconds(!isDone && (isIdle || waiting) ? 10000 : 0));
+                  milliseconds(!isDone && (isIdle || waiting) ? 10000 : 0), isIdle);
         link.attend(isIdle);
     }
     finish(streams);

@@ -150,6 +150,7 @@ void Writing::make(Frame& frame, const Kind& message, std::uint64_t counts)
 bool Writing::send(Frame& frame)
 {
     void* const socket = link.getSocket();
+    hear();
     if (settings.pattern == Pattern::Publish &&
         zmq_send(socket, settings.topic.data(), settings.topic.size(), ZMQ_DONTWAIT | ZMQ_SNDMORE) <
             0) {
@@ -171,6 +172,13 @@ bool Writing::sendHellos()
     return true;
 }
 
+/// What is on its way to a peer that has gone is dropped when the socket hears of that, and not before: until
+/// then, all that libzmq has released was sent.
+void Writing::hear()
+{
+    hasHeard = hasHeard || outstanding.counts > waiting.value_or(0);
+}
+
 void Writing::wait(State state, milliseconds time)
 {
     if (deadline) {
@@ -182,8 +190,22 @@ void Writing::wait(State state, milliseconds time)
     if (Clock::now() < settled) {
         time = std::min(time, milliseconds(20));
     }
+    const bool isHeard = publishes || isFull || !isSettled();
+    if (hasHeard && !isHeard) {
+        time = milliseconds(0); // to know whether somebody had gone by then
+    }
+    const bool wasHeard = std::exchange(hasHeard, false);
+    if (isHeard) {
+        hear();
+    }
+    const bool isQuiet = !wasHeard && !hasHeard;
     outstanding.isAwaited = !publishes;
-    link.wait(wakeUp, static_cast<short>(publishes ? ZMQ_POLLIN : isFull ? ZMQ_POLLOUT : 0), time);
+    link.wait(wakeUp,
+              static_cast<short>(publishes ? ZMQ_POLLIN
+                                 : isFull  ? ZMQ_POLLOUT
+                                 : isHeard ? ZMQ_POLLERR
+                                           : 0),
+              time, true);
     outstanding.isAwaited = false;
     const std::uint64_t before = sent - outstanding.counts + waiting.value_or(0);
     const std::uint64_t arrivals = link.getArrivals();
@@ -195,10 +217,12 @@ void Writing::wait(State state, milliseconds time)
     }
     if (link.getArrivals() != arrivals) {
         hellos = link.getPeers(); // they go round
+        hear();
     }
-    // When a peer goes, libzmq drops what was on the way to it as if it had been sent.
-    if (link.getDepartures() == departures) {
+    if (isQuiet || link.getDepartures() == departures) {
         handedOver = before;
+    }
+    if (link.getDepartures() == departures) {
         return;
     }
     settled = Clock::now() + milliseconds(100);
@@ -237,7 +261,8 @@ bool Writing::waitUntilHandedOver()
     return isOver();
 }
 
-/// To each peer, if nothing is before it: then they have their turns. One that is behind gets none.
+/// To each peer, if nothing is before it: then they have their turns. One that is behind gets none; one that
+/// gets two takes the second for nothing.
 void Writing::sendEnd()
 {
     wait(State::Idle, milliseconds(0)); // libzmq is to know who has room again
@@ -253,6 +278,7 @@ void Writing::finish(DeviceStreams& streams)
 {
     undelivered = discardOutput(streams);
     sender.lose(undelivered);
+    sendEnd(); // one who is behind does not keep it from the others
     if (waitUntilHandedOver()) {
         sendEnd();
         waitUntilHandedOver();
@@ -276,9 +302,9 @@ void Writing::tell()
     };
     const std::string& endpoint = link.getEndpoint();
     add(unfit, " counts were not sent to " + endpoint + ": " + why + ".");
-    add(doubtful, " counts, or some of them, were lost with a reader at " + endpoint +
-                      " that went when they were on their way.");
-    add(undelivered, " counts were not sent to " + endpoint + ": nobody took them in time.");
+    add(doubtful, " counts were on their way when a reader at " + endpoint +
+                      " went, and may be lost with it.");
+    add(undelivered, " counts were not sent to " + endpoint + ": they were not taken in time.");
     add(unconfirmed, " bytes of the last packets had not arrived from " + endpoint + " in time.");
     if (text != std::exchange(told, text)) {
         const bool isLoss = doubtful + undelivered + unconfirmed > 0;

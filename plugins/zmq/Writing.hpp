@@ -48,6 +48,7 @@ private:
     void make(Frame& frame, const Kind& message, std::uint64_t counts);
     bool send(Frame& frame);
     bool sendHellos();
+    void hear();
     void wait(State state, std::chrono::milliseconds time);
     void takeSubscriptions();
     bool waitUntilHandedOver();
@@ -74,7 +75,8 @@ private:
     Frame outgoing;
     std::optional<std::uint64_t> waiting; ///< counts of `outgoing`, if it is not sent
     std::uint64_t sent = 0;               ///< counts that libzmq took
-    std::uint64_t handedOver = 0; ///< of them, when nobody had gone who could have got others
+    std::uint64_t handedOver = 0;         ///< of them, when nothing had been dropped yet
+    bool hasHeard = false;                ///< the socket may have dropped something of it since
     std::optional<Clock::time_point> deadline; ///< once the channel closes
 
     // Counts, all of one run: an error takes the place of one that nobody has read.
