@@ -190,6 +190,13 @@ void Link::wait(WakeUp& wakeUp, short events, milliseconds time, bool isEmpty)
     }
 }
 
+void Link::hear()
+{
+    int ready = 0;
+    std::size_t size = sizeof ready;
+    zmq_getsockopt(socket.get(), ZMQ_EVENTS, &ready, &size);
+}
+
 void Link::attend(bool isEmpty)
 {
     if (admission) {
@@ -203,9 +210,7 @@ void Link::attend(bool isEmpty)
             brenixcore::plugin::makeScalar("Peers", static_cast<unsigned int>(getPeers())));
     }
     if (arrivals != before) { // the socket is to know of them, too
-        int ready = 0;
-        std::size_t size = sizeof ready;
-        zmq_getsockopt(socket.get(), ZMQ_EVENTS, &ready, &size);
+        hear();
     }
     const auto now = Clock::now();
     if (nextConnect && now >= *nextConnect && isEmpty) {

@@ -54,6 +54,9 @@ public:
     /// its peers. `isEmpty` as for attend().
     void wait(WakeUp& wakeUp, short events, std::chrono::milliseconds time, bool isEmpty);
 
+    /// Lets the socket hear of its peers: who has gone, and who has room again.
+    void hear();
+
     /// Looks after the peers. A connection that has ended is made anew only when the socket is empty, as
     /// libzmq then drops what has arrived.
     void attend(bool isEmpty);

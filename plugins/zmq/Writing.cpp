@@ -265,7 +265,9 @@ bool Writing::waitUntilHandedOver()
 /// gets two takes the second for nothing.
 void Writing::sendEnd()
 {
-    wait(State::Idle, milliseconds(0)); // libzmq is to know who has room again
+    wait(State::Idle, milliseconds(0));
+    hear();
+    link.hear(); // who has room again
     const std::uint64_t times = settings.pattern == Pattern::Publish ? 1 : link.getPeers();
     for (std::uint64_t i = 0; i < times; ++i) {
         Frame frame;
