@@ -527,7 +527,7 @@ TEST(NatsStreamTest, WhatIsNotReadComesAgain)
             ASSERT_EQ(second.init({{"Servers", shared->server->url},
                                    {"Subject", "again"},
                                    {"Durable", "reader"},
-                                   {"ConnectTimeout", 0.3}}),
+                                   {"ConnectTimeout", 2}}),
                       1);
             EXPECT_EQ(second.open(), 0);
             EXPECT_NE(

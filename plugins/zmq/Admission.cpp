@@ -4,13 +4,15 @@
 
 #include <array>
 #include <cstddef>
+#include <utility>
 #include <vector>
 
 namespace zeromq
 {
 
-Admission::Admission(void* context, const std::string& allowedKeysFile)
-    : file(allowedKeysFile), allowedKeys(readPublicKeys(file)), socket(makeSocket(context, ZMQ_REP))
+Admission::Admission(void* context, std::string allowedKeysFile)
+    : file(std::move(allowedKeysFile)), allowedKeys(readPublicKeys(file)),
+      socket(makeSocket(context, ZMQ_REP))
 {
     if (zmq_bind(socket.get(), "inproc://zeromq.zap.01") != 0) {
         fail("Could not look after keys");

@@ -16,7 +16,7 @@ class Admission
 {
 public:
     /// Reads the keys that are allowed. Throws when they are not as they should be.
-    Admission(void* context, const std::string& allowedKeysFile);
+    Admission(void* context, std::string allowedKeysFile);
 
     void* getSocket() const { return socket.get(); }
 
