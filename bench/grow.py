@@ -4,7 +4,7 @@
     bench/grow.py BRENIX [RESULT]
 
 Writers publish blocks of 4 KiB to subjects of their own, and each reader reads them all. Prints what was measured as
-a table, what one message costs by the model that docs/distributed.md explains, which is fitted to three of the points,
+a table, what one message costs by the model that docs/distributed.md explains, which is fitted to five of the points,
 and how far the model is off at the others. Exits with 1 where that is more than 20 %."""
 
 import itertools
@@ -20,7 +20,7 @@ import time
 import urllib.request
 
 NUMBERS = [1, 2, 4, 8]
-FITTED = [(1, 1), (1, 8), (8, 1)]  # writers, readers
+FITTED = [(1, 1), (1, 8), (4, 4), (8, 1), (8, 8)]  # writers, readers
 MESSAGES = 16384                   # of all writers together
 BYTES = 4096
 ROUNDS = 5
@@ -128,10 +128,9 @@ class Model:
     """Processor time of a message: of its writer, of the server once and for each reader, and of each reader."""
 
     def __init__(self, points):
-        few, many = points[1, 1], points[1, 8]
         self.write = statistics.mean(points[point][1] for point in FITTED)
-        self.each = (many[2] - few[2]) / 7
-        self.once = statistics.mean([few[2], points[8, 1][2]]) - self.each
+        self.each, self.once = statistics.linear_regression(
+            [point[1] for point in FITTED], [points[point][2] for point in FITTED])
         self.read = statistics.mean(points[point][3] / point[1] for point in FITTED)
 
     def seconds(self, _, readers):
