@@ -82,6 +82,7 @@ struct OpenFile::Callbacks {
     {
         const auto* const file =
             static_cast<std::shared_ptr<OpenFile>* const*>(H5Pget_driver_info(access));
+        // cppcheck-suppress legacyUninitvar ; what is set here
         auto* const callbacks = new (std::nothrow) Callbacks{};
         if (callbacks == nullptr) {
             return nullptr;

@@ -12,7 +12,6 @@ namespace natsio
 {
 
 using namespace brenixcore::plugin;
-using namespace std::chrono_literals;
 
 namespace
 {
@@ -62,7 +61,8 @@ Reader::Reader(const Settings& deviceSettings, messages::Receiver& deviceReceive
         connection.subscribe(settings.subject);
         using std::chrono::milliseconds;
         const auto left = std::chrono::duration_cast<milliseconds>(connection.until - Clock::now());
-        const natsStatus status = connection.flush(std::max(left, 1ms).count());
+        const natsStatus status =
+            connection.flush(std::max(left, std::chrono::milliseconds(1)).count());
         if (status != NATS_OK) { // or else all arrives from here on
             throw std::runtime_error("Could not subscribe to " + settings.subject + ": " +
                                      reasonOf(status));
@@ -277,9 +277,9 @@ void Reader::touch()
 std::chrono::milliseconds Reader::askPause() const
 {
     if (!order.isBeginning()) {
-        return goneAnswers > 0 ? 500ms : 30000ms;
+        return std::chrono::milliseconds(goneAnswers > 0 ? 500 : 30000);
     }
-    return openWhenAsked > 0 ? 200ms : last != lastWhenAsked ? 5ms : 100ms;
+    return std::chrono::milliseconds(openWhenAsked > 0 ? 200 : last != lastWhenAsked ? 5 : 100);
 }
 
 /// Whether the place is there, and what was delivered to it.
@@ -316,11 +316,12 @@ void Reader::handBack()
         if (Clock::now() >= until) {
             break;
         }
-        if (connected && !confirmed && Clock::now() >= askTime + 500ms) {
+        if (connected && !confirmed && Clock::now() - askTime >= std::chrono::milliseconds(500)) {
             askTime = Clock::now();
             connection.ask(lastReply, ack, "acknowledged"); // once more, for an answer
         }
-        for (Event& event : mailbox->take(std::min(until, Clock::now() + 200ms))) {
+        for (Event& event :
+             mailbox->take(std::min(until, Clock::now() + std::chrono::milliseconds(200)))) {
             if (event.kind != Event::Kind::Message) {
                 handle(event);
             }
@@ -336,7 +337,7 @@ Moment Reader::nextTime() const
 {
     const auto now = Clock::now();
     if (!stream) {
-        return now + 24h;
+        return now + std::chrono::hours(24);
     }
     const Moment touching = touchTime + touchPause;
     return order.isBeginning() ? std::min(touching, askTime + askPause()) : touching;

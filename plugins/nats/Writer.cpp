@@ -10,7 +10,6 @@ namespace natsio
 {
 
 using namespace brenixcore::plugin;
-using namespace std::chrono_literals;
 
 namespace
 {
@@ -19,9 +18,10 @@ constexpr std::size_t headerRoom = 512;            // bytes that headers take, a
 constexpr std::size_t mostUnconfirmed = 4U << 20U; // bytes, without a stream
 constexpr std::size_t mostUnstored = 64U << 20U;   // bytes, with one
 constexpr std::int64_t storeWait = 3000;           // ms, after which a message is sent again
-constexpr auto idleTime = 20ms; // after which the server is asked whether it has all
+constexpr std::chrono::milliseconds
+    idleTime(20); // after which the server is asked whether it has all
 constexpr const char* noConnection = "there is no connection with a server";
-constexpr auto retryWait = 200ms; // before one is sent again that was refused
+constexpr std::chrono::milliseconds retryWait(200); // before one is sent again that was refused
 
 void onStored(jsCtx* /*js*/, natsMsg* message, jsPubAck* /*stored*/, jsPubAckErr* error,
               void* number)
@@ -189,7 +189,7 @@ void Writer::handleState(const natsMsg* answer)
 void Writer::askForStream()
 {
     if (Clock::now() >= askTime) {
-        askTime = Clock::now() + 500ms;
+        askTime = Clock::now() + std::chrono::milliseconds(500);
         connection.ask("$JS.API.STREAM.INFO." + stream->name, "", "state");
     }
 }
@@ -297,7 +297,7 @@ void Writer::sayHello()
     const auto now = Clock::now();
     const bool isFirst = helloTime == Moment();
     const bool isNew = hello.seq != helloSeq;
-    const auto pause = !stream ? 2s : unstored.empty() ? 5s : 10s;
+    const std::chrono::seconds pause(!stream ? 2 : unstored.empty() ? 5 : 10);
     const bool isDue = isFirst || (now - helloTime >= pause && (isNew || !stream));
     if (isDue && !ended && publish(hello, {hello.seq, Rank::Hello}, 0)) {
         helloTime = now;
@@ -398,7 +398,7 @@ void Writer::dropUnconfirmed()
 Moment Writer::nextTime() const
 {
     const auto now = Clock::now();
-    Moment time = now + 2s;
+    Moment time = now + std::chrono::seconds(2);
     if (!stream && unconfirmed > 0 && connected) {
         time = std::max(now, lastSent + idleTime);
     }
