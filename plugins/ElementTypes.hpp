@@ -97,14 +97,21 @@ std::size_t readChoice(Options& options, const std::string& name,
     return static_cast<std::size_t>(found - choices.begin());
 }
 
+/// The type of a name; null where there is none.
+constexpr const ElementType* findType(std::string_view name)
+{
+    const auto* const found =
+        std::find_if(elementTypes.begin(), elementTypes.end(),
+                     [&](const ElementType& candidate) { return candidate.name == name; });
+    return found == elementTypes.end() ? nullptr : found;
+}
+
 /// The element type of an option that names one, or else of the default.
 inline const ElementType& readElementType(Options& options, const std::string& defaultName)
 {
     const std::string name = options.text("ElementType").value_or(defaultName);
-    const auto* const found =
-        std::find_if(elementTypes.begin(), elementTypes.end(),
-                     [&](const ElementType& candidate) { return candidate.name == name; });
-    if (found == elementTypes.end()) {
+    const auto* const found = findType(name);
+    if (found == nullptr) {
         Options::fail("ElementType", "is not a numeric type: " + name);
     }
     return *found;

@@ -1,0 +1,108 @@
+// A sound card that is used without waiting for it.
+#ifndef BRENIX_PLUGINS_ALSA_CARD_HPP
+#define BRENIX_PLUGINS_ALSA_CARD_HPP
+
+#include "Open.hpp"
+
+#include <alsa/asoundlib.h>
+#include <poll.h>
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace alsa
+{
+
+/// How long a card, or the sound server behind it, may take for what it should do at once.
+constexpr std::chrono::seconds patience{3};
+
+/// A card at one time.
+struct Moment {
+    snd_pcm_state_t state = SND_PCM_STATE_OPEN;
+    snd_pcm_sframes_t avail = 0; ///< frames that can be read or written
+    snd_pcm_sframes_t delay = 0; ///< frames between the program and the converter
+    std::int64_t time = 0;       ///< as of steadyTime()
+
+    /// Whether it has stopped by itself: its buffer has run over or dry, or the system has slept.
+    bool hasStopped() const
+    {
+        return state != SND_PCM_STATE_RUNNING && state != SND_PCM_STATE_PREPARED;
+    }
+};
+
+/// Nanoseconds, by the clock that cards go by.
+std::int64_t steadyTime();
+
+/// Its operations throw a std::runtime_error that names the card when it fails.
+class Card
+{
+public:
+    /// Opens it.
+    explicit Card(const Settings& settings);
+    Card(const Card&) = delete;
+    Card& operator=(const Card&) = delete;
+    /// Closes it; what is not played is dropped.
+    ~Card();
+
+    unsigned int rate() const { return opened.rate; }
+    snd_pcm_sframes_t bufferSize() const { return snd_pcm_sframes_t(opened.bufferSize); }
+    snd_pcm_sframes_t periodSize() const { return snd_pcm_sframes_t(opened.periodSize); }
+
+    /// Whether frames come and go by a clock. There are always some where not.
+    bool hasClock() const { return clocked; }
+
+    /// Whether frames that wait to be read may be overwritten at any time.
+    bool overwrites() const { return clocked && !isPlugin(); }
+
+    /// Whether each look should be followed by reading all: PulseAudio's client waits for ever when its server
+    /// ends while a piece is read in part.
+    bool isToBeEmptied() const { return clocked && isPlugin(); }
+
+    std::int64_t framesIn(std::int64_t nanoseconds) const;
+    std::int64_t timeOf(std::int64_t frames) const;
+
+    Moment look();
+
+    void start();
+    /// After it has stopped.
+    void prepare();
+
+    /// Move frames; how many, which are none where the card has stopped.
+    snd_pcm_sframes_t read(void* frames, snd_pcm_sframes_t count);
+    snd_pcm_sframes_t write(const void* frames, snd_pcm_sframes_t count);
+    /// Passes over frames.
+    snd_pcm_sframes_t skip(snd_pcm_sframes_t count);
+
+    /// Waits for the event, for the card where that is asked for, and for some milliseconds: -1 is for ever.
+    /// Returns whether the card says that it is ready.
+    bool wait(int event, bool forCard, int milliseconds);
+
+    /// Frames that it has got and not played.
+    snd_pcm_sframes_t left();
+
+    /// Waits until all is played, with an event that it may use up, as long as that should take and the patience. Returns how many frames were
+    /// not.
+    snd_pcm_sframes_t drain(int event);
+
+private:
+    bool isPlugin() const;
+    int within(std::chrono::nanoseconds limit, std::function<int()> call);
+    snd_pcm_sframes_t require(snd_pcm_sframes_t result) const;
+    snd_pcm_sframes_t moved(snd_pcm_sframes_t result) const;
+
+    const std::string name;
+    Opened opened;
+    bool clocked = true;
+    bool hangs = false; ///< in a call
+    std::vector<pollfd> descriptors;
+    std::unique_ptr<snd_pcm_status_t, decltype(&::snd_pcm_status_free)> status{
+        nullptr, &::snd_pcm_status_free};
+};
+
+} // namespace alsa
+
+#endif
