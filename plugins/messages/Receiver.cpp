@@ -123,7 +123,7 @@ std::optional<Packet> Receiver::take(Data&& data, DeviceStreams& streams)
     if (lost > 0) {
         streams.tellLost(lost, reason.c_str());
     }
-    return std::optional<Packet>(std::move(packet));
+    return {std::move(packet)};
 }
 
 void Receiver::take(const End& end, DeviceStreams& streams)
