@@ -1,9 +1,9 @@
 // Device `hdf5`: records the output stream in an HDF5 file, or replays a recording into the input stream. When
 // reading, a count is a row of the dataset: an element of each channel, in the field "data".
 
+#include "hdf5/Description.hpp"
+#include "hdf5/Playback.hpp"
 #include "hdf5/Recorder.hpp"
-#include "hdf5/Replay.hpp"
-#include "hdf5/Timeline.hpp"
 
 #include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Make.hpp"
@@ -110,6 +110,8 @@ public:
         if (writes) {
             recorder.emplace(fileName, format, notes);
             gap.reset();
+            gaps = 0;
+            host->updateProperty(makeScalar("Gaps", static_cast<unsigned long>(gaps)));
             isRecording = true;
         } else {
             replay.emplace(fileName, format.dataset);
@@ -120,7 +122,11 @@ public:
     {
         const Quiet quiet;
         if (!writes) {
-            play(streams);
+            const Wait wait = [&](steady_clock::time_point due) {
+                std::unique_lock lock(mutex);
+                changed.wait_until(lock, due, [&] { return streams.isClosing(); });
+            };
+            play(*replay, notes, {first, blockSize}, isPaced ? wait : Wait(), streams);
             return;
         }
         struct End { // whatever happens, nobody waits for a gap to be noted
@@ -295,55 +301,6 @@ private:
         changed.notify_all();
     }
 
-    void play(DeviceStreams& streams)
-    {
-        Timeline times(notes);
-        std::uint64_t lost = 0;
-        auto next = replay->gaps().begin();
-        const auto pass = [&] {
-            times.pass(*next);
-            lost += next->lost;
-            return (next++)->lost;
-        };
-        while (next != replay->gaps().end() && next->index < first) {
-            pass();
-        }
-        const auto began = steady_clock::now();
-        std::optional<std::chrono::nanoseconds> before; // of the first packet
-        for (std::uint64_t index = first;;) {
-            while (next != replay->gaps().end() &&
-                   (next->index <= index || index == replay->counts())) {
-                if (const std::uint64_t counts = pass(); counts > 0) {
-                    streams.tellLost(counts, "the recording has a gap");
-                }
-            }
-            if (index == replay->counts()) {
-                return;
-            }
-            std::uint64_t end = std::min(replay->counts(), index + blockSize);
-            if (next != replay->gaps().end()) {
-                end = std::min(end, next->index);
-            }
-            Packet packet;
-            packet.counts = end - index;
-            packet.time = times.time(index);
-            packet.index = index + lost;
-            auto elements = format.type->make(packet.counts * format.channels);
-            replay->read(index, packet.counts, format.type->find(elements.get())->data());
-            setField(packet, std::move(elements));
-            if (isPaced) {
-                before = before.value_or(times.elapsed(index));
-                std::unique_lock lock(mutex);
-                changed.wait_until(lock, began + times.elapsed(end) - *before,
-                                   [&] { return streams.isClosing(); });
-            }
-            if (!streams.push(std::move(packet))) {
-                return;
-            }
-            index = end;
-        }
-    }
-
     DeviceHost* host = nullptr;
     std::string fileName;
     bool writes = false;
@@ -364,64 +321,6 @@ private:
     bool isRecording = false;
     std::optional<Gap> gap; ///< to be noted
     std::string gapProblem; ///< why it was not
-};
-
-constexpr OptionInfo optionTable[] = {
-    {"FileName", "text", "", "(required)", ""},
-    {"Mode", "text", "", "read", "read replays a recording; write makes one"},
-    {"Dataset", "text", "", "data", "in the file; a path such as run1/force makes groups"},
-    {"SampleRate", "number", "Hz", "0",
-     "counts a second; 0: writing, not known; reading, what the file tells"},
-    {"BlockSize", "whole number", "counts", "1024", "reading: of the largest packet"},
-    {"First", "whole number", "counts", "0", "reading: row of the dataset to start at"},
-    {"Pace", "text", "", "fast",
-     "reading: fast as soon as there is room; realtime as it was recorded"},
-    {"ElementType", "text", "", "double",
-     "writing: double, float, int8 to int64 or uint8 to uint64"},
-    {"Channels", "whole number", "", "1", "writing: elements of a count, up to 65536"},
-    {"Compression", "whole number", "", "0", "writing: 0 for none, to 9 for the slowest"},
-    {"Unit", "text", "", "none", "writing: of the elements"},
-    {"Start", "whole number", "ns", "0",
-     "writing: time of the first count, since 1970 (UTC); 0: when it is taken"},
-    {"Names", "text", "", "none", "writing: of the channels, with commas between them"},
-    {"Origin", "text", "", "none", "writing: the device that the counts are from, and its options"},
-    {"Attributes", "text", "", "none", "writing: further ones, such as operator=Ann,site=lab 3"},
-    {},
-};
-
-constexpr OptionInfo gapOptions[] = {
-    {"Counts", "whole number", "counts", "(required)", "that are missing; 0: not known"},
-    {"Time", "whole number", "ns", "now", "of the count behind the gap, since 1970 (UTC)"},
-    {},
-};
-
-constexpr CommandInfo commandTable[] = {
-    {"gap", gapOptions, "writing: counts are missing behind those that were written"},
-    {},
-};
-
-constexpr FieldInfo inputFields[] = {
-    {dataField, "", "", "an element of each channel for each count, of the type in the file"},
-    {},
-};
-
-constexpr FieldInfo outputFields[] = {
-    {dataField, "(ElementType)", "", "the same; a buffer need not end with a count"},
-    {},
-};
-
-constexpr PropertyInfo propertyTable[] = {
-    {"SampleRate", "double", "Hz", "0: not known"},
-    {"Channels", "uint32", "", ""},
-    {"ElementType", "char", "", ""},
-    {"Frames", "int64", "counts", "reading: of the file at init; writing: in the file so far"},
-    {"Gaps", "uint64", "", "the same of gaps"},
-    {"Unit", "char", "", ""},
-    {"Start", "int64", "ns", "time of the first count, since 1970 (UTC); 0: not known"},
-    {"Names", "char", "", "of the channels"},
-    {"Origin", "char", "", ""},
-    {"Attributes", "char", "", "further ones that are texts"},
-    {},
 };
 
 } // namespace

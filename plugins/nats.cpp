@@ -147,14 +147,9 @@ constexpr PropertyInfo propertyTable[] = {
     {},
 };
 
-constexpr FieldInfo fieldTable[] = {
-    {dataField, "", "", "and what else was written, of its type; the text Source tells the writer"},
-    {},
-};
-
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Nats)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
-BRENIXCORE_DESCRIBE_FIELDS(fieldTable, fieldTable)
+BRENIXCORE_DESCRIBE_FIELDS(messages::messageFields, messages::messageFields)

@@ -1,5 +1,6 @@
 // Device `zmq`: packets to and from other machines over ZeroMQ.
 
+#include "zmq/Endpoint.hpp"
 #include "zmq/Keys.hpp"
 #include "zmq/Reading.hpp"
 #include "zmq/Writing.hpp"
@@ -43,30 +44,6 @@ Pattern readPattern(Options& options)
         Options::fail("Pattern", "must be push, pull, publish or subscribe, not " + *name);
     }
     return static_cast<Pattern>(found - patternNames.begin());
-}
-
-/// libzmq takes any number as a port, and uses what is left of it in 16 bits.
-void checkEndpoint(const Settings& settings)
-{
-    const std::string& endpoint = settings.endpoint;
-    if (endpoint.empty()) {
-        Options::fail("Endpoint", "is required, such as tcp://127.0.0.1:5000");
-    }
-    if (endpoint.rfind("ipc://", 0) == 0) {
-        return;
-    }
-    if (endpoint.rfind("tcp://", 0) != 0) {
-        Options::fail("Endpoint", "must be tcp://... or ipc://..., not " + endpoint);
-    }
-    const std::string port = endpoint.substr(endpoint.rfind(':') + 1);
-    const bool isNumber = !port.empty() && port.size() <= 5 &&
-                          port.find_first_not_of("0123456789") == std::string::npos;
-    const int number = isNumber ? std::stoi(port) : 0;
-    if ((number < 1 || number > 65535) && !(settings.binds && port == "*")) {
-        Options::fail("Endpoint", "must end with a port from 1 to 65535" +
-                                      std::string(settings.binds ? ", or *" : "") + ", not as " +
-                                      endpoint);
-    }
 }
 
 /// Refuses options that mean nothing here.
@@ -134,7 +111,7 @@ public:
         settings.endpoint = options.text("Endpoint").value_or("");
         settings.pattern = readPattern(options);
         settings.binds = options.logical("Bind").value_or(writes(settings.pattern));
-        checkEndpoint(settings);
+        checkEndpoint(settings.endpoint, settings.binds);
         refuseOthers(optionMap, settings.pattern);
         settings.topic = options.text("Topic").value_or("");
         settings.highWater =
@@ -272,15 +249,10 @@ constexpr CommandInfo commandTable[] = {
     {},
 };
 
-constexpr FieldInfo fieldTable[] = {
-    {dataField, "", "", "and what else was written, of its type; the text Source tells the writer"},
-    {},
-};
-
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Zmq)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
-BRENIXCORE_DESCRIBE_FIELDS(fieldTable, fieldTable)
+BRENIXCORE_DESCRIBE_FIELDS(messages::messageFields, messages::messageFields)
 BRENIXCORE_DESCRIBE_COMMANDS(commandTable)

@@ -27,7 +27,7 @@ namespace
 constexpr std::size_t npos = std::string::npos;
 const std::string anyPort = "tcp://127.0.0.1:*";
 const std::string folder = testing::TempDir() + "zmq-" + std::to_string(getpid()) + "/";
-// Of a reader of push, as https://rfc.zeromq.org/spec/23 has it.
+// Of a reader of push, by ZMTP 3.0, the protocol of ZeroMQ.
 const std::string handshake = "\xFF"s + std::string(8, '\0') + "\x7F\x03"s + "\0NULL"s +
                               std::string(48, '\0') +
                               "\x04\x1A\x05READY\x0BSocket-Type\0\0\0\x04PULL"s;

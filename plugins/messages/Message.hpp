@@ -2,6 +2,7 @@
 #ifndef BRENIX_PLUGINS_MESSAGES_MESSAGE_HPP
 #define BRENIX_PLUGINS_MESSAGES_MESSAGE_HPP
 
+#include "brenixcore/plugin/Describe.hpp"
 #include "brenixcore/plugin/Packet.hpp"
 
 #include <cstddef>
@@ -53,6 +54,13 @@ struct End {
 };
 
 using Message = std::variant<Hello, Data, End>;
+
+/// What is read and written with the devices.
+constexpr brenixcore::plugin::FieldInfo messageFields[] = {
+    {brenixcore::plugin::dataField, "", "",
+     "and what else was written, of its type; the text Source tells the writer"},
+    {},
+};
 
 /// What no message holds, or what one should not hold. The text says what and where.
 class Malformed : public std::runtime_error

@@ -42,6 +42,10 @@ private:
         Moment at;
     };
 
+    static constexpr const char* noConnection = "there is no connection with a server";
+
+    void openStream();
+
     // What the library tells:
     void handle(Event& event);
     void handleStored(Event& event);

@@ -11,7 +11,7 @@
 namespace zeromq
 {
 
-/// Answers what libzmq asks when somebody comes: https://rfc.zeromq.org/spec/27 has how.
+/// Answers what libzmq asks when somebody comes, by ZAP, the ZeroMQ Authentication Protocol.
 class Admission
 {
 public:

@@ -1,12 +1,12 @@
 #include "Link.hpp"
 
+#include "Endpoint.hpp"
 #include "Keys.hpp"
 
 #include "brenixcore/plugin/Make.hpp"
 
 #include <sys/ioctl.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -26,30 +26,10 @@ namespace
 
 using std::chrono::milliseconds;
 
-constexpr std::string_view ipcPrefix = "ipc://";
-
 int typeOf(Pattern pattern)
 {
     constexpr std::array types = {ZMQ_PUSH, ZMQ_PULL, ZMQ_XPUB, ZMQ_SUB};
     return types.at(static_cast<std::size_t>(pattern));
-}
-
-/// Whether somebody listens at the file of an ipc endpoint: libzmq would take it away from him.
-bool isTaken(const std::string& endpoint)
-{
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    const std::string path = endpoint.substr(ipcPrefix.size());
-    if (path.size() >= sizeof address.sun_path) {
-        return false; // libzmq refuses it
-    }
-    std::copy(path.begin(), path.end(), address.sun_path);
-    const int handle = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-    const int result =
-        ::connect(handle, reinterpret_cast<const sockaddr*>(&address), sizeof address);
-    const bool taken = result == 0 || errno == EAGAIN; // so many wait for him
-    ::close(handle);
-    return taken;
 }
 
 } // namespace
@@ -77,7 +57,7 @@ Link::Link(Settings linkSettings, brenixcore::plugin::DeviceHost& deviceHost)
         connect();
         return;
     }
-    if (endpoint.rfind(ipcPrefix, 0) == 0 && isTaken(endpoint)) {
+    if (isTaken(endpoint)) {
         throw std::runtime_error("Could not bind " + endpoint + ": Address already in use");
     }
     if (zmq_bind(socket.get(), endpoint.c_str()) != 0) {

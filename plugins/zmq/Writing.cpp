@@ -2,7 +2,9 @@
 
 #include <algorithm>
 #include <cstdlib>
+#include <memory>
 #include <new>
+#include <tuple>
 #include <utility>
 
 namespace zeromq
@@ -129,13 +131,17 @@ template <typename Kind>
 void Writing::make(Frame& frame, const Kind& message, std::uint64_t counts)
 {
     const std::size_t size = messages::sizeOf(message);
-    void* const memory = std::malloc(sizeof(Head) + size); // NOLINT(cppcoreguidelines-no-malloc)
-    if (memory == nullptr) {
+    // NOLINTBEGIN(cppcoreguidelines-no-malloc): libzmq's thread frees it
+    const auto free = [](void* place) { std::free(place); };
+    std::unique_ptr<void, decltype(free)> memory(std::malloc(sizeof(Head) + size));
+    // NOLINTEND(cppcoreguidelines-no-malloc)
+    if (!memory) {
         throw std::bad_alloc();
     }
-    auto* const head = new (memory) Head{&outstanding, counts};
+    auto* const head = new (memory.get()) Head{&outstanding, counts};
     auto* const bytes = reinterpret_cast<unsigned char*>(head + 1);
     messages::write(message, bytes);
+    std::ignore = memory.release(); // from here on release() frees it
     outstanding.counts += counts;
     ++outstanding.messages; // behind the bytes, for the thread that frees them
     zmq_msg_close(frame.get());
