@@ -9,6 +9,7 @@
 
 #include <cstdlib>
 #include <memory>
+#include <thread>
 
 #ifdef BENCH_ZMQ
 #include <zmq.h>
@@ -279,6 +280,34 @@ private:
 };
 #endif
 
+/// Blocks from a thread that writes to one that reads, as from program to program.
+template <typename Peer>
+void move(const std::string& name, std::size_t elements)
+{
+    benchmark::RegisterBenchmark(name.c_str(), [=](benchmark::State& state) {
+        std::vector<double> out(elements);
+        std::iota(out.begin(), out.end(), 1.0);
+        std::vector<double> in(elements);
+        Peer peer(elements);
+        constexpr benchmark::IterationCount before =
+            100; // until the memory that moves has been used
+        std::thread writer([&, count = before + state.max_iterations] {
+            for (benchmark::IterationCount i = 0; i < count; ++i) {
+                peer.send(out.data());
+            }
+        });
+        for (benchmark::IterationCount i = 0; i < before; ++i) {
+            peer.receive(in.data());
+        }
+        for (auto _ : state) {
+            peer.receive(in.data());
+        }
+        writer.join();
+        require(in == out, "the blocks came changed");
+        state.SetBytesProcessed(state.iterations() * static_cast<int64_t>(peer.bytes));
+    })->UseRealTime();
+}
+
 } // namespace
 
 int main(int argc, char** argv)
@@ -290,13 +319,13 @@ int main(int argc, char** argv)
         const std::size_t elements = bytes / sizeof(double);
         const std::string size = std::to_string(bytes);
 #ifdef BENCH_ZMQ
-        add<ZmqDevice>("zmq/" + size + "/ours", elements, 16);
-        add<RawZmq>("zmq/" + size + "/raw", elements, 16);
+        move<ZmqDevice>("zmq/" + size + "/ours", elements);
+        move<RawZmq>("zmq/" + size + "/raw", elements);
 #endif
 #ifdef BENCH_NATS
         if (bytes < 1UL << 20 && server() != nullptr) { // which is more than the server takes
-            add<NatsDevice>("nats/" + size + "/ours", elements, 16);
-            add<RawNats>("nats/" + size + "/raw", elements, 16);
+            move<NatsDevice>("nats/" + size + "/ours", elements);
+            move<RawNats>("nats/" + size + "/raw", elements);
             add<JetStreamDevice>("jetstream/" + size + "/ours", elements, 16);
             add<RawJetStream>("jetstream/" + size + "/raw", elements, 16);
         }

@@ -8,6 +8,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <memory>
 #include <sstream>
 #include <string>
@@ -85,6 +86,39 @@ TEST(MessageTest, APartOfAPacketHasItsElementsAndAllConstants)
     EXPECT_EQ(text.str(),
               "bytes:=\u00E9 data:0 0 flags:0 1 gain:=0.5 latin:=\xE9 on:=1 other:1 2 3 "
               "pairs:2 3 4 5 text:=\u20AC \U0001F600 ");
+}
+
+TEST(MessageTest, ALargeArrayStaysWhereItArrivedUnlessItLiesAskew)
+{
+    for (const std::size_t askew : {0UL, 1UL}) {
+        for (std::size_t letters = 1; letters <= 8; ++letters) { // for all that may be before it
+            constexpr std::size_t elements = largeArray / sizeof(double);
+            Data data{std::string(letters, 's'), 0, 0, {}, 0, elements};
+            std::unique_ptr<double[]> ones(new double[elements]);
+            std::fill_n(ones.get(), elements, 1.0);
+            setField(data.packet, makeArray(dataField, std::move(ones), elements));
+            data.packet.counts = elements;
+            const std::size_t size = sizeOf(data);
+            std::shared_ptr<unsigned char> owner(new unsigned char[size + askew],
+                                                 std::default_delete<unsigned char[]>());
+            owner = {owner, owner.get() + askew};
+            write(data, owner.get());
+            const std::weak_ptr<unsigned char> memory = owner;
+            const unsigned char* const begin = owner.get();
+            auto arrived = std::get<Data>(messages::read(begin, size, size, std::move(owner)));
+            visitProperty(brenixplugin::asProperty(arrived.packet.fields->at(dataField)),
+                          [&](auto& field) {
+                              if constexpr (requires { field.data[0] == 1.0; }) {
+                                  const auto* at = reinterpret_cast<unsigned char*>(field.data);
+                                  EXPECT_EQ(at >= begin && at < begin + size, askew == 0);
+                                  EXPECT_EQ(field.data[elements - 1], 1.0);
+                              }
+                          });
+            EXPECT_EQ(memory.expired(), askew != 0) << letters;
+            arrived = {};
+            EXPECT_TRUE(memory.expired());
+        }
+    }
 }
 
 std::string head(unsigned int major, std::uint64_t value)

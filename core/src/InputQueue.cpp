@@ -19,7 +19,9 @@ bool Queue::awaitTurn(Lock& lock, bool waits)
     if (waits) {
         waitUntil(lock, [&] { return isFree() || phase != Phase::Open; });
     }
-    return isFree() && takesPart();
+    const bool isItsTurn = isFree() && takesPart();
+    hasAsked = hasAsked || !isItsTurn;
+    return isItsTurn;
 }
 
 bool Queue::bring(Lock& lock, plugin::Packet&& packet)
@@ -138,6 +140,7 @@ std::uint64_t Queue::positionOf(const QueuedPacket& packet) const
 std::uint64_t Queue::takenCounts() const
 {
     const std::lock_guard guard(mutex);
+    hasAsked = true; // before the look at what settle() changes
     if (const std::uint64_t first = inHand; first != none) {
         return first;
     }
@@ -201,9 +204,7 @@ void Queue::settle(Packets& undelivered) noexcept
         putBack(undelivered);
     }
     inHand = none;
-    if (phase != Phase::Closed) { // which this thread alone changes
-        device.wake();
-    }
+    wakeDevice();
 }
 
 Queue::Packets Queue::takeAvailable(std::uint64_t count)

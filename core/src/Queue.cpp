@@ -76,10 +76,14 @@ bool Queue::giveWay(Lock& lock)
 
 void Queue::notifyDevice(Lock& lock)
 {
-    const bool running = phase != Phase::Closed;
     lock.unlock();
     changed.notify_all();
-    if (running) {
+    wakeDevice();
+}
+
+void Queue::wakeDevice() noexcept
+{
+    if (phase != Phase::Closed && hasAsked.exchange(false)) {
         device.wake();
     }
 }
@@ -159,6 +163,7 @@ std::optional<plugin::Packet> Queue::pull(bool waits)
         waitUntil(lock, [&] { return !packets.empty() || phase != Phase::Open; });
     }
     if (packets.empty() || !takesPart()) {
+        hasAsked = true;
         return std::nullopt;
     }
     plugin::Packet packet = packets.popFront().packet;

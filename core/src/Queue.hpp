@@ -187,6 +187,10 @@ private:
     /// wakes finds it free.
     void notifyDevice(Lock& lock);
 
+    /// If it has asked since the last time, for what it may have now. For the caller's thread, with or without the
+    /// lock: it alone changes the phase.
+    void wakeDevice() noexcept;
+
     Packets takeAvailable(std::uint64_t count);
 
     /// The number of the next count of a packet; 0 for one of an earlier opening.
@@ -220,6 +224,8 @@ private:
     // Changed under the mutex, but read also without it.
     std::atomic<std::uint64_t> counts = 0; ///< in `packets`
     std::atomic<bool> deviceDone = false;
+    mutable std::atomic<bool> hasAsked =
+        false; ///< the device: by tryPush(), tryPull(), takenCounts()
 
     /// The first count that is taken but not delivered; all bits set when there is none.
     static constexpr std::uint64_t none = UINT64_MAX;

@@ -3,6 +3,7 @@
 #include "Fields.hpp"
 
 #include "Arrays.hpp"
+#include "Message.hpp"
 #include "Texts.hpp"
 
 #include "brenixcore/plugin/Make.hpp"
@@ -36,6 +37,24 @@ bool isText(const Item& item)
     return item.kind == Kind::Text || item.kind == Kind::Bytes;
 }
 
+/// An array in memory that it shares.
+template <typename T>
+class ArrayInPlace : public brenixplugin::kit::coderconverter::TPointerProperty<T>
+{
+    using Base = brenixplugin::kit::coderconverter::TPointerProperty<T>;
+
+public:
+    ArrayInPlace(std::string propertyName, T* elements, std::uint64_t elementCount,
+                 std::shared_ptr<unsigned char> memory)
+        : Base(std::move(propertyName), elements, elementCount), owner(std::move(memory))
+    {
+    }
+    ~ArrayInPlace() override { this->data = nullptr; } // it is the owner's
+
+private:
+    const std::shared_ptr<unsigned char> owner;
+};
+
 } // namespace
 
 template <typename T>
@@ -46,6 +65,18 @@ void FieldReader::take(Field& field, std::unique_ptr<T[]> elements) const
                          : makeArray(field.name, std::move(elements), field.elements);
 }
 
+/// Null for what is to be copied.
+template <typename T>
+T* FieldReader::placeOf(std::string_view bytes) const
+{
+    if (owner == nullptr || bytes.size() < largeArray) {
+        return nullptr;
+    }
+    unsigned char* const place = owner.get() + items.positionOf(bytes);
+    const bool isAligned = reinterpret_cast<std::uintptr_t>(place) % alignof(T) == 0;
+    return isAligned ? reinterpret_cast<T*>(place) : nullptr;
+}
+
 template <typename T>
 void FieldReader::takeArray(Field& field, std::string_view bytes, bool isReversed)
 {
@@ -54,6 +85,10 @@ void FieldReader::takeArray(Field& field, std::string_view bytes, bool isReverse
                    " bytes, which is no whole number of elements of " + std::to_string(sizeof(T)));
     }
     field.elements = bytes.size() / sizeof(T);
+    if (T* const place = isReversed ? nullptr : placeOf<T>(bytes)) {
+        field.property.reset(new ArrayInPlace<T>(field.name, place, field.elements, owner));
+        return;
+    }
     std::unique_ptr<T[]> elements(new T[field.elements]);
     if (!bytes.empty()) {
         std::memcpy(elements.get(), bytes.data(), bytes.size());

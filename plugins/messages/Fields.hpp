@@ -11,6 +11,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
 
 namespace messages
 {
@@ -26,8 +27,10 @@ struct Field {
 class FieldReader
 {
 public:
-    FieldReader(Items& messageItems, std::size_t mostOfArrays)
-        : items(messageItems), left(mostOfArrays)
+    /// `memory` is empty, or where the message lies, which large arrays are to keep.
+    FieldReader(Items& messageItems, std::size_t mostOfArrays,
+                std::shared_ptr<unsigned char> memory)
+        : items(messageItems), left(mostOfArrays), owner(std::move(memory))
     {
     }
 
@@ -42,10 +45,13 @@ private:
     template <typename T>
     void takeArray(Field& field, std::string_view bytes, bool isReversed);
     template <typename T>
+    T* placeOf(std::string_view bytes) const;
+    template <typename T>
     void take(Field& field, std::unique_ptr<T[]> elements) const;
 
     Items& items;
     std::size_t left; ///< bytes that may still be taken for arrays
+    const std::shared_ptr<unsigned char> owner;
     bool areConstants = false;
 };
 

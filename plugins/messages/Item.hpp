@@ -28,6 +28,12 @@ public:
 
     std::size_t getPosition() const { return position; }
 
+    /// Where something begins that was read in its place.
+    std::size_t positionOf(std::string_view part) const
+    {
+        return static_cast<std::size_t>(part.data() - reinterpret_cast<const char*>(bytes));
+    }
+
     /// Goes to what the name says, for errors; it must stay, as what is in the message does.
     void go(std::size_t place, std::string_view name, std::string_view before = "")
     {

@@ -8,6 +8,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <map>
+#include <memory>
 #include <stdexcept>
 #include <string>
 #include <variant>
@@ -78,10 +79,16 @@ std::size_t sizeOf(const Kind& message);
 template <typename Kind>
 void write(const Kind& message, unsigned char* bytes);
 
+/// Bytes from which an array of numbers is large. The first of a message lies at a multiple of 8 of it.
+constexpr std::size_t largeArray = 16384;
+
 /// Reads a message. Nothing in it is trusted: no memory is taken for what is not there, and its arrays
-/// take at most `maxArrays` bytes. Arrays are copied once, from their place to their field.
+/// take at most `maxArrays` bytes. Arrays are copied once, from their place to their field. Where `owner` points to
+/// the bytes, large arrays that are as this machine holds them stay in their place, and the fields keep it: the
+/// bytes are theirs, to be changed as well.
 /// @throws Malformed
-Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArrays);
+Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArrays,
+             std::shared_ptr<unsigned char> owner = nullptr);
 
 } // namespace messages
 

@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <limits>
+#include <memory>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -95,8 +96,9 @@ private:
 class Reader
 {
 public:
-    Reader(const unsigned char* bytes, std::size_t size, std::size_t mostOfArrays)
-        : items(bytes, size), entries(items), maxArrays(mostOfArrays)
+    Reader(const unsigned char* bytes, std::size_t size, std::size_t mostOfArrays,
+           std::shared_ptr<unsigned char> owner)
+        : items(bytes, size), entries(items), fields(items, mostOfArrays, std::move(owner))
     {
         if (items.getPosition() < size) {
             throw Malformed(std::to_string(size - items.getPosition()) +
@@ -165,18 +167,17 @@ private:
             items.fail("must be 1 or more, and fit in 64 bits with first");
         }
         entries.require("fields");
-        FieldReader reader(items, maxArrays);
-        readFields(reader, data.packet, false);
+        readFields(data.packet, false);
         if (entries.find("constants")) {
-            readFields(reader, data.packet, true);
+            readFields(data.packet, true);
         }
         return data;
     }
 
-    void readFields(FieldReader& reader, Packet& packet, bool areConstants)
+    void readFields(Packet& packet, bool areConstants)
     {
         for (std::uint64_t left = items.map(maxFields); left > 0; --left) {
-            Field field = reader.read(areConstants);
+            Field field = fields.read(areConstants);
             const bool fits = field.elements > 0 && field.elements % packet.counts == 0;
             if (!areConstants && !fits) {
                 items.fail("has " + std::to_string(field.elements) + " elements for " +
@@ -191,14 +192,15 @@ private:
 
     Items items;
     Entries entries;
-    const std::size_t maxArrays;
+    FieldReader fields;
 };
 
 } // namespace
 
-Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArrays)
+Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArrays,
+             std::shared_ptr<unsigned char> owner)
 {
-    return Reader(bytes, size, maxArrays).read();
+    return Reader(bytes, size, maxArrays, std::move(owner)).read();
 }
 
 } // namespace messages

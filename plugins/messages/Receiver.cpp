@@ -34,10 +34,11 @@ bool Receiver::isDone() const
 }
 
 std::optional<Packet> Receiver::take(const unsigned char* bytes, std::size_t size,
-                                     const std::string& origin, DeviceStreams& streams)
+                                     const std::string& origin, DeviceStreams& streams,
+                                     std::shared_ptr<unsigned char> owner)
 {
     try {
-        Message message = read(bytes, size, maxMessage);
+        Message message = read(bytes, size, maxMessage, std::move(owner));
         if (auto* const data = std::get_if<Data>(&message)) {
             return take(std::move(*data), streams);
         }

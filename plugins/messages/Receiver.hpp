@@ -8,6 +8,7 @@
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
+#include <memory>
 #include <optional>
 #include <unordered_map>
 
@@ -43,10 +44,11 @@ public:
 
     /// Reads what arrived from `origin`, by its name. Returns the packet that it brings, if any, to be pushed before
     /// the next call; what is missing before it is told to the stream. What is no message is skipped, with an
-    /// error. When it throws, for want of memory, nothing has changed.
+    /// error. When it throws, for want of memory, nothing has changed. `owner` as for messages::read().
     std::optional<brenixcore::plugin::Packet> take(const unsigned char* bytes, std::size_t size,
                                                    const std::string& origin,
-                                                   brenixcore::plugin::DeviceStreams& streams);
+                                                   brenixcore::plugin::DeviceStreams& streams,
+                                                   std::shared_ptr<unsigned char> owner = nullptr);
 
     /// Whether the writers have ended for which the device is there.
     bool isDone() const;

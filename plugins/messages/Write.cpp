@@ -30,6 +30,19 @@ public:
 
     std::size_t getSize() const { return size; }
 
+    /// Where the first large array begins; 0: there is none.
+    std::size_t getLarge() const { return large; }
+
+    /// The elements of an array.
+    void array(const void* data, std::size_t length)
+    {
+        put(cbor_encode_bytestring_start, length);
+        if (large == 0 && length >= largeArray) {
+            large = size;
+        }
+        copy(data, length);
+    }
+
     /// One of libcbor's functions. It writes what its result says, and no byte more.
     template <typename Encode, typename Value>
     void put(Encode encode, Value value)
@@ -82,22 +95,26 @@ private:
 
     unsigned char* const bytes;
     std::size_t size = 0;
+    std::size_t large = 0;
 };
 
 /// How many elements a field has, and whether it is one value that describes the packet.
 struct Shape {
     std::uint64_t elements = 0;
     bool isScalar = false;
+    bool isLarge = false; ///< or parts of it are
 
     template <typename T>
     void operator()(const coderconverter::TPointerProperty<T>& array)
     {
         elements = array.count;
+        isLarge = elements >= largeArray / sizeof(T);
     }
     template <typename T>
     void operator()(const device::TVectorProperty<T>& vector)
     {
         elements = vector.values.size();
+        isLarge = elements >= largeArray / sizeof(T);
     }
     template <typename T>
     void operator()(const device::TScalarProperty<T>& /*one*/)
@@ -149,8 +166,7 @@ private:
     {
         if constexpr (std::is_arithmetic_v<T>) {
             output.put(cbor_encode_tag, arrayTag<T>());
-            output.put(cbor_encode_bytestring_start, count * sizeof(T));
-            output.copy(elements + begin, count * sizeof(T));
+            output.array(elements + begin, count * sizeof(T));
         } else {
             output.put(cbor_encode_array_start, count);
             std::for_each_n(elements + begin, count, [&](const T& text) { output.text(text); });
@@ -204,15 +220,18 @@ public:
     {
         std::size_t fields = 0;
         std::size_t constants = 0;
+        bool isPadded = false;
         for (const auto& [name, property] : *data.packet.fields) {
             if (!hasLengthOfName(name) || !isUtf8(name)) {
                 throw Malformed("Field " + name +
                                 " cannot be sent: its name is not UTF-8 of 1 to " +
                                 std::to_string(maxName) + " bytes.");
             }
-            ++(isDivided(data, shapeOf(name, property)) ? fields : constants);
+            const Shape shape = shapeOf(name, property);
+            isPadded = isPadded || shape.isLarge;
+            ++(isDivided(data, shape) ? fields : constants);
         }
-        begin(data.stream, data.seq, constants == 0 ? 8 : 9);
+        begin(data.stream, data.seq, std::size_t{8} + (constants > 0 ? 1 : 0) + (isPadded ? 1 : 0));
         entry("first", data.first);
         entry("counts", data.counts);
         output.name("time");
@@ -220,12 +239,12 @@ public:
         const auto magnitude = static_cast<std::uint64_t>(time < 0 ? -1 - time : time);
         output.put(time < 0 ? cbor_encode_negint : cbor_encode_uint, magnitude);
         entry("lost", data.packet.lost);
-        output.name("fields");
-        writeFields(data, fields, true);
-        if (constants > 0) {
-            output.name("constants");
-            writeFields(data, constants, false);
+        if (isPadded) {
+            Writer ahead(nullptr);
+            ahead.writeFields(data, fields, constants);
+            pad(ahead.output.getLarge());
         }
+        writeFields(data, fields, constants);
     }
 
     void operator()(const End& end)
@@ -241,8 +260,29 @@ private:
         return !shape.isScalar && shape.elements > 0 && shape.elements % data.packet.counts == 0;
     }
 
-    /// Those that are divided, or the others.
-    void writeFields(const Data& data, std::size_t size, bool divided)
+    void writeFields(const Data& data, std::size_t fields, std::size_t constants)
+    {
+        output.name("fields");
+        writeMap(data, fields, true);
+        if (constants > 0) {
+            output.name("constants");
+            writeMap(data, constants, false);
+        }
+    }
+
+    /// So many bytes that what lies so far behind them begins at a multiple of 8.
+    void pad(std::size_t distance)
+    {
+        constexpr std::array<unsigned char, 7> zeros{};
+        output.name("pad");
+        const std::size_t head = 1;
+        const std::size_t length = (8 - (output.getSize() + head + distance) % 8) % 8;
+        output.put(cbor_encode_bytestring_start, length);
+        output.copy(zeros.data(), length);
+    }
+
+    /// The fields that are divided, or the others.
+    void writeMap(const Data& data, std::size_t size, bool divided)
     {
         output.put(cbor_encode_map_start, size);
         for (const auto& [name, property] : *data.packet.fields) {

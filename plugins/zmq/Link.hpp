@@ -49,13 +49,14 @@ public:
     const std::string& getEndpoint() const { return endpoint; }   ///< where it is bound
     const std::string& getPublicKey() const { return publicKey; } ///< empty: none
 
-    /// Waits for one of the events of libzmq's poll, for something to attend to, or for somebody who wakes
-    /// the device, and no longer than the time. Without events the socket is left alone: it hears nothing of
-    /// its peers. `isEmpty` as for attend().
-    void wait(WakeUp& wakeUp, short events, std::chrono::milliseconds time, bool isEmpty);
+    /// Waits until the socket may be ready for one of the events, or hears of its peers, for something to attend
+    /// to, or for somebody who wakes the device, and no longer than the time. Without events the socket is left
+    /// alone: it hears nothing. What is to be attended to must have been before. Returns whether there is
+    /// something. `isEmpty` as for attend().
+    bool wait(WakeUp& wakeUp, int events, std::chrono::milliseconds time, bool isEmpty);
 
-    /// Lets the socket hear of its peers: who has gone, and who has room again.
-    void hear();
+    /// Lets the socket hear of its peers: who has gone, and who has room again. Returns for what it is ready.
+    int hear();
 
     /// Looks after the peers. A connection that has ended is made anew only when the socket is empty, as
     /// libzmq then drops what has arrived.

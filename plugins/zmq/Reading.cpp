@@ -1,6 +1,8 @@
 #include "Reading.hpp"
 
 #include <chrono>
+#include <memory>
+#include <utility>
 
 namespace zeromq
 {
@@ -11,6 +13,7 @@ using std::chrono::milliseconds;
 void Reading::run(DeviceStreams& streams)
 {
     receiver.begin();
+    link.attend(true);
     while (!streams.isClosing() && (waiting || !receiver.isDone())) {
         constexpr int some = 256; // then the peers are looked after
         bool isIdle = false;
@@ -20,9 +23,10 @@ void Reading::run(DeviceStreams& streams)
             deliver(streams);
         }
         const bool isDone = !waiting && receiver.isDone();
-        link.wait(wakeUp, isIdle ? ZMQ_POLLIN : 0,
-                  milliseconds(!isDone && (isIdle || waiting) ? 10000 : 0), isIdle);
-        link.attend(isIdle);
+        if (link.wait(wakeUp, isIdle ? ZMQ_POLLIN : 0,
+                      milliseconds(!isDone && (isIdle || waiting) ? 10000 : 0), isIdle)) {
+            link.attend(isIdle);
+        }
     }
     finish(streams);
 }
@@ -37,7 +41,14 @@ bool Reading::receive(DeviceStreams& streams)
     const bool isTopic = settings.pattern == Pattern::Subscribe && isFirst && frame.hasMore();
     isFirst = !frame.hasMore();
     if (!isTopic) {
-        waiting = receiver.take(frame.data(), frame.size(), link.getEndpoint(), streams);
+        std::shared_ptr<unsigned char> owner;
+        const std::size_t size = frame.size();
+        if (size > messages::largeArray) {
+            const auto kept = std::make_shared<Frame>(std::move(frame));
+            owner = {kept, kept->data()};
+        }
+        waiting = receiver.take(owner ? owner.get() : frame.data(), size, link.getEndpoint(),
+                                streams, owner);
     }
     return true;
 }

@@ -59,6 +59,7 @@ std::uint64_t Writing::getReaders() const
 void Writing::run(DeviceStreams& streams)
 {
     sender.begin();
+    look();
     for (;;) {
         const bool closing = streams.isClosing(); // before the last look at the output
         if (closing && !deadline) {
@@ -187,55 +188,62 @@ void Writing::hear()
 
 void Writing::wait(State state, milliseconds time)
 {
+    const bool publishes = settings.pattern == Pattern::Publish;
+    if (hasHeard && !publishes && look()) { // whether somebody had gone by then
+        return;
+    }
     if (deadline) {
         time = std::clamp(std::chrono::ceil<milliseconds>(*deadline - Clock::now()),
                           milliseconds(0), time);
     }
-    const bool publishes = settings.pattern == Pattern::Publish;
     const bool isFull = state == State::Blocked && hasBegun && isSettled();
     if (Clock::now() < settled) {
         time = std::min(time, milliseconds(20));
     }
     const bool isHeard = publishes || isFull || !isSettled();
-    if (hasHeard && !isHeard) {
-        time = milliseconds(0); // to know whether somebody had gone by then
-    }
-    const bool wasHeard = std::exchange(hasHeard, false);
     if (isHeard) {
         hear();
     }
-    const bool isQuiet = !wasHeard && !hasHeard;
-    outstanding.isAwaited = !publishes;
+    outstanding.isAwaited = deadline.has_value();
     link.wait(wakeUp,
-              static_cast<short>(publishes ? ZMQ_POLLIN
-                                 : isFull  ? ZMQ_POLLOUT
-                                 : isHeard ? ZMQ_POLLERR
-                                           : 0),
+              publishes ? ZMQ_POLLIN
+              : isFull  ? ZMQ_POLLOUT
+              : isHeard ? ZMQ_POLLERR
+                        : 0,
               time, true);
     outstanding.isAwaited = false;
+    look();
+}
+
+/// Looks after the peers. Returns whether some have come or gone.
+bool Writing::look()
+{
+    const bool wasHeard = std::exchange(hasHeard, false);
     const std::uint64_t before = sent - outstanding.counts + waiting.value_or(0);
     const std::uint64_t arrivals = link.getArrivals();
     const std::uint64_t departures = link.getDepartures();
     link.attend(true);
-    if (publishes) {
+    if (settings.pattern == Pattern::Publish) {
         takeSubscriptions();
-        return;
+        return false;
     }
-    if (link.getArrivals() != arrivals) {
+    const bool haveCome = link.getArrivals() != arrivals;
+    const bool haveGone = link.getDepartures() != departures;
+    if (haveCome) {
         hellos = link.getPeers(); // they go round
         hear();
     }
-    if (isQuiet || link.getDepartures() == departures) {
+    if (!wasHeard || !haveGone) {
         handedOver = before;
     }
-    if (link.getDepartures() == departures) {
-        return;
+    if (haveGone) {
+        settled = Clock::now() + milliseconds(100);
+        if (const std::uint64_t lost = sent - std::exchange(handedOver, sent); lost > 0) {
+            doubtful += lost;
+            tell();
+        }
     }
-    settled = Clock::now() + milliseconds(100);
-    if (const std::uint64_t lost = sent - std::exchange(handedOver, sent); lost > 0) {
-        doubtful += lost;
-        tell();
-    }
+    return haveCome || haveGone;
 }
 
 /// Those of the topic, which for a reader is the beginning of one.

@@ -50,6 +50,7 @@ private:
     bool sendHellos();
     void hear();
     void wait(State state, std::chrono::milliseconds time);
+    bool look();
     void takeSubscriptions();
     bool waitUntilHandedOver();
     void sendEnd();

@@ -59,11 +59,21 @@ inline OwnedSocket makeSocket(void* context, int type)
     return socket;
 }
 
+/// What tells the system's poll that the socket may be ready for something else.
+inline int handleOf(void* socket)
+{
+    int handle = -1;
+    std::size_t size = sizeof handle;
+    zmq_getsockopt(socket, ZMQ_FD, &handle, &size);
+    return handle;
+}
+
 /// A frame of a message.
 class Frame
 {
 public:
     Frame() { zmq_msg_init(&frame); }
+    Frame(Frame&& other) noexcept : Frame() { zmq_msg_move(&frame, other.get()); }
     Frame(const Frame&) = delete;
     Frame& operator=(const Frame&) = delete;
     ~Frame() { zmq_msg_close(&frame); }
@@ -72,7 +82,7 @@ public:
     bool receive(void* socket) { return zmq_msg_recv(&frame, socket, ZMQ_DONTWAIT) >= 0; }
 
     zmq_msg_t* get() { return &frame; }
-    const unsigned char* data() { return static_cast<unsigned char*>(zmq_msg_data(&frame)); }
+    unsigned char* data() { return static_cast<unsigned char*>(zmq_msg_data(&frame)); }
     std::size_t size() const { return zmq_msg_size(&frame); }
     bool hasMore() const { return zmq_msg_more(&frame) != 0; }
     std::string text() { return {reinterpret_cast<const char*>(data()), size()}; }

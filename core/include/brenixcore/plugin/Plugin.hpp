@@ -88,7 +88,7 @@ public:
     virtual void tellLost(std::uint64_t counts, const char* reason) = 0;
 
     /// How far the caller has come with the input stream: all counts before this number, from open and lost
-    /// ones included, were read, flushed or lost. wake() tells when the caller has changed it; a push() that
+    /// ones included, were read, flushed or lost. wake() tells when the caller has changed it since; a push() that
     /// drops what has waited longest changes it, too. For a device that keeps its place elsewhere.
     virtual std::uint64_t takenCounts() const = 0;
 
@@ -144,8 +144,9 @@ public:
     /// returns nothing, any other device returns when push() is false.
     virtual void run(DeviceStreams& streams) = 0;
 
-    /// Called on the channel's thread, while run() may be busy, when tryPush(), tryPull(), isClosing() or
-    /// takenCounts() may have a new answer. Must neither wait nor throw.
+    /// Called on the channel's thread, while run() may be busy, when the channel closes, and when one of these may
+    /// have a new answer that the device has asked for since the last time: tryPush() that was refused, tryPull()
+    /// that found nothing, takenCounts(). Must neither wait nor throw.
     virtual void wake() noexcept {}
 
     /// Runs a command, possibly while run() is busy.
