@@ -14,12 +14,12 @@ function(brenix_install_package package)
 endfunction()
 
 # What pkg-config needs to know. It follows the installation when that is moved.
-function(brenix_install_pkgconfig)
+function(brenix_install_pkgconfig package)
     set(folder ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
     file(RELATIVE_PATH up /${folder} /)
-    configure_file(${PROJECT_SOURCE_DIR}/cmake/brenixcoder.pc.in
-        ${PROJECT_BINARY_DIR}/brenixcoder.pc @ONLY)
-    install(FILES ${PROJECT_BINARY_DIR}/brenixcoder.pc DESTINATION ${folder})
+    configure_file(${PROJECT_SOURCE_DIR}/cmake/${package}.pc.in
+        ${PROJECT_BINARY_DIR}/${package}.pc @ONLY)
+    install(FILES ${PROJECT_BINARY_DIR}/${package}.pc DESTINATION ${folder})
 endfunction()
 
 # The documentation, laid out as in the repository, so that its links hold: those to headers by links to

@@ -123,6 +123,7 @@ expect '*device that loads*
 2
 read 3 counts *' env "PATH=$scratch/installed/bin:$PATH" "PKG_CONFIG_PATH=$folder" \
     bash -e <(pieces sh docs/plugin-authors.md 3)
+[[ -e $("${pkgconfig[@]}" --variable=plugindir brenixcore)/loopback.so ]]
 cd ..
 
 echo "== the Debian package has the same files, and says what it needs"
