@@ -26,7 +26,7 @@ endfunction()
 # the installed ones.
 function(brenix_install_docs)
     set(folder ${CMAKE_INSTALL_DOCDIR})
-    install(FILES README.md DESTINATION ${folder})
+    install(FILES README.md CHANGELOG.md CONTRIBUTING.md SECURITY.md DESTINATION ${folder})
     install(DIRECTORY docs DESTINATION ${folder} FILES_MATCHING PATTERN *.md PATTERN *.svg
         PATTERN man EXCLUDE)
     install(DIRECTORY examples DESTINATION ${folder} FILES_MATCHING PATTERN *.c PATTERN *.h)

@@ -41,7 +41,7 @@ read -ra flags < <("${pkgconfig[@]}" --cflags --libs brenixcoder)
 flags+=("-Wl,-rpath,$("${pkgconfig[@]}" --variable=libdir brenixcoder)" -lm)
 
 echo "== every relative link of the pages, here and in the repository, leads somewhere"
-for page in {"$docs","$source"}/{README.md,docs/*.md}; do
+for page in {"$docs","$source"}/{,docs/}*.md; do
     while read -r link; do
         [[ -e ${page%/*}/$link ]] || { echo "$page: $link" && exit 1; }
     done < <(grep -oP '\]\((?!https?:)\K[^)#]+' "$page")
