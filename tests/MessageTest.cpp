@@ -88,37 +88,44 @@ TEST(MessageTest, APartOfAPacketHasItsElementsAndAllConstants)
               "pairs:2 3 4 5 text:=\u20AC \U0001F600 ");
 }
 
-TEST(MessageTest, ALargeArrayStaysWhereItArrivedUnlessItLiesAskew)
+/// A message of an array of ones and some bytes more.
+template <typename T>
+void readInPlace(std::size_t more, std::size_t askew, bool stays)
 {
-    for (const std::size_t askew : {0UL, 1UL}) {
-        for (std::size_t letters = 1; letters <= 8; ++letters) { // for all that may be before it
-            constexpr std::size_t elements = largeArray / sizeof(double);
-            Data data{std::string(letters, 's'), 0, 0, {}, 0, elements};
-            std::unique_ptr<double[]> ones(new double[elements]);
-            std::fill_n(ones.get(), elements, 1.0);
-            setField(data.packet, makeArray(dataField, std::move(ones), elements));
-            data.packet.counts = elements;
-            const std::size_t size = sizeOf(data);
-            std::shared_ptr<unsigned char> owner(new unsigned char[size + askew],
-                                                 std::default_delete<unsigned char[]>());
-            owner = {owner, owner.get() + askew};
-            write(data, owner.get());
-            const std::weak_ptr<unsigned char> memory = owner;
-            const unsigned char* const begin = owner.get();
-            auto arrived = std::get<Data>(messages::read(begin, size, size, std::move(owner)));
-            visitProperty(brenixplugin::asProperty(arrived.packet.fields->at(dataField)),
-                          [&](auto& field) {
-                              if constexpr (requires { field.data[0] == 1.0; }) {
-                                  const auto* at = reinterpret_cast<unsigned char*>(field.data);
-                                  EXPECT_EQ(at >= begin && at < begin + size, askew == 0);
-                                  EXPECT_EQ(field.data[elements - 1], 1.0);
-                              }
-                          });
-            EXPECT_EQ(memory.expired(), askew != 0) << letters;
-            arrived = {};
-            EXPECT_TRUE(memory.expired());
-        }
+    constexpr std::size_t elements = largeArray / sizeof(T);
+    for (std::size_t letters = 1; letters <= 8; ++letters) { // for all that may be before it
+        Data data{std::string(letters, 's'), 0, 0, {}, 0, elements};
+        std::unique_ptr<T[]> ones(new T[elements]);
+        std::fill_n(ones.get(), elements, T{1});
+        setField(data.packet, makeArray(dataField, std::move(ones), elements));
+        setField(data.packet, makeScalar("more", std::string(more, 'x')));
+        data.packet.counts = elements;
+        const std::size_t size = sizeOf(data);
+        std::shared_ptr<unsigned char> owner(new unsigned char[size + askew],
+                                             std::default_delete<unsigned char[]>());
+        owner = {owner, owner.get() + askew};
+        write(data, owner.get());
+        const std::weak_ptr<unsigned char> memory = owner;
+        const unsigned char* const begin = owner.get();
+        auto arrived = std::get<Data>(messages::read(begin, size, size, std::move(owner)));
+        auto& field = dynamic_cast<brenixplugin::kit::coderconverter::TPointerProperty<T>&>(
+            *brenixplugin::asProperty(arrived.packet.fields->at(dataField)));
+        const auto* const at = reinterpret_cast<unsigned char*>(field.data);
+        EXPECT_EQ(at >= begin && at < begin + size, stays);
+        EXPECT_EQ(field.data[elements - 1], T{1});
+        EXPECT_EQ(memory.expired(), !stays) << letters;
+        arrived = {};
+        EXPECT_TRUE(memory.expired());
     }
+}
+
+TEST(MessageTest, ALargeArrayStaysWhereItArrivedUnlessItLiesAskewOrIsTheLesserPart)
+{
+    readInPlace<double>(0, 0, true);
+    readInPlace<double>(largeArray / 2, 0, true);
+    readInPlace<double>(0, 1, false);
+    readInPlace<unsigned char>(0, 1, true);
+    readInPlace<double>(2 * largeArray, 0, false);
 }
 
 std::string head(unsigned int major, std::uint64_t value)

@@ -20,7 +20,9 @@ bool Queue::awaitTurn(Lock& lock, bool waits)
         waitUntil(lock, [&] { return isFree() || phase != Phase::Open; });
     }
     const bool isItsTurn = isFree() && takesPart();
-    hasAsked = hasAsked || !isItsTurn;
+    if (!isItsTurn) {
+        hasAsked = true;
+    }
     return isItsTurn;
 }
 

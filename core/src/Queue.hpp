@@ -187,8 +187,8 @@ private:
     /// wakes finds it free.
     void notifyDevice(Lock& lock);
 
-    /// If it has asked since the last time, for what it may have now. For the caller's thread, with or without the
-    /// lock: it alone changes the phase.
+    /// If it has asked, by tryPush(), tryPull() or takenCounts(), for what it may have now. For the caller's thread,
+    /// with or without the lock: the device's changes the phase only while the caller's waits for its end.
     void wakeDevice() noexcept;
 
     Packets takeAvailable(std::uint64_t count);
@@ -224,8 +224,7 @@ private:
     // Changed under the mutex, but read also without it.
     std::atomic<std::uint64_t> counts = 0; ///< in `packets`
     std::atomic<bool> deviceDone = false;
-    mutable std::atomic<bool> hasAsked =
-        false; ///< the device: by tryPush(), tryPull(), takenCounts()
+    mutable std::atomic<bool> hasAsked = false; ///< the device, and was not woken since
 
     /// The first count that is taken but not delivered; all bits set when there is none.
     static constexpr std::uint64_t none = UINT64_MAX;

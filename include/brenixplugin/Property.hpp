@@ -99,7 +99,8 @@ public:
 namespace coderconverter
 {
 
-/// A sequence of T in a plain array that the object owns.
+/// A sequence of T in a plain array that the object owns. Who is handed one may change the elements, and make `count`
+/// less, but must not replace `data`: a derived class may keep the array in another way.
 template <typename T>
 class BRENIXPLUGIN_SHARED TPointerProperty : public interfaces::IPropertyInfo
 {

@@ -46,12 +46,19 @@ class ArrayInPlace : public brenixplugin::kit::coderconverter::TPointerProperty<
 public:
     ArrayInPlace(std::string propertyName, T* elements, std::uint64_t elementCount,
                  std::shared_ptr<unsigned char> memory)
-        : Base(std::move(propertyName), elements, elementCount), owner(std::move(memory))
+        : Base(std::move(propertyName), elements, elementCount), place(elements),
+          owner(std::move(memory))
     {
     }
-    ~ArrayInPlace() override { this->data = nullptr; } // it is the owner's
+    ~ArrayInPlace() override
+    {
+        if (this->data == place) {
+            this->data = nullptr; // it is the owner's
+        }
+    }
 
 private:
+    const T* const place;
     const std::shared_ptr<unsigned char> owner;
 };
 
@@ -65,11 +72,11 @@ void FieldReader::take(Field& field, std::unique_ptr<T[]> elements) const
                          : makeArray(field.name, std::move(elements), field.elements);
 }
 
-/// Null for what is to be copied.
+/// Null for what is to be copied: also what is less than half of the message, which it would keep.
 template <typename T>
 T* FieldReader::placeOf(std::string_view bytes) const
 {
-    if (owner == nullptr || bytes.size() < largeArray) {
+    if (owner == nullptr || bytes.size() < largeArray || bytes.size() < items.getSize() / 2) {
         return nullptr;
     }
     unsigned char* const place = owner.get() + items.positionOf(bytes);
@@ -78,8 +85,9 @@ T* FieldReader::placeOf(std::string_view bytes) const
 }
 
 template <typename T>
-void FieldReader::takeArray(Field& field, std::string_view bytes, bool isReversed)
+void FieldReader::takeArray(Field& field, std::string_view bytes, bool isOfOtherOrder)
 {
+    const bool isReversed = isOfOtherOrder && sizeof(T) > 1;
     if (bytes.size() % sizeof(T) != 0) {
         items.fail("has " + std::to_string(bytes.size()) +
                    " bytes, which is no whole number of elements of " + std::to_string(sizeof(T)));
@@ -93,7 +101,7 @@ void FieldReader::takeArray(Field& field, std::string_view bytes, bool isReverse
     if (!bytes.empty()) {
         std::memcpy(elements.get(), bytes.data(), bytes.size());
     }
-    if (isReversed && sizeof(T) > 1) {
+    if (isReversed) {
         std::transform(elements.get(), elements.get() + field.elements, elements.get(),
                        reversed<T>);
     }
@@ -145,8 +153,10 @@ void FieldReader::readNumbers(Field& field, std::uint64_t tag)
     const std::string_view bytes = items.next(Kind::Bytes, "the bytes of a typed array").bytes;
     takeSize(bytes.size(), 1);
     const bool isLittle = (tag & 4U) != 0;
-    const bool isReversed = isLittle != (std::endian::native == std::endian::little);
-    const auto take = [&](auto element) { takeArray<decltype(element)>(field, bytes, isReversed); };
+    const bool isOfOtherOrder = isLittle != (std::endian::native == std::endian::little);
+    const auto take = [&](auto element) {
+        takeArray<decltype(element)>(field, bytes, isOfOtherOrder);
+    };
     switch (tag) {
     case 64:
     case 68: // clamped, when it was made

@@ -27,10 +27,10 @@ struct Field {
 class FieldReader
 {
 public:
-    /// `memory` is empty, or where the message lies, which large arrays are to keep.
+    /// `messageOwner` is empty, or where the message lies, which a large array is to keep.
     FieldReader(Items& messageItems, std::size_t mostOfArrays,
-                std::shared_ptr<unsigned char> memory)
-        : items(messageItems), left(mostOfArrays), owner(std::move(memory))
+                std::shared_ptr<unsigned char> messageOwner)
+        : items(messageItems), left(mostOfArrays), owner(std::move(messageOwner))
     {
     }
 
@@ -43,7 +43,7 @@ private:
     void readNumbers(Field& field, std::uint64_t tag);
     void readEach(Field& field, std::uint64_t count);
     template <typename T>
-    void takeArray(Field& field, std::string_view bytes, bool isReversed);
+    void takeArray(Field& field, std::string_view bytes, bool isOfOtherOrder);
     template <typename T>
     T* placeOf(std::string_view bytes) const;
     template <typename T>

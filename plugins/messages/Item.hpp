@@ -26,6 +26,7 @@ class Items
 public:
     Items(const unsigned char* first, std::size_t length) : bytes(first), size(length) {}
 
+    std::size_t getSize() const { return size; }
     std::size_t getPosition() const { return position; }
 
     /// Where something begins that was read in its place.

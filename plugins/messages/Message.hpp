@@ -80,12 +80,12 @@ template <typename Kind>
 void write(const Kind& message, unsigned char* bytes);
 
 /// Bytes from which an array of numbers is large. The first of a message lies at a multiple of 8 of it.
-constexpr std::size_t largeArray = 16384;
+constexpr std::size_t largeArray = 32768;
 
 /// Reads a message. Nothing in it is trusted: no memory is taken for what is not there, and its arrays
 /// take at most `maxArrays` bytes. Arrays are copied once, from their place to their field. Where `owner` points to
-/// the bytes, large arrays that are as this machine holds them stay in their place, and the fields keep it: the
-/// bytes are theirs, to be changed as well.
+/// the bytes, a large array that is half of the message or more, and as this machine holds it, stays in its place,
+/// and the field keeps it: the bytes are then the field's, to be changed as well.
 /// @throws Malformed
 Message read(const unsigned char* bytes, std::size_t size, std::size_t maxArrays,
              std::shared_ptr<unsigned char> owner = nullptr);

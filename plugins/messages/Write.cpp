@@ -102,19 +102,16 @@ private:
 struct Shape {
     std::uint64_t elements = 0;
     bool isScalar = false;
-    bool isLarge = false; ///< or parts of it are
 
     template <typename T>
     void operator()(const coderconverter::TPointerProperty<T>& array)
     {
         elements = array.count;
-        isLarge = elements >= largeArray / sizeof(T);
     }
     template <typename T>
     void operator()(const device::TVectorProperty<T>& vector)
     {
         elements = vector.values.size();
-        isLarge = elements >= largeArray / sizeof(T);
     }
     template <typename T>
     void operator()(const device::TScalarProperty<T>& /*one*/)
@@ -220,7 +217,7 @@ public:
     {
         std::size_t fields = 0;
         std::size_t constants = 0;
-        bool isPadded = false;
+        bool mayBeLarge = false;
         for (const auto& [name, property] : *data.packet.fields) {
             if (!hasLengthOfName(name) || !isUtf8(name)) {
                 throw Malformed("Field " + name +
@@ -228,10 +225,16 @@ public:
                                 std::to_string(maxName) + " bytes.");
             }
             const Shape shape = shapeOf(name, property);
-            isPadded = isPadded || shape.isLarge;
+            mayBeLarge = mayBeLarge || shape.elements >= largeArray / sizeof(double);
             ++(isDivided(data, shape) ? fields : constants);
         }
-        begin(data.stream, data.seq, std::size_t{8} + (constants > 0 ? 1 : 0) + (isPadded ? 1 : 0));
+        Writer ahead(nullptr);
+        if (mayBeLarge) {
+            ahead.writeFields(data, fields, constants);
+        }
+        const std::size_t large = ahead.output.getLarge();
+        begin(data.stream, data.seq,
+              std::size_t{8} + (constants > 0 ? 1 : 0) + (large > 0 ? 1 : 0));
         entry("first", data.first);
         entry("counts", data.counts);
         output.name("time");
@@ -239,10 +242,8 @@ public:
         const auto magnitude = static_cast<std::uint64_t>(time < 0 ? -1 - time : time);
         output.put(time < 0 ? cbor_encode_negint : cbor_encode_uint, magnitude);
         entry("lost", data.packet.lost);
-        if (isPadded) {
-            Writer ahead(nullptr);
-            ahead.writeFields(data, fields, constants);
-            pad(ahead.output.getLarge());
+        if (large > 0) {
+            pad(large);
         }
         writeFields(data, fields, constants);
     }

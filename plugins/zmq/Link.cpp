@@ -146,7 +146,7 @@ void Link::connect()
 
 bool Link::wait(WakeUp& wakeUp, int events, milliseconds time, bool isEmpty)
 {
-    auto now = Clock::now();
+    const auto now = Clock::now();
     const auto atMost = [&](Clock::time_point when) {
         time = std::clamp(std::chrono::ceil<milliseconds>(when - now), milliseconds(0), time);
     };

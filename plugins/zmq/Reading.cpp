@@ -43,7 +43,7 @@ bool Reading::receive(DeviceStreams& streams)
     if (!isTopic) {
         std::shared_ptr<unsigned char> owner;
         const std::size_t size = frame.size();
-        if (size > messages::largeArray) {
+        if (size >= messages::largeArray) {
             const auto kept = std::make_shared<Frame>(std::move(frame));
             owner = {kept, kept->data()};
         }

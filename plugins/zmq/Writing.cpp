@@ -220,6 +220,7 @@ bool Writing::look()
 {
     const bool wasHeard = std::exchange(hasHeard, false);
     const std::uint64_t before = sent - outstanding.counts + waiting.value_or(0);
+    const bool isUnderWay = sent > before;
     const std::uint64_t arrivals = link.getArrivals();
     const std::uint64_t departures = link.getDepartures();
     link.attend(true);
@@ -231,10 +232,10 @@ bool Writing::look()
     const bool haveGone = link.getDepartures() != departures;
     if (haveCome) {
         hellos = link.getPeers(); // they go round
-        hear();
+        hasHeard = isUnderWay;    // of them, and of who went since
     }
     if (!wasHeard || !haveGone) {
-        handedOver = before;
+        handedOver = std::max(handedOver, before); // what was told is not told again
     }
     if (haveGone) {
         settled = Clock::now() + milliseconds(100);

@@ -146,7 +146,8 @@ public:
 
     /// Called on the channel's thread, while run() may be busy, when the channel closes, and when one of these may
     /// have a new answer that the device has asked for since the last time: tryPush() that was refused, tryPull()
-    /// that found nothing, takenCounts(). Must neither wait nor throw.
+    /// that found nothing, takenCounts(). So a device that is woken asks again before it waits. Must neither wait nor
+    /// throw.
     virtual void wake() noexcept {}
 
     /// Runs a command, possibly while run() is busy.
