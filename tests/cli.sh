@@ -73,6 +73,13 @@ done <<END
 0|Frequency: 1000 Hz|info signal -o Frequency:int32=1000 -o Waveform:char=sine -o Pace=fast -o Channels=1
 1|Custom property: Foo not found|info signal -p Foo:double
 2|{"error":{"id":"","message":"The following argument was not expected: --nonsense|info signal --json --nonsense
+0|signal: does not look for anything|find signal
+1|scale: cannot look: it is a filter and no device|find scale
+1|probe.so: cannot look: Unrecognized error.|find $plugins/probe.so
+1|  \x1b[31m|find $plugins/probe.so
+1|  may not be opened: group none|find $plugins/probe.so
+1|"Packets": "2 3"|find --json signal $plugins/probe.so
+1|"message": "Unrecognized error."|find --json $plugins/probe.so
 1|{"error":{"id":"brenix:Device:failed","message":"Field none|scope $plugins/probe.so -o Packets:int32=2,-4 --json
 0|wrote 2 counts|write loopback -i samples.csv -t int16
 0|{"counts":2,"seconds":|write loopback -i samples.csv --json
@@ -101,7 +108,7 @@ done <<END
 2|--time needs csv, not wav|read signal --time -n 1 -w time.wav
 0|read 1200 counts|read signal -o Pace=fast -n 1.2k -r 1M --limit 4Ki -w kilo.csv
 2|--block: 2Mi is not a whole number from 1 to 1048576|write loopback -b 2Mi
-2|foo is no command: there are plugins, check, info, read, write, scope, keys|foo
+2|foo is no command: there are plugins, check, find, info, read, write, scope, keys|foo
 2|a command is missing: there are plugins|''
 2|--nonsense; see brenix read --help|read signal --nonsense
 0|Usage: brenix write|help write
@@ -171,6 +178,10 @@ file picture.png | grep -q 'PNG image data' || fail "picture.png is no picture"
 # A picture of few samples has a part of the trace in each of its 79 columns, and some more at its steps.
 brenix scope signal -o Waveform=ramp -o SampleRate=8 -o Frequency=1 -o BlockSize=8 -o Pace=fast -n 8 >picture
 [[ $(LC_ALL=C.UTF-8 grep -o '[█▀▄]' picture | wc -l) -eq 89 ]] || fail "scope of few samples: $(cat picture)"
+
+# What is found can be pasted.
+eval "brenix read $(brenix find "$plugins/probe.so" | head -n 1) -q" >pasted.csv || fail "what is found cannot be pasted"
+cmp pasted.csv kept.csv || fail "what is found reads other data: $(cat pasted.csv)"
 
 # On a terminal a picture fits the screen, keys are not echoed, and the terminal is left as it was.
 while IFS='|' read -r columns keys shown arguments; do

@@ -61,6 +61,7 @@ void report(const Settings& settings, const Failure& failure);
 
 ExitCode listPlugins(const Settings& settings);
 ExitCode checkPlugins(const Settings& settings);
+ExitCode findDevices(const Settings& settings);
 ExitCode showInfo(const Settings& settings);
 ExitCode readSamples(const Settings& given);
 ExitCode writeSamples(const Settings& given);

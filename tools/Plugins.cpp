@@ -1,7 +1,8 @@
-// The commands plugins and check.
+// The commands plugins, check and find.
 
 #include "Commands.hpp"
 #include "Described.hpp"
+#include "Screen.hpp"
 
 #include <algorithm>
 #include <cctype>
@@ -46,6 +47,45 @@ Json toJson(const std::string& name, const PluginReport& report)
         entry["message"] = report.message;
     }
     return entry;
+}
+
+/// What opens it, as it can stand behind "brenix read".
+std::string arguments(const std::string& device, const brenixcore::plugin::Found& found)
+{
+    std::string text = shellWord(device);
+    for (const auto& [name, value] : found.options) {
+        text += " -o " + shellWord(name + '=' + value);
+    }
+    return text;
+}
+
+Json toJson(const std::string& device, const brenixcore::plugin::Found& found)
+{
+    Json options = Json::object();
+    for (const auto& [name, value] : found.options) {
+        options[name] = value;
+    }
+    return {{"what", found.what},
+            {"options", options},
+            {"arguments", arguments(device, found)},
+            {"problem", found.problem}};
+}
+
+std::string printed(const std::string& device, const brenixcore::plugin::FindReport& report)
+{
+    std::string text;
+    for (const auto& found : report.found) {
+        text += arguments(device, found) + "\n  " + found.what + '\n' +
+                (found.problem.empty() ? "" : "  may not be opened: " + found.problem + '\n');
+    }
+    if (!report.message.empty()) {
+        text += device + ": cannot look: " + report.message + '\n';
+    } else if (!report.looks) {
+        text += device + ": does not look for anything\n";
+    } else if (report.found.empty()) {
+        text += device + ": nothing found\n";
+    }
+    return printable(text);
 }
 
 } // namespace
@@ -111,6 +151,45 @@ ExitCode checkPlugins(const Settings& settings)
             std::cout << name << ": a " << kindOf(report) << " that loads, " << report.path << '\n';
         } else {
             std::cout << name << ": " << report.problem << ": " << report.message << '\n';
+        }
+    }
+    if (settings.json) {
+        printJson(std::cout, list, 2);
+    }
+    return result;
+}
+
+ExitCode findDevices(const Settings& settings)
+{
+    const bool isNamed = !settings.plugins.empty();
+    Json list = Json::array();
+    ExitCode result = Success;
+    for (const std::string& name : isNamed ? settings.plugins : installedPlugins()) {
+        const PluginReport plugin =
+            brenixcore::plugin::inspectPlugin(name, isNamed ? "Device" : "");
+        brenixcore::plugin::FindReport report;
+        if (plugin.problem.empty()) {
+            report = brenixcore::plugin::findDevices(name);
+        } else {
+            report.message = plugin.message;
+        }
+        if (!report.message.empty()) {
+            result = Failed;
+        }
+        if (!isNamed && !report.looks && report.message.empty()) {
+            continue;
+        }
+        if (settings.json) {
+            Json entry = {{"device", name}, {"looks", report.looks}, {"found", Json::array()}};
+            for (const auto& found : report.found) {
+                entry["found"].push_back(toJson(name, found));
+            }
+            if (!report.message.empty()) {
+                entry["message"] = report.message;
+            }
+            list.push_back(entry);
+        } else {
+            std::cout << printed(name, report) << std::flush; // some look for a while
         }
     }
     if (settings.json) {

@@ -205,4 +205,12 @@ std::string quoted(const std::string& text, const char* escaped)
     return result + "'";
 }
 
+std::string shellWord(const std::string& text)
+{
+    const bool plain =
+        !text.empty() && text.find_first_not_of("abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQ"
+                                                "RSTUVWXYZ0123456789-_./:=,+") == std::string::npos;
+    return plain ? text : quoted(text, "'\\''");
+}
+
 } // namespace brenix

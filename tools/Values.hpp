@@ -43,6 +43,9 @@ std::string printElements(const ElementType& type, const Bytes& elements);
 /// A text between apostrophes; those in it become `escaped`.
 std::string quoted(const std::string& text, const char* escaped);
 
+/// A text as a word of a shell's command line.
+std::string shellWord(const std::string& text);
+
 } // namespace brenix
 
 #endif

@@ -7,7 +7,7 @@ _brenix() {
     local word=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]}
     local command=${COMP_WORDS[1]} words='' files=''
     case $previous in
-        brenix | */brenix) words='plugins check info read write scope keys --help --version' ;;
+        brenix | */brenix) words='plugins check find info read write scope keys --help --version' ;;
         -o | --option)
             # The options of the device, which stands right behind the command.
             words=$(brenix plugins "${COMP_WORDS[2]}" 2>/dev/null |

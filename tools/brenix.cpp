@@ -26,12 +26,7 @@ std::string commandLine(int count, char** arguments)
 {
     std::string line = "brenix";
     for (int i = 1; i < count; ++i) {
-        const std::string argument = arguments[i];
-        const bool plain =
-            !argument.empty() &&
-            argument.find_first_not_of("abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQ"
-                                       "RSTUVWXYZ0123456789-_./:=,+") == std::string::npos;
-        line += ' ' + (plain ? argument : quoted(argument, "'\\''"));
+        line += ' ' + shellWord(arguments[i]);
     }
     return line;
 }
@@ -124,7 +119,8 @@ void addEmit(CLI::App& command, Settings& settings)
 ExitCode run(Settings& settings, int count, char** arguments)
 {
     ExitCode result = Success;
-    CLI::App app("Lists and checks plug-ins, and reads and writes samples through a channel.",
+    CLI::App app("Lists and checks plug-ins, finds what they open, and reads and writes samples "
+                 "through a channel.",
                  "brenix");
     app.set_version_flag("--version", "brenix " BRENIX_VERSION);
     app.footer("Exit codes: 0 done, 1 an error or a plug-in that does not load, 2 wrong usage, 130 "
@@ -143,6 +139,10 @@ ExitCode run(Settings& settings, int count, char** arguments)
 
     command = add("check", "Tell why plug-ins do not load", checkPlugins);
     command->add_option("plugin", settings.plugins, "Plug-ins: names or paths")->required();
+
+    command = add("find", "List what is there that devices can be opened on", findDevices);
+    command->add_option("device", settings.plugins,
+                        "Device plug-ins (default: all that are installed)");
 
     command = add("info", "Show the properties and streams of a device", showInfo);
     addChannel(*command, settings.channel, inputLimit);

@@ -129,4 +129,24 @@ PluginReport inspectPlugin(const std::string& name, const std::string& kind)
     return report;
 }
 
+FindReport findDevices(const std::string& name)
+{
+    FindReport report;
+    std::optional<PluginLibrary> library; // outlives what the plug-in throws
+    try {
+        library.emplace(pluginPath(name));
+        library->requireAbiVersion();
+        report.looks = library->has("brenixcorePluginFind");
+        if (report.looks) {
+            library->function<void(std::vector<Found>&)>("brenixcorePluginFind")(report.found);
+        }
+    } catch (...) {
+        report.message = currentExceptionText();
+        if (report.message.empty()) {
+            report.message = "the reason is not known";
+        }
+    }
+    return report;
+}
+
 } // namespace brenixcore::plugin

@@ -1,5 +1,6 @@
 // A device that does what its options and commands say.
 
+#include "brenixcore/plugin/Find.hpp"
 #include "brenixcore/plugin/Make.hpp"
 #include "brenixcore/plugin/Options.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
@@ -270,6 +271,15 @@ private:
     std::vector<std::thread> threads;
 };
 
+/// Finds two things, and fails then.
+void findThings(std::vector<Found>& found)
+{
+    found.push_back({"two packets", {{"Packets", "2 3"}, {"FailIn", "it's"}}, ""});
+    found.push_back({"\x1b[31m", {}, "group none"});
+    throw OwnException();
+}
+
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Probe)
+BRENIXCORE_EXPORT_FIND(findThings)

@@ -4,6 +4,7 @@
 #ifndef BRENIXCORE_PLUGIN_INSPECT_HPP
 #define BRENIXCORE_PLUGIN_INSPECT_HPP
 
+#include "brenixcore/plugin/Find.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
 #include <string>
@@ -51,6 +52,17 @@ struct PluginReport {
 /// "Converter" or "Filter", a plug-in of another one has a problem, too. Throws only when memory runs out.
 BRENIXCORE_PLUGIN_SHARED PluginReport inspectPlugin(const std::string& name,
                                                     const std::string& kind = "");
+
+/// What a plug-in finds.
+struct FindReport {
+    bool looks = false;       ///< whether the plug-in can look at all
+    std::vector<Found> found; ///< in the order in which the plug-in tells
+    std::string message;      ///< why it could not look, or not to the end; empty when it could
+};
+
+/// Loads the plug-in of a path or a bare name, has it look and releases it. Takes as long as the plug-in does.
+/// Throws only when memory runs out.
+BRENIXCORE_PLUGIN_SHARED FindReport findDevices(const std::string& name);
 
 /// The folder of the bare names, with a slash at its end.
 BRENIXCORE_PLUGIN_SHARED std::string pluginFolder();
