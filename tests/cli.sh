@@ -245,7 +245,7 @@ while IFS='|' read -r words offered; do
     _brenix
     [[ ${COMPREPLY[*]} == "$offered" ]] || fail "completion of $words: ${COMPREPLY[*]}"
 done <<'END'
-read s|serial signal
+read si|signal
 read signal -c ''|columns identity
 read signal -f ''|decimate scale
 read signal -o F|Frequency= Frames=
