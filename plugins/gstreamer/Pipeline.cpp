@@ -1,0 +1,227 @@
+#include "Pipeline.hpp"
+
+#include <gst/app/gstappsink.h>
+#include <gst/app/gstappsrc.h>
+
+#include <atomic>
+#include <stdexcept>
+#include <thread>
+
+namespace gstreamer
+{
+
+namespace
+{
+
+constexpr const char* endName = "brenix-end";
+
+/// A change of state on a thread of its own, for it may wait for a device or for another machine, even for ever.
+/// The flag is set when it is done.
+std::shared_ptr<std::atomic<bool>> change(GstElement* pipeline, GstState state,
+                                          const std::shared_ptr<Signal>& signal)
+{
+    auto done = std::make_shared<std::atomic<bool>>(false);
+    std::thread([done, signal, state,
+                 held = Owned<GstElement>(GST_ELEMENT(gst_object_ref(pipeline)))]() mutable {
+        gst_element_set_state(held.get(), state);
+        held.reset();
+        *done = true;
+        signal->set();
+    }).detach();
+    return done;
+}
+
+void set(gpointer data)
+{
+    (*static_cast<std::shared_ptr<Signal>*>(data))->set();
+}
+
+GstBusSyncReply tell(GstBus* /*bus*/, GstMessage* /*message*/, gpointer data)
+{
+    set(data);
+    return GST_BUS_PASS;
+}
+
+void forget(gpointer data)
+{
+    delete static_cast<std::shared_ptr<Signal>*>(data);
+}
+
+} // namespace
+
+void prepare()
+{
+    static std::once_flag once;
+    std::call_once(once, [] {
+        gst_segtrap_set_enabled(FALSE); // signals are the program's
+        GError* error = nullptr;
+        if (gst_init_check(nullptr, nullptr, &error) == FALSE) {
+            const Owned<GError> owned(error);
+            throw std::runtime_error("GStreamer does not start: " +
+                                     std::string(error == nullptr ? "" : error->message));
+        }
+    });
+}
+
+Format formatOf(const GstCaps* caps)
+{
+    Format format;
+    const GstStructure* const structure = gst_caps_get_structure(caps, 0);
+    if (!gst_structure_has_name(structure, "audio/x-raw")) {
+        return format;
+    }
+    GstAudioInfo info;
+    gst_audio_info_init(&info);
+    if (gst_audio_info_from_caps(&info, caps) == FALSE) {
+        const Owned<char> text(gst_caps_to_string(caps));
+        throw std::runtime_error("Audio of these caps is not known: " + std::string(text.get()));
+    }
+    if (info.layout != GST_AUDIO_LAYOUT_INTERLEAVED) {
+        throw std::runtime_error(
+            "The channels of the audio are not interleaved: an audioconvert at "
+            "the end of Pipeline makes them so.");
+    }
+    const int width = GST_AUDIO_INFO_WIDTH(&info);
+    const bool isWhole = width == GST_AUDIO_INFO_DEPTH(&info) && width != 24;
+    if (GST_AUDIO_INFO_IS_FLOAT(&info)) {
+        format.type = bytes::findType(width == 32 ? "float" : "double");
+    } else if (!isWhole) {
+        format.type = bytes::findType("int32");
+        format.packed = info.finfo;
+    } else {
+        const std::string sign = GST_AUDIO_INFO_IS_SIGNED(&info) ? "int" : "uint";
+        format.type = bytes::findType(sign + std::to_string(width));
+    }
+    format.isAudio = true;
+    format.reverses = isWhole && width > 8 && GST_AUDIO_INFO_ENDIANNESS(&info) != G_BYTE_ORDER;
+    format.frameSize = static_cast<std::size_t>(GST_AUDIO_INFO_BPF(&info));
+    format.channels = static_cast<std::size_t>(GST_AUDIO_INFO_CHANNELS(&info));
+    format.rate = GST_AUDIO_INFO_RATE(&info);
+    return format;
+}
+
+Pipeline::Pipeline(const std::string& description, const std::string& caps, bool writes)
+    : isWritten(writes)
+{
+    const std::string end = endName;
+    const std::string text = writes ? "appsrc name=" + end + " ! " + description
+                                    : description + " ! appsink name=" + end;
+    GError* error = nullptr;
+    pipeline.reset(
+        gst_parse_launch_full(text.c_str(), nullptr, GST_PARSE_FLAG_FATAL_ERRORS, &error));
+    const Owned<GError> owned(error);
+    if (!pipeline || error != nullptr) {
+        throw std::invalid_argument(error == nullptr ? "is no pipeline" : error->message);
+    }
+    ours.reset(gst_bin_get_by_name(GST_BIN(pipeline.get()), endName));
+    if (!caps.empty()) {
+        const Owned<GstCaps> wanted(gst_caps_from_string(caps.c_str()));
+        g_object_set(ours.get(), "caps", wanted.get(), nullptr);
+    }
+    if (writes) {
+        g_object_set(ours.get(), "format", GST_FORMAT_TIME, "max-bytes", guint64{1} << 20, nullptr);
+        GstAppSrcCallbacks callbacks{};
+        callbacks.need_data = [](GstAppSrc* /*source*/, guint /*length*/, gpointer data) {
+            set(data);
+        };
+        gst_app_src_set_callbacks(GST_APP_SRC(ours.get()), &callbacks,
+                                  new std::shared_ptr<Signal>(told), forget);
+    } else {
+        g_object_set(ours.get(), "sync", FALSE, "drop", FALSE, "qos", FALSE, "max-buffers", 8,
+                     nullptr);
+        GstAppSinkCallbacks callbacks{};
+        callbacks.eos = [](GstAppSink* /*sink*/, gpointer data) { set(data); };
+        callbacks.new_sample = [](GstAppSink* /*sink*/, gpointer data) {
+            set(data);
+            return GST_FLOW_OK;
+        };
+        gst_app_sink_set_callbacks(GST_APP_SINK(ours.get()), &callbacks,
+                                   new std::shared_ptr<Signal>(told), forget);
+    }
+    const Owned<GstBus> bus(gst_element_get_bus(pipeline.get()));
+    gst_bus_set_sync_handler(bus.get(), tell, new std::shared_ptr<Signal>(told), forget);
+}
+
+Pipeline::~Pipeline()
+{
+    if (isRunning) {
+        stop();
+    }
+}
+
+void Pipeline::start()
+{
+    isRunning = true;
+    const auto end = std::chrono::steady_clock::now() + patience;
+    const auto done = change(pipeline.get(), GST_STATE_PLAYING, told);
+    for (;;) {
+        check();
+        // A pipeline that is written to has to wait for something written.
+        const bool isDone =
+            *done && (isWritten || gst_element_get_state(pipeline.get(), nullptr, nullptr, 0) !=
+                                       GST_STATE_CHANGE_ASYNC);
+        if (isDone || ended || std::chrono::steady_clock::now() >= end) {
+            check();
+            return;
+        }
+        told->wait(end);
+    }
+}
+
+bool Pipeline::stop()
+{
+    isRunning = false;
+    const auto end = std::chrono::steady_clock::now() + patience;
+    const auto done = change(pipeline.get(), GST_STATE_NULL, told);
+    while (!*done && std::chrono::steady_clock::now() < end) {
+        told->wait(end);
+    }
+    if (!*done) { // its thread has the last reference, and releases it if it ever can
+        ours.reset();
+        pipeline.reset();
+        return false;
+    }
+    return true;
+}
+
+void Pipeline::look()
+{
+    const Owned<GstBus> bus(gst_element_get_bus(pipeline.get()));
+    for (;;) {
+        const Owned<GstMessage> message(gst_bus_pop(bus.get()));
+        if (!message) {
+            return;
+        }
+        if (GST_MESSAGE_TYPE(message.get()) == GST_MESSAGE_EOS) {
+            ended = true;
+        } else if (GST_MESSAGE_TYPE(message.get()) == GST_MESSAGE_ERROR && problem.empty()) {
+            GError* error = nullptr;
+            char* detail = nullptr;
+            gst_message_parse_error(message.get(), &error, &detail);
+            const Owned<GError> ownedError(error);
+            const Owned<char> ownedDetail(detail);
+            problem = std::string(GST_MESSAGE_SRC_NAME(message.get())) + ": " + error->message;
+            if (detail != nullptr) { // its last line says what the system said
+                const std::string all = detail;
+                const auto last = all.find_last_of('\n');
+                problem += " (" + all.substr(last == std::string::npos ? 0 : last + 1) + ")";
+            }
+        }
+    }
+}
+
+void Pipeline::check()
+{
+    look();
+    if (!problem.empty()) {
+        throw std::runtime_error(problem);
+    }
+}
+
+bool Pipeline::hasEnded()
+{
+    check();
+    return ended;
+}
+
+} // namespace gstreamer
