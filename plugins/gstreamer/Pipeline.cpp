@@ -131,10 +131,13 @@ Pipeline::Pipeline(const std::string& description, const std::string& caps, bool
                      nullptr);
         GstAppSinkCallbacks callbacks{};
         callbacks.eos = [](GstAppSink* /*sink*/, gpointer data) { set(data); };
-        callbacks.new_sample = [](GstAppSink* /*sink*/, gpointer data) {
+        const auto arrive = [](GstAppSink* /*sink*/, gpointer data) {
+            (*static_cast<std::shared_ptr<Signal>*>(data))->hasData = true;
             set(data);
             return GST_FLOW_OK;
         };
+        callbacks.new_preroll = arrive;
+        callbacks.new_sample = arrive;
         gst_app_sink_set_callbacks(GST_APP_SINK(ours.get()), &callbacks,
                                    new std::shared_ptr<Signal>(told), forget);
     }
@@ -155,13 +158,16 @@ void Pipeline::start()
     const auto end = std::chrono::steady_clock::now() + patience;
     const auto done = change(pipeline.get(), GST_STATE_PLAYING, told);
     for (;;) {
+        look();
+        if (told->hasData) { // what fails from here on fails behind what came
+            return;
+        }
         check();
         // A pipeline that is written to has to wait for something written.
         const bool isDone =
             *done && (isWritten || gst_element_get_state(pipeline.get(), nullptr, nullptr, 0) !=
                                        GST_STATE_CHANGE_ASYNC);
         if (isDone || ended || std::chrono::steady_clock::now() >= end) {
-            check();
             return;
         }
         told->wait(end);

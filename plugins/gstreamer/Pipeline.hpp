@@ -7,6 +7,7 @@
 #include <gst/audio/audio.h>
 #include <gst/gst.h>
 
+#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <memory>
@@ -66,6 +67,8 @@ public:
         changed.wait_until(lock, end, [this] { return isSet; });
         isSet = false;
     }
+
+    std::atomic<bool> hasData = false; ///< whether a buffer has come to our end
 
 private:
     std::mutex mutex;
