@@ -2,6 +2,7 @@
 // written is sent.
 
 #include "ByteDevice.hpp"
+#include "SerialPorts.hpp"
 
 #include <linux/serial.h>
 #include <sys/ioctl.h>
@@ -173,6 +174,7 @@ constexpr PropertyInfo propertyTable[] = {
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Serial)
+BRENIXCORE_EXPORT_FIND(serial::findPorts)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
 BRENIXCORE_DESCRIBE_FIELDS(elementFields, elementFields)

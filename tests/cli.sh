@@ -73,6 +73,7 @@ done <<END
 0|Frequency: 1000 Hz|info signal -o Frequency:int32=1000 -o Waveform:char=sine -o Pace=fast -o Channels=1
 1|Custom property: Foo not found|info signal -p Foo:double
 2|{"error":{"id":"","message":"The following argument was not expected: --nonsense|info signal --json --nonsense
+0|serial|find
 0|signal: does not look for anything|find signal
 1|scale: cannot look: it is a filter and no device|find scale
 1|probe.so: cannot look: Unrecognized error.|find $plugins/probe.so
