@@ -15,6 +15,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <stdexcept>
 #include <string>
@@ -69,7 +70,7 @@ public:
     void open(const PropertyMap& options) override
     {
         Options(options).requireAllKnown();
-        card.emplace(settings);
+        card = std::make_shared<alsa::Card>(settings);
         if (card->rate() != rate) {
             const auto now = std::to_string(card->rate());
             card.reset();
@@ -88,21 +89,41 @@ public:
     {
         const alsa::Event::Use use(event, streams);
         if (settings.plays) {
-            alsa::Playback(*card, settings, *host, streams, event).run();
+            const auto playback =
+                std::make_shared<alsa::Playback>(card, settings, *host, streams, event);
+            try {
+                card->run([playback] { playback->work(); });
+            } catch (const std::exception& error) {
+                throw std::runtime_error(error.what() + playback->notPlayed());
+            }
         } else {
-            alsa::Capture(*card, settings, *host, streams, event).run();
+            const auto capture =
+                std::make_shared<alsa::Capture>(card, settings, *host, streams, event);
+            try {
+                card->run([capture] { capture->work(); });
+            } catch (const std::exception&) {
+                capture->fail();
+                throw;
+            }
         }
     }
 
     void wake() noexcept override { event.wake(); }
 
-    void close() override { card.reset(); }
+    void close() override
+    {
+        const std::shared_ptr<alsa::Card> last = std::move(card);
+        if (last.use_count() == 1 && !last->close()) { // or else what was left behind closes it
+            throw std::runtime_error("Card " + settings.name +
+                                     " does not close, and is left to itself.");
+        }
+    }
 
 private:
     DeviceHost* host = nullptr;
     alsa::Settings settings;
     unsigned int rate = 0; ///< of the card, at init
-    std::optional<alsa::Card> card;
+    std::shared_ptr<alsa::Card> card;
     alsa::Event event;
 };
 

@@ -2,6 +2,7 @@
 // loopback addresses, pseudo-terminals and files.
 
 #include "Driver.hpp"
+#include "Process.hpp"
 
 #include <asio.hpp>
 
@@ -43,22 +44,13 @@ const std::string lost = "brenix:Device:dataLost|";
 const std::string file = testing::TempDir() + "peer-" + std::to_string(getpid());
 
 /// A running program that may write the file.
-struct Program {
-    explicit Program(const std::string& command) : id(fork())
-    {
-        if (id == 0) {
-            execl("/bin/sh", "sh", "-c", ("exec " + command).c_str(), nullptr);
-            _exit(127);
-        }
-    }
+struct Program : Process {
+    using Process::Process;
     ~Program()
     {
-        kill(id, SIGKILL);
-        waitpid(id, nullptr, 0);
+        end();
         std::remove(file.c_str());
     }
-
-    pid_t id;
 };
 
 int init(Channel& channel, const char* type, int at = port, const char* order = "little")

@@ -4,7 +4,7 @@
 
 #include <algorithm>
 #include <chrono>
-#include <exception>
+#include <cstring>
 #include <utility>
 
 namespace alsa
@@ -28,29 +28,36 @@ std::int64_t sinceEpoch()
 
 } // namespace
 
-Capture::Capture(Card& ownCard, const Settings& what, DeviceHost& deviceHost,
+Capture::Capture(std::shared_ptr<Card> ownCard, const Settings& what, DeviceHost& deviceHost,
                  DeviceStreams& itsStreams, Event& wakeUp)
-    : card(ownCard), blockSize(static_cast<snd_pcm_sframes_t>(what.blockSize)),
+    : shared(std::move(ownCard)), card(*shared),
+      blockSize(static_cast<snd_pcm_sframes_t>(what.blockSize)),
       mostKept(card.bufferSize() - std::max(card.bufferSize() / 4, blockSize)),
       channels(what.channels), type(*bytes::findType(what.format.name)), host(deviceHost),
       streams(itsStreams), event(wakeUp)
 {
 }
 
-void Capture::run()
+void Capture::fail()
 {
-    try {
-        capture();
-    } catch (const std::exception&) {
-        endBlock();
-        if (waiting) {
-            streams.push(std::move(*waiting)); // there is time now
-        }
-        throw;
+    if (waiting) {
+        streams.push(std::move(*waiting)); // there is time now
+    }
+    if (filled >
+        0) { // copied: a call that was left behind may still write to what follows in the block
+        const auto samples = static_cast<std::size_t>(filled * channels);
+        auto part = type.make(samples);
+        std::memcpy(type.find(part.get())->data(), type.find(block.get())->data(),
+                    samples * type.size);
+        Packet packet;
+        packet.counts = static_cast<std::uint64_t>(filled);
+        packet.time = blockTime;
+        setField(packet, std::move(part));
+        streams.push(std::move(packet));
     }
 }
 
-void Capture::capture()
+void Capture::work()
 {
     card.start();
     while (!streams.isClosing()) {

@@ -8,6 +8,7 @@
 #include "brenixcore/plugin/Plugin.hpp"
 
 #include <cstdint>
+#include <memory>
 #include <optional>
 
 namespace alsa
@@ -18,10 +19,15 @@ namespace alsa
 class Capture
 {
 public:
-    Capture(Card& ownCard, const Settings& what, brenixcore::plugin::DeviceHost& deviceHost,
+    Capture(std::shared_ptr<Card> ownCard, const Settings& what,
+            brenixcore::plugin::DeviceHost& deviceHost,
             brenixcore::plugin::DeviceStreams& itsStreams, Event& wakeUp);
 
-    void run();
+    /// Works until the channel closes.
+    void work();
+
+    /// Pushes what came before the work has failed or was left behind.
+    void fail();
 
 private:
     /// How far the card has come.
@@ -30,7 +36,6 @@ private:
         std::int64_t frames; ///< since the start
     };
 
-    void capture();
     void restart();
     void passOverLost(const Moment& now);
     void compareClock(const Moment& now);
@@ -43,6 +48,7 @@ private:
     void lose(std::int64_t frames, const char* reason);
     void tellLost(std::uint64_t frames, const char* reason);
 
+    const std::shared_ptr<Card> shared;
     Card& card;
     const snd_pcm_sframes_t blockSize;
     const snd_pcm_sframes_t mostKept; ///< frames that may wait in the card

@@ -5,11 +5,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <ctime>
-#include <future>
 #include <optional>
 #include <stdexcept>
-#include <thread>
-#include <tuple>
 #include <utility>
 
 namespace alsa
@@ -25,34 +22,11 @@ std::int64_t nanosecondsOf(const timespec& time)
     return static_cast<std::int64_t>(time.tv_sec) * second + time.tv_nsec;
 }
 
-/// Calls what waits for a sound server, and waits no longer than the limit for it. Returns whether there is a
-/// result, or throws what the call threw. A call that has not returned goes on alone.
-template <typename Result>
-std::optional<Result> callWithin(std::chrono::nanoseconds limit, std::function<Result()> call)
-{
-    std::packaged_task<Result()> task(std::move(call));
-    std::future<Result> result = task.get_future();
-    std::thread thread(std::move(task));
-    if (result.wait_for(limit) == std::future_status::timeout) {
-        thread.detach();
-        return std::nullopt;
-    }
-    thread.join();
-    return result.get();
-}
-
 } // namespace
-
-std::int64_t steadyTime()
-{
-    timespec now{};
-    ::clock_gettime(CLOCK_MONOTONIC, &now);
-    return nanosecondsOf(now);
-}
 
 Card::Card(const Settings& settings) : name(settings.name)
 {
-    auto result = callWithin<Opened>(patience, [settings] { return open(settings); });
+    auto result = callWithPatience<Opened>([settings] { return open(settings); });
     if (!result) {
         throw std::runtime_error("Could not open card " + name + ": it does not answer.");
     }
@@ -64,33 +38,31 @@ Card::Card(const Settings& settings) : name(settings.name)
 
 Card::~Card()
 {
-    if (hangs) {
-        std::ignore = opened.pcm.release(); // it stays with the call
-        return;
-    }
     try {
-        within(patience, [pcm = opened.pcm.release()] {
-            ClosePcm()(pcm);
-            return 0;
-        });
+        close();
     } catch (...) { // there is no thread to be had: it stays open
     }
 }
 
-int Card::within(std::chrono::nanoseconds limit, std::function<int()> call)
+bool Card::close()
 {
-    const std::optional<int> result = callWithin<int>(limit, std::move(call));
-    hangs = !result;
-    return result.value_or(-ETIMEDOUT);
+    return !opened.pcm || callWithPatience<bool>([pcm = opened.pcm.release()] {
+        ClosePcm()(pcm);
+        return true;
+    });
+}
+
+void Card::run(const std::function<void()>& work)
+{
+    if (!watch.run(work)) {
+        throw std::runtime_error("Card " + name + " does not answer.");
+    }
 }
 
 snd_pcm_sframes_t Card::require(snd_pcm_sframes_t result) const
 {
     if (result == -ENODEV) {
         throw std::runtime_error("Card " + name + " is gone: " + ::snd_strerror(-ENODEV) + ".");
-    }
-    if (result == -ETIMEDOUT) {
-        throw std::runtime_error("Card " + name + " does not answer.");
     }
     if (result < 0) {
         throw std::runtime_error("Card " + name +
@@ -116,7 +88,7 @@ std::int64_t Card::timeOf(std::int64_t frames) const
 
 Moment Card::look()
 {
-    require(::snd_pcm_status(opened.pcm.get(), status.get()));
+    require(watch.call([&] { return ::snd_pcm_status(opened.pcm.get(), status.get()); }));
     snd_htimestamp_t time{};
     ::snd_pcm_status_get_htstamp(status.get(), &time);
     const Moment now{::snd_pcm_status_get_state(status.get()),
@@ -128,46 +100,54 @@ Moment Card::look()
 
 void Card::start()
 {
-    require(within(patience, [pcm = opened.pcm.get()] { return ::snd_pcm_start(pcm); }));
-    clocked = ::snd_pcm_avail_update(opened.pcm.get()) != bufferSize();
+    auto* const pcm = opened.pcm.get();
+    require(watch.call([pcm] { return ::snd_pcm_start(pcm); }));
+    clocked = watch.call([pcm] { return ::snd_pcm_avail_update(pcm); }) != bufferSize();
 }
 
 void Card::prepare()
 {
-    require(within(patience, [pcm = opened.pcm.get()] { return ::snd_pcm_prepare(pcm); }));
+    require(watch.call([&] { return ::snd_pcm_prepare(opened.pcm.get()); }));
 }
 
-snd_pcm_sframes_t Card::moved(snd_pcm_sframes_t result) const
+/// Moves frames by one of libasound's functions.
+template <typename Function, typename... Frames>
+snd_pcm_sframes_t Card::move(Function function, snd_pcm_sframes_t count, Frames... frames)
 {
+    const auto result = watch.call([&] {
+        return function(opened.pcm.get(), frames..., static_cast<snd_pcm_uframes_t>(count));
+    });
     const bool isNone = result == -EAGAIN || result == -EPIPE || result == -ESTRPIPE;
     return isNone ? 0 : require(result);
 }
 
 snd_pcm_sframes_t Card::read(void* frames, snd_pcm_sframes_t count)
 {
-    return moved(::snd_pcm_readi(opened.pcm.get(), frames, static_cast<snd_pcm_uframes_t>(count)));
+    return move(::snd_pcm_readi, count, frames);
 }
 
 snd_pcm_sframes_t Card::write(const void* frames, snd_pcm_sframes_t count)
 {
-    return moved(::snd_pcm_writei(opened.pcm.get(), frames, static_cast<snd_pcm_uframes_t>(count)));
+    return move(::snd_pcm_writei, count, frames);
 }
 
 snd_pcm_sframes_t Card::skip(snd_pcm_sframes_t count)
 {
-    return moved(::snd_pcm_forward(opened.pcm.get(), static_cast<snd_pcm_uframes_t>(count)));
+    return move(::snd_pcm_forward, count);
 }
 
 bool Card::wait(int event, bool forCard, int milliseconds)
 {
     auto* const pcm = opened.pcm.get();
-    const int count =
-        forCard ? static_cast<int>(require(::snd_pcm_poll_descriptors_count(pcm))) : 0;
+    const auto calls = [&](auto function, auto... arguments) {
+        return require(watch.call([&] { return function(pcm, arguments...); }));
+    };
+    const auto count = forCard ? calls(::snd_pcm_poll_descriptors_count) : 0;
     descriptors.resize(1 + static_cast<std::size_t>(count));
     descriptors[0] = {event, POLLIN, 0};
     const auto own = static_cast<unsigned int>(count);
     if (forCard) {
-        require(::snd_pcm_poll_descriptors(pcm, &descriptors[1], own));
+        calls(::snd_pcm_poll_descriptors, &descriptors[1], own);
     }
     ::poll(descriptors.data(), descriptors.size(), milliseconds);
     if (descriptors[0].revents != 0) {
@@ -176,7 +156,7 @@ bool Card::wait(int event, bool forCard, int milliseconds)
     }
     unsigned short happened = 0;
     if (forCard) {
-        require(::snd_pcm_poll_descriptors_revents(pcm, &descriptors[1], own, &happened));
+        calls(::snd_pcm_poll_descriptors_revents, &descriptors[1], own, &happened);
     }
     return (happened & (POLLIN | POLLOUT)) != 0;
 }
@@ -203,13 +183,12 @@ snd_pcm_sframes_t Card::drain(int event)
         const bool isPlayed = now.delay <= 0 && now.avail >= bufferSize() - periodSize();
         return now.hasStopped() || isPlayed ? 0 : left();
     }
-    auto* const pcm = opened.pcm.get();
-    ::snd_pcm_nonblock(pcm, 0);
-    const int result =
-        within(std::chrono::nanoseconds(limit), [pcm] { return ::snd_pcm_drain(pcm); });
-    if (result == -ETIMEDOUT) {
-        return left();
-    }
+    const int result = watch.call(
+        [pcm = opened.pcm.get()] {
+            ::snd_pcm_nonblock(pcm, 0);
+            return ::snd_pcm_drain(pcm);
+        },
+        std::chrono::nanoseconds(limit));
     if (result != -EPIPE) { // which it has when all is played
         require(result);
     }

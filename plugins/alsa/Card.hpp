@@ -3,6 +3,7 @@
 #define BRENIX_PLUGINS_ALSA_CARD_HPP
 
 #include "Open.hpp"
+#include "Watch.hpp"
 
 #include <alsa/asoundlib.h>
 #include <poll.h>
@@ -16,9 +17,6 @@
 
 namespace alsa
 {
-
-/// How long a card, or the sound server behind it, may take for what it should do at once.
-constexpr std::chrono::seconds patience{3};
 
 /// A card at one time.
 struct Moment {
@@ -34,10 +32,8 @@ struct Moment {
     }
 };
 
-/// Nanoseconds, by the clock that cards go by.
-std::int64_t steadyTime();
-
-/// Its operations throw a std::runtime_error that names the card when it fails.
+/// Its operations throw a std::runtime_error that names the card when it fails. Those that move frames, and those that
+/// tell of the card, are for the work of run() alone.
 class Card
 {
 public:
@@ -45,8 +41,16 @@ public:
     explicit Card(const Settings& settings);
     Card(const Card&) = delete;
     Card& operator=(const Card&) = delete;
-    /// Closes it; what is not played is dropped.
+    /// Closes it, if that was not done.
     ~Card();
+
+    /// Closes it; what is not played is dropped. Returns whether it is closed, or else is left to itself, as it does
+    /// not answer.
+    bool close();
+
+    /// Runs work on a thread of its own and throws what it throws. Where the card does not answer, throws that and
+    /// leaves the work behind: that must share all it uses, the card, too.
+    void run(const std::function<void()>& work);
 
     unsigned int rate() const { return opened.rate; }
     snd_pcm_sframes_t bufferSize() const { return snd_pcm_sframes_t(opened.bufferSize); }
@@ -84,20 +88,20 @@ public:
     /// Frames that it has got and not played.
     snd_pcm_sframes_t left();
 
-    /// Waits until all is played, with an event that it may use up, as long as that should take and the patience. Returns how many frames were
-    /// not.
+    /// Waits until all is played, with an event that it may use up, as long as that should take and the patience.
+    /// Returns how many frames were not.
     snd_pcm_sframes_t drain(int event);
 
 private:
     bool isPlugin() const;
-    int within(std::chrono::nanoseconds limit, std::function<int()> call);
     snd_pcm_sframes_t require(snd_pcm_sframes_t result) const;
-    snd_pcm_sframes_t moved(snd_pcm_sframes_t result) const;
+    template <typename Function, typename... Frames>
+    snd_pcm_sframes_t move(Function function, snd_pcm_sframes_t count, Frames... frames);
 
     const std::string name;
     Opened opened;
+    Watch watch;
     bool clocked = true;
-    bool hangs = false; ///< in a call
     std::vector<pollfd> descriptors;
     std::unique_ptr<snd_pcm_status_t, decltype(&::snd_pcm_status_free)> status{
         nullptr, &::snd_pcm_status_free};

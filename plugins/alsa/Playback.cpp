@@ -13,20 +13,26 @@ namespace alsa
 
 using namespace brenixcore::plugin;
 
-Playback::Playback(Card& ownCard, const Settings& what, DeviceHost& deviceHost,
+Playback::Playback(std::shared_ptr<Card> ownCard, const Settings& what, DeviceHost& deviceHost,
                    DeviceStreams& itsStreams, Event& wakeUp)
-    : card(ownCard), name(what.name), channels(what.channels),
+    : shared(std::move(ownCard)), card(*shared), name(what.name), channels(what.channels),
       type(*bytes::findType(what.format.name)), frameSize(channels * type.size), host(deviceHost),
       streams(itsStreams), event(wakeUp)
 {
 }
 
-void Playback::run()
+void Playback::work()
 {
     try {
         play();
-    } catch (const std::exception& error) {
-        throw std::runtime_error(error.what() + notPlayed());
+    } catch (const std::exception&) {
+        if (running) {
+            try {
+                left = card.left();
+            } catch (const std::exception&) { // it is gone
+            }
+        }
+        throw;
     }
 }
 
@@ -169,8 +175,9 @@ void Playback::finish()
     if (!running && written > 0) {
         start();
     }
-    if (std::exchange(running, false)) {
+    if (running) {
         written = card.drain(event.handle());
+        running = false;
         if (written > 0) {
             throw std::runtime_error("Card " + name + " does not play on.");
         }
@@ -182,17 +189,10 @@ void Playback::finish()
     }
 }
 
-/// A sentence on what is left after a failure, if anything is.
 std::string Playback::notPlayed()
 {
-    std::int64_t inCard = written;
-    if (running) {
-        try {
-            inCard = card.left();
-        } catch (const std::exception&) { // it is gone: by the clock
-            inCard = std::max<std::int64_t>(card.framesIn(end - steadyTime()), 0);
-        }
-    }
+    const std::int64_t byClock = std::max<std::int64_t>(card.framesIn(end - steadyTime()), 0);
+    const std::int64_t inCard = running ? left.value_or(byClock) : written;
     const std::uint64_t frames = static_cast<std::uint64_t>(inCard) + rest.size() / frameSize +
                                  discardOutput(streams) / channels;
     return frames == 0 ? std::string() : ' ' + std::to_string(frames) + " frames were not played.";

@@ -10,6 +10,8 @@
 #include <asio/buffer.hpp>
 
 #include <cstdint>
+#include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -20,10 +22,15 @@ namespace alsa
 class Playback
 {
 public:
-    Playback(Card& ownCard, const Settings& what, brenixcore::plugin::DeviceHost& deviceHost,
+    Playback(std::shared_ptr<Card> ownCard, const Settings& what,
+             brenixcore::plugin::DeviceHost& deviceHost,
              brenixcore::plugin::DeviceStreams& itsStreams, Event& wakeUp);
 
-    void run();
+    /// Works until the channel closes and all is played.
+    void work();
+
+    /// After the work has failed or was left behind: a sentence on what was not played, if anything is.
+    std::string notPlayed();
 
 private:
     void play();
@@ -33,10 +40,10 @@ private:
     void start();
     void await(bool closing);
     void finish();
-    std::string notPlayed();
 
+    const std::shared_ptr<Card> shared;
     Card& card;
-    const std::string& name;
+    const std::string name;
     const std::size_t channels;
     const bytes::ElementType& type;
     const std::size_t frameSize; ///< bytes
@@ -51,7 +58,9 @@ private:
     asio::const_buffer rest;           ///< of what is not written yet
 
     bool running = false;
-    std::int64_t written = 0;   ///< frames that the card has got while it does not run
+    std::int64_t written = 0; ///< frames that the card has got while it does not run
+    std::optional<std::int64_t>
+        left;                   ///< frames that the card had got and not played as the work failed
     std::int64_t lastWrite = 0; ///< when it took frames
     std::int64_t end = 0;       ///< when all is played that it has got
     bool ranDry = false;        ///< and has not started again

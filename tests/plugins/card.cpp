@@ -13,6 +13,8 @@
 
 extern std::atomic<long> cardAhead; ///< frames that it hears at once, besides
 extern std::atomic<int> cardState;  ///< other than running, if any
+extern std::atomic<bool> cardHangs; ///< when it is read
+extern std::atomic<int> cardsOpen;
 
 namespace
 {
@@ -46,6 +48,9 @@ snd_pcm_sframes_t pointer(snd_pcm_ioplug_t* io)
 snd_pcm_sframes_t transfer(snd_pcm_ioplug_t* io, const snd_pcm_channel_area_t* areas,
                            snd_pcm_uframes_t offset, snd_pcm_uframes_t size)
 {
+    while (cardHangs) {
+        usleep(1000);
+    }
     auto* const samples = static_cast<std::int32_t*>(areas->addr) + offset;
     for (snd_pcm_uframes_t i = 0; i < size; ++i) {
         samples[i] = static_cast<std::int32_t>(static_cast<Card*>(io)->first +
@@ -66,6 +71,7 @@ int close(snd_pcm_ioplug_t* io)
 {
     ::close(io->poll_fd);
     delete static_cast<Card*>(io);
+    --cardsOpen;
     return 0;
 }
 
@@ -77,6 +83,7 @@ SND_PCM_PLUGIN_DEFINE_FUNC(card)
     static_cast<void>(root);
     static_cast<void>(conf);
     auto* const card = new Card();
+    ++cardsOpen;
     card->calls.start = start;
     card->calls.stop = [](snd_pcm_ioplug_t*) { return 0; };
     card->calls.pointer = pointer;
