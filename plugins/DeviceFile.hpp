@@ -25,15 +25,10 @@ inline std::string groupName(gid_t id)
     return found == nullptr ? std::to_string(id) : found->gr_name;
 }
 
-/// What tells a user how to become a member of a group.
-inline std::string joinGroup(const std::string& name)
-{
-    return "sudo usermod -aG " + name + " $USER, then log in again";
-}
-
-/// Why this process may not read and write a file, and what would help, in a line; empty when it may. The path is
-/// the one to tell, which is looked for below the root.
-inline std::string problem(const std::string& path, const std::string& root = "")
+/// Why this process may not read and write a file, and what would help, in a line, where the files of its kind usually
+/// are for a group; empty when it may. The path is the one to tell, which is looked for below the root.
+inline std::string problem(const std::string& path, const std::string& usualGroup,
+                           const std::string& root = "")
 {
     const std::string file = root + path;
     if (::faccessat(AT_FDCWD, file.c_str(), R_OK | W_OK, AT_EACCESS) == 0) {
@@ -46,12 +41,13 @@ inline std::string problem(const std::string& path, const std::string& root = ""
         const std::string name = groupName(status.st_gid);
         const mode_t both = S_IRGRP | S_IWGRP;
         if ((status.st_mode & both) == both && status.st_gid != 0) {
-            return path + " is for group " + name + ": " + joinGroup(name);
+            return path + " is for group " + name + ": sudo usermod -aG " + name +
+                   " $USER, then log in again";
         }
         return path +
                " is for its owner alone: a rule of udev can give it to a group, such as "
                "KERNEL==\"" +
-               path.substr(path.rfind('/') + 1) + "\", GROUP=\"dialout\", MODE=\"0660\"";
+               path.substr(path.rfind('/') + 1) + "\", GROUP=\"" + usualGroup + "\", MODE=\"0660\"";
     }
     return path + ": " + std::generic_category().message(error) +
            (error == ENOENT ? "; a container has to be given it" : "");

@@ -59,7 +59,7 @@ inline void findPorts(std::vector<brenixcore::plugin::Found>& found, const std::
     for (const fs::path& port : ports) {
         const std::string name = port.filename();
         const std::string what = portName(port / "device");
-        const std::string problem = devicefile::problem("/dev/" + name, root);
+        const std::string problem = devicefile::problem("/dev/" + name, "dialout", root);
         const auto [first, last] = idsOf.equal_range(name);
         for (auto id = first; id != last; ++id) {
             found.push_back({what + ", now " + name, {{"Port", ids + id->second}}, problem});

@@ -4,6 +4,7 @@
 #include "alsa/Capture.hpp"
 #include "alsa/Card.hpp"
 #include "alsa/Event.hpp"
+#include "alsa/Find.hpp"
 #include "alsa/Playback.hpp"
 
 #include "Elements.hpp"
@@ -158,6 +159,7 @@ constexpr FieldInfo outputFields[] = {{dataField, "(SampleFormat)", "", "the sam
 } // namespace
 
 BRENIXCORE_EXPORT_DEVICE(Alsa)
+BRENIXCORE_EXPORT_FIND(alsa::findCards)
 BRENIXCORE_DESCRIBE_OPTIONS(optionTable)
 BRENIXCORE_DESCRIBE_PROPERTIES(propertyTable)
 BRENIXCORE_DESCRIBE_FIELDS(inputFields, outputFields)

@@ -3,8 +3,10 @@
 
 #include "Driver.hpp"
 #include "Process.hpp"
+#include "brenixcore/plugin/Inspect.hpp"
 
 #include <alsa/asoundlib.h>
+#include <gmock/gmock.h>
 
 #include <algorithm>
 #include <array>
@@ -54,17 +56,18 @@ class Surroundings : public testing::Environment
     {
         std::filesystem::create_directory(folder);
         const std::string null = "slave.pcm null file ";
-        save(folder + "pcms", "</usr/share/alsa/alsa.conf>\n"
-                              "pcm.record { type file " +
-                                  null + "\"" + file +
-                                  "\" }\n"
-                                  "pcm.replay { type file " +
-                                  null + "/dev/null infile \"" + file +
-                                  "\" }\n"
-                                  "pcm_type.card { lib \"" TEST_CARD
-                                  "\" }\npcm.card { type card }\n"
-                                  "pcm.server { type pulse server \"unix:" +
-                                  folder + "socket\" }\n");
+        save(folder + "pcms",
+             "</usr/share/alsa/alsa.conf>\n"
+             "pcm.record { type file " +
+                 null + "\"" + file +
+                 "\" }\n"
+                 "pcm.replay { type file " +
+                 null + "/dev/null infile \"" + file +
+                 "\" }\n"
+                 "pcm_type.card { lib \"" TEST_CARD "\" }\npcm.card { type card }\n"
+                 "pcm.server { type pulse hint { description \"It's\na server\" } server "
+                 "\"unix:" +
+                 folder + "socket\" }\n");
         setenv("ALSA_CONFIG_PATH", (folder + "pcms").c_str(), 1);
         save(folder + "server.pa",
              "load-module module-native-protocol-unix auth-anonymous=1 socket=" + folder +
@@ -330,6 +333,19 @@ TEST(AlsaTest, WhatACardDoesNotHaveIsRefused)
     EXPECT_EQ(channel.close(), 1);
     EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|The last frame for card record has 1 of "
                                     "2 samples and was not played.");
+}
+
+TEST(AlsaTest, WhatIsListedIsFound)
+{
+    std::vector<std::string> lines;
+    for (const auto& [what, options, problem] : brenixcore::plugin::findDevices("alsa").found) {
+        lines.push_back(what);
+        for (const auto& [name, value] : options) {
+            lines.back() += "|" + name + "=" + value;
+        }
+    }
+    EXPECT_THAT(lines, testing::IsSupersetOf({"It's, a server: captures|Card=server",
+                                              "It's, a server: plays|Card=server|Mode=write"}));
 }
 
 TEST(AlsaServerTest, WhatIsPlayedIsCaptured)
