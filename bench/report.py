@@ -147,6 +147,11 @@ def stream_rows(report):
         what = "a plain loop of read()" if peer == "read" else "socat"
         report.row("brenix read tcp, 1.5 GB: processor time", what, report.combine(
             lambda ours, theirs: ours / theirs, "tcp:tcp/ours", f"tcp:tcp/{peer}"), " x", limit)
+    if report.has("alsa:alsa/ours"):
+        report.row("capturing by alsa to a pipe, 8 channels: processor time", "arecord", report.combine(
+            lambda ours, theirs: ours / theirs, "alsa:alsa/ours", "alsa:alsa/arecord"), " x", 1.5)
+    else:
+        report.left_out("capturing by alsa to a pipe, 8 channels: processor time", "arecord")
     report.row("channel, from create to destroy", "",
                [time / 1e6 for time in report.figures["two:channel/cycle"]], " ms", 1)
     report.row("idle channel of 1,000, resident with its thread's stack", "",

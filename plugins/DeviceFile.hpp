@@ -47,7 +47,8 @@ inline std::string problem(const std::string& path, const std::string& usualGrou
         return path +
                " is for its owner alone: a rule of udev can give it to a group, such as "
                "KERNEL==\"" +
-               path.substr(path.rfind('/') + 1) + "\", GROUP=\"" + usualGroup + "\", MODE=\"0660\"";
+               path.substr(path.rfind('/') + 1) + R"(", GROUP=")" + usualGroup +
+               R"(", MODE="0660")";
     }
     return path + ": " + std::generic_category().message(error) +
            (error == ENOENT ? "; a container has to be given it" : "");

@@ -175,13 +175,16 @@ snd_pcm_sframes_t Card::drain(int event)
     if (clocked && isPlugin()) { // PulseAudio's may hang when it is drained after it has run dry
         const std::int64_t latest = now.time + limit;
         constexpr int soon = 10; // milliseconds
+        std::int64_t end = now.time;
         while (!now.hasStopped() && now.avail < bufferSize() && now.time < latest) {
+            end = now.time + timeOf(now.delay);
             wait(event, false, soon);
             now = look();
         }
-        // One that does not stop has, by now, played what it has not asked for anew: up to a period.
-        const bool isPlayed = now.delay <= 0 && now.avail >= bufferSize() - periodSize();
-        return now.hasStopped() || isPlayed ? 0 : left();
+        while (now.hasStopped() && steadyTime() < std::min(end, latest)) {
+            wait(event, false, soon); // the server has got all, and is to play it
+        }
+        return now.hasStopped() || hasRunDry(now) ? 0 : left();
     }
     const int result = watch.call(
         [pcm = opened.pcm.get()] {

@@ -66,6 +66,13 @@ public:
     /// ends while a piece is read in part.
     bool isToBeEmptied() const { return clocked && isPlugin(); }
 
+    /// Whether all is played, though it has not stopped: PulseAudio's does not where its server has not asked for the
+    /// last period anew.
+    bool hasRunDry(const Moment& now) const
+    {
+        return clocked && now.delay <= 0 && now.avail >= bufferSize() - periodSize();
+    }
+
     std::int64_t framesIn(std::int64_t nanoseconds) const;
     std::int64_t timeOf(std::int64_t frames) const;
 

@@ -95,6 +95,10 @@ bool Playback::write()
     if (taken > 0) {
         lastWrite = steadyTime();
         written += running ? 0 : taken;
+        if (running && ranDry) {
+            tellSilence();
+            end = lastWrite + card.timeOf(taken);
+        }
     }
     const bool wasRunning = running;
     followCard();
@@ -117,6 +121,9 @@ void Playback::followCard()
         running = false;
         ranDry = true;
         written = 0;
+    } else if (running && card.hasRunDry(now)) {
+        end = std::min(end, now.time);
+        ranDry = true;
     } else if (running) {
         end = now.time + card.timeOf(now.delay);
     }
@@ -126,17 +133,23 @@ void Playback::start()
 {
     card.start();
     running = true;
-    const Moment now = card.look();
-    if (std::exchange(ranDry, false)) {
-        const std::int64_t frames = std::max<std::int64_t>(card.framesIn(now.time - end), 0);
-        silence += frames;
-        host.updateProperty(makeScalar("Underruns", ++underruns));
-        const std::string message = "Card " + name + " ran dry: " + std::to_string(frames) +
-                                    " frames of silence; " + std::to_string(silence) +
-                                    " since open.";
-        host.raise("error", "brenix:Device:dataLost", message.c_str());
+    if (ranDry) {
+        tellSilence();
     }
+    const Moment now = card.look();
     end = now.time + card.timeOf(now.delay);
+}
+
+/// From when it had run dry until now.
+void Playback::tellSilence()
+{
+    const std::int64_t frames = std::max<std::int64_t>(card.framesIn(steadyTime() - end), 0);
+    ranDry = false;
+    silence += frames;
+    host.updateProperty(makeScalar("Underruns", ++underruns));
+    const std::string message = "Card " + name + " ran dry: " + std::to_string(frames) +
+                                " frames of silence; " + std::to_string(silence) + " since open.";
+    host.raise("error", "brenix:Device:dataLost", message.c_str());
 }
 
 /// Waits for output, or for the card to take what there is.
@@ -151,7 +164,7 @@ void Playback::await(bool closing)
             lastWrite + card.timeOf(card.periodSize()) + std::chrono::nanoseconds(patience).count();
     } else if (!isFull && !running && written > 0) {
         latest = lastWrite + card.timeOf(card.bufferSize()) / 2;
-    } else if (!isFull && running &&
+    } else if (!isFull && running && !ranDry &&
                card.hasClock()) { // it will run dry; some cards say when only as they do
         latest = std::clamp(end, now + 10 * millisecond, now + card.timeOf(card.periodSize()));
     }
