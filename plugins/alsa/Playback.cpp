@@ -90,6 +90,11 @@ bool Playback::write()
         rest = {};
         return true;
     }
+    if (!std::exchange(
+            isReady,
+            true)) { // not before: PulseAudio drops as much as the time until it is written
+        card.prepare();
+    }
     const auto taken = card.write(rest.data(), frames);
     rest += static_cast<std::size_t>(taken) * frameSize;
     if (taken > 0) {
@@ -111,14 +116,14 @@ bool Playback::write()
     return taken == frames;
 }
 
-/// Notes when all will be played, or makes the card ready again if it has run dry.
+/// Notes when all will be played, or that it has run dry.
 void Playback::followCard()
 {
     const Moment now = card.look();
     if (now.hasStopped()) {
         end = std::min(end, now.time);
-        card.prepare();
         running = false;
+        isReady = false;
         ranDry = true;
         written = 0;
     } else if (running && card.hasRunDry(now)) {

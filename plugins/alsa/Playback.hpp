@@ -64,6 +64,7 @@ private:
         left;                   ///< frames that the card had got and not played as the work failed
     std::int64_t lastWrite = 0; ///< when it took frames
     std::int64_t end = 0;       ///< when all is played that it has got
+    bool isReady = false;       ///< to be written
     bool ranDry = false;        ///< and has got nothing since
     std::int64_t silence = 0;   ///< frames
     std::uint64_t underruns = 0;
