@@ -88,7 +88,6 @@ public:
 
     void run(DeviceStreams& streams) override
     {
-        const alsa::Event::Use use(event, streams);
         if (settings.plays) {
             const auto playback =
                 std::make_shared<alsa::Playback>(card, settings, *host, streams, event);

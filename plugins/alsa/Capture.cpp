@@ -225,11 +225,7 @@ void Capture::tellLost(std::uint64_t frames, const char* reason)
 /// Waits for the card, or for room in the stream and for the time at which the card can keep no more.
 void Capture::await(snd_pcm_sframes_t available)
 {
-    bool awaitsRoom = !deliver();
-    event.awaitStreams(awaitsRoom);
-    if (awaitsRoom && deliver()) {
-        return; // there is room since
-    }
+    const bool awaitsRoom = !deliver();
     int milliseconds = -1;
     if (awaitsRoom && card.hasClock()) {
         const auto time = card.timeOf(std::max<std::int64_t>(mostKept - available, 0));

@@ -38,7 +38,6 @@ void Playback::work()
 
 void Playback::play()
 {
-    event.awaitStreams(true);
     bool closing = false;
     while (!closing || rest.size() > 0) {
         closing = streams.isClosing(); // before the last look at the output
