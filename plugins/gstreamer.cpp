@@ -145,8 +145,9 @@ private:
 
 constexpr OptionInfo optionTable[] = {
     {"Pipeline", "text", "", "(required)",
-     "as gst-launch-1.0 takes it, without the end that is ours: its last element when reading, "
-     "its first when writing"},
+     "as gst-launch-1.0 takes it, without the end that is ours: the device adds the last element, "
+     "an "
+     "appsink, when reading, and the first, an appsrc, when writing"},
     {"Mode", "text", "", "read", "read what a pipeline delivers, or write what it takes"},
     {"Caps", "text", "", "any; writing, bytes", "of our end, such as audio/x-raw,format=S16LE"},
     {"CloseTimeout", "number", "seconds", "10",
@@ -156,9 +157,9 @@ constexpr OptionInfo optionTable[] = {
 
 constexpr PropertyInfo propertyTable[] = {
     {"SampleRate", "double", "Hz", "of audio; 0: not known"},
-    {"Channels", "uint32", "", "of audio"},
+    {"Channels", "uint32", "", "of audio; 1 of other data"},
     {"ElementType", "char", "", "of the data"},
-    {"Caps", "char", "", "of our end; reading, once the first buffer has come"},
+    {"Caps", "char", "", "of our end"},
     {},
 };
 
