@@ -16,9 +16,10 @@ using Bytes = std::vector<unsigned char>;
 struct ElementType {
     const char* name;
     const char* cName;   ///< in C
-    const char* cFormat; ///< conversion of printf and, but for double and float, of scanf
+    const char* cFormat; ///< conversion of printf; of floating-point numbers there is none
     std::size_t size;
     bool isText;
+    bool isFloating;
     void (*print)(const unsigned char* element, std::string& text); ///< appends
     bool (*parse)(std::string_view text, unsigned char* element);   ///< whether it is one
     double (*toDouble)(const unsigned char* element);

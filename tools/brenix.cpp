@@ -1,7 +1,7 @@
 // brenix: lists and checks plug-ins, and reads and writes samples through a channel.
 
-#include "Commands.hpp"
 #include "Screen.hpp"
+#include "commands/Commands.hpp"
 
 #include <CLI/CLI.hpp>
 #include <nlohmann/json.hpp>

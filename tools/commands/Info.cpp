@@ -1,9 +1,9 @@
 // The command info.
 
-#include "Commands.hpp"
 #include "Described.hpp"
 #include "Screen.hpp"
 #include "brenixcoder/coder.h"
+#include "commands/Commands.hpp"
 
 #include <cstdint>
 #include <iostream>

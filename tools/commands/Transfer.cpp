@@ -1,8 +1,8 @@
 // The commands read and write.
 
-#include "Commands.hpp"
 #include "Described.hpp"
 #include "brenixcoder/coder.h"
+#include "commands/Commands.hpp"
 
 #include <algorithm>
 #include <cmath>
