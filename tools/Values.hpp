@@ -12,7 +12,8 @@ namespace brenix
 
 using Bytes = std::vector<unsigned char>;
 
-/// One of the twelve element types of coder.h.
+/// One of the twelve element types of coder.h. What the text of a number is, and which texts are numbers, is
+/// decided here: printNumber and takeElement in emit/ are the same in C.
 struct ElementType {
     const char* name;
     const char* cName;   ///< in C

@@ -112,7 +112,9 @@ void addFile(CLI::App& command, Settings& settings, const char* name, const char
 
 void addEmit(CLI::App& command, Settings& settings)
 {
-    command.add_option("--emit-c", settings.emitC, "Write the C program that does the same")
+    command
+        .add_option("--emit-c", settings.emitC,
+                    "Write the C program that does the same, - to the standard output")
         ->type_name("FILE");
 }
 
