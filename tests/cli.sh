@@ -69,6 +69,8 @@ done <<END
 1|{"error":{"id":"brenix:Channel:unexpectedException","message":"Option Foo: is not known."}}|info signal -o Foo=1 --json
 2|not a value of type int8: 300|info signal -o Foo:int8=300
 2|an option is Name=value|info signal -o Foo
+2|samples and --emit-c - cannot both go to the standard output|read signal -n 1 --emit-c -
+0|fputs("data" "\n", file);|read signal -n 1 -q -w tone.csv --emit-c -
 2|at most 16 options|info signal $(printf -- '-o Foo=1 %.0s' {1..17})
 0|Frequency: 1000 Hz|info signal -o Frequency:int32=1000 -o Waveform:char=sine -o Pace=fast -o Channels=1
 1|Custom property: Foo not found|info signal -p Foo:double
@@ -313,6 +315,9 @@ emitted - read "${signal[@]}" -q --time -o Frames=6 -o BlockSize=6 -o Overflow=d
 [[ $(cut -d, -f1,2 second | tr '\n' ' ') == 'Index,Time 0,0 1,0 2,0 3,0 ' ]] || fail "numbers and times: $(cat second)"
 [[ $(brenix read signal -q -o BlockSize=3 -n 3 --time | awk -F, '{ time = substr($2, 6) } NR > 2 { print time - last } { last = time }' | tr '\n' ' ') =~ ^2083[0-9]\ 2083[0-9]\ $ ]] ||
     fail "the times of three samples"
+brenix info signal --emit-c - >program.c
+compile
+./program | cmp - <(brenix info signal) || fail "the program on the standard output"
 emitted - info signal -o Channels=1 -o Channels=2 -p Channels:uint32
 name=$'./*\\\n/*??/\n/*.raw' # it would end a comment
 mkdir -p "${name%/*}"
@@ -437,6 +442,17 @@ int8|-0 +1 -128 127 007|128 -129 0x1 1.5 1e1 +-1
 uint8|-0 255|256 -1
 uint64|-0 18446744073709551615|18446744073709551616 -1
 logical|-0 +1 true false|2 -1 0x1 True
+END
+# And both print them alike, as short as can be.
+while read -r type numbers; do
+    [[ -e $build/lib/brenix-plugins/hdf5.so ]] || continue # it was left out
+    printf 'data\n%s\n' "${numbers// /$'\n'}" >wanted.csv
+    brenix write hdf5 -q -o FileName=numbers.h5 -o Mode=write -o ElementType="$type" -t "$type" -i wanted.csv
+    emitted - read hdf5 -q -o FileName=numbers.h5 --field data
+    diff wanted.csv second || fail "numbers of type $type"
+done <<'END'
+double 0 -0 0.1 0.001 1e-04 0.00012 1e+05 123456 12345678901234567168 1.2345678901234568e+22 5e-324 -inf nan
+float 0.1 1e-04 -0.3 1e+05 16777216 3.4028235e+38 1e-45
 END
 while read -r converter last message; do
     brenix read "$plugins/probe.so" -c "$converter" -o Packets:int32=2,3,4 -q -w whole.csv --emit-c program.c

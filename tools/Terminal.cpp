@@ -1,7 +1,7 @@
 // What the commands have to do with the terminal.
 
-#include "Commands.hpp"
 #include "Screen.hpp"
+#include "commands/Commands.hpp"
 
 #include <fcntl.h>
 #include <unistd.h>

@@ -58,6 +58,7 @@ constexpr ElementType number(const char* name, const char* cName, const char* cF
             cFormat,
             sizeof(T),
             false,
+            std::is_floating_point_v<T>,
             [](const unsigned char* element, std::string& text) {
                 std::array<char, 32> digits{};
                 const auto end = std::to_chars(digits.begin(), digits.end(), load<T>(element));
@@ -126,8 +127,8 @@ void splitCommas(std::string_view list, bool isCsv, Take take)
 const std::vector<ElementType>& elementTypes()
 {
     static const std::vector<ElementType> types = {
-        number<double>("double", "double", "%.17g"),
-        number<float>("float", "float", "%.9g"),
+        number<double>("double", "double", ""),
+        number<float>("float", "float", ""),
         number<std::int8_t>("int8", "int8_t", "%hhd"),
         number<std::int16_t>("int16", "int16_t", "%hd"),
         number<std::int32_t>("int32", "int32_t", "%d"),

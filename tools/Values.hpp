@@ -12,13 +12,15 @@ namespace brenix
 
 using Bytes = std::vector<unsigned char>;
 
-/// One of the twelve element types of coder.h.
+/// One of the twelve element types of coder.h. What the text of a number is, and which texts are numbers, is
+/// decided here: printNumber and takeElement in emit/ are the same in C.
 struct ElementType {
     const char* name;
     const char* cName;   ///< in C
-    const char* cFormat; ///< conversion of printf and, but for double and float, of scanf
+    const char* cFormat; ///< conversion of printf; of floating-point numbers there is none
     std::size_t size;
     bool isText;
+    bool isFloating;
     void (*print)(const unsigned char* element, std::string& text); ///< appends
     bool (*parse)(std::string_view text, unsigned char* element);   ///< whether it is one
     double (*toDouble)(const unsigned char* element);

@@ -1,7 +1,7 @@
 // brenix: lists and checks plug-ins, and reads and writes samples through a channel.
 
-#include "Commands.hpp"
 #include "Screen.hpp"
+#include "commands/Commands.hpp"
 
 #include <CLI/CLI.hpp>
 #include <nlohmann/json.hpp>
@@ -112,7 +112,9 @@ void addFile(CLI::App& command, Settings& settings, const char* name, const char
 
 void addEmit(CLI::App& command, Settings& settings)
 {
-    command.add_option("--emit-c", settings.emitC, "Write the C program that does the same")
+    command
+        .add_option("--emit-c", settings.emitC,
+                    "Write the C program that does the same, - to the standard output")
         ->type_name("FILE");
 }
 

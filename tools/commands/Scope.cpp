@@ -1,8 +1,8 @@
 // The command scope.
 
-#include "Commands.hpp"
 #include "Screen.hpp"
 #include "brenixcoder/coder.h"
+#include "commands/Commands.hpp"
 
 #include <unistd.h>
 

@@ -1,8 +1,8 @@
 // The commands read and write.
 
-#include "Commands.hpp"
 #include "Described.hpp"
 #include "brenixcoder/coder.h"
+#include "commands/Commands.hpp"
 
 #include <algorithm>
 #include <cmath>
@@ -114,6 +114,10 @@ ExitCode readSamples(const Settings& given)
     settleFormat(settings.file);
     if (settings.time && settings.file.format != "csv") { // it has columns of several types
         throw std::invalid_argument("--time needs csv, not " + settings.file.format);
+    }
+    if (settings.emitC == "-" && settings.file.isPipe()) {
+        throw std::invalid_argument(
+            "samples and --emit-c - cannot both go to the standard output: give --to FILE");
     }
     Channel channel(settings.channel, Use::Read);
     settings.file.rate = countRate(channel, settings.file);

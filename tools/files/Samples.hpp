@@ -3,8 +3,8 @@
 #define BRENIX_TOOLS_SAMPLES_HPP
 
 #include "Channel.hpp"
-#include "Sound.hpp"
 #include "Values.hpp"
+#include "files/Sound.hpp"
 
 #include <cstddef>
 #include <cstdio>

@@ -3,7 +3,7 @@
 #define BRENIX_TOOLS_COMMANDS_HPP
 
 #include "Channel.hpp"
-#include "Samples.hpp"
+#include "files/Samples.hpp"
 
 #include <nlohmann/json.hpp>
 

@@ -1,7 +1,7 @@
 // Writers of files of samples.
 
-#include "Commands.hpp"
-#include "Samples.hpp"
+#include "commands/Commands.hpp"
+#include "files/Samples.hpp"
 #include "plugins/SoundFile.hpp"
 
 #include <fcntl.h>

@@ -1,7 +1,7 @@
 // Readers of files of samples.
 
-#include "Commands.hpp"
-#include "Samples.hpp"
+#include "commands/Commands.hpp"
+#include "files/Samples.hpp"
 #include "plugins/SoundFormat.hpp"
 
 #include <fcntl.h>

@@ -1,8 +1,8 @@
 // The commands plugins, check and find.
 
-#include "Commands.hpp"
 #include "Described.hpp"
 #include "Screen.hpp"
+#include "commands/Commands.hpp"
 
 #include <algorithm>
 #include <cctype>

@@ -1,4 +1,4 @@
-#include "Samples.hpp"
+#include "files/Samples.hpp"
 
 #include <algorithm>
 #include <cctype>

@@ -1,9 +1,9 @@
 // The command info.
 
-#include "Commands.hpp"
 #include "Described.hpp"
 #include "Screen.hpp"
 #include "brenixcoder/coder.h"
+#include "commands/Commands.hpp"
 
 #include <cstdint>
 #include <iostream>
@@ -108,15 +108,18 @@ ExitCode showInfo(const Settings& settings)
              << (unit.empty() ? "" : " ") << unit << '\n';
     }
     const std::string fields = printedFields("", report);
+    if (!settings.emitC.empty()) {
+        emitInfo(settings, properties, fields);
+    }
+    if (settings.emitC == "-") {
+        return Success; // the program is there instead
+    }
     if (settings.json) {
         printJson(
             std::cout,
             {{"streams", streams}, {"properties", list}, {"commands", toJson(report.commands)}}, 2);
     } else {
         std::cout << text.str() << fields;
-    }
-    if (!settings.emitC.empty()) {
-        emitInfo(settings, properties, fields);
     }
     return Success;
 }

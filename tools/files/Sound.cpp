@@ -1,4 +1,4 @@
-#include "Sound.hpp"
+#include "files/Sound.hpp"
 
 #include "Channel.hpp"
 

@@ -1,6 +1,6 @@
 // Reading from a channel, buffer by buffer, for the commands read and scope.
 
-#include "Commands.hpp"
+#include "commands/Commands.hpp"
 
 #include <algorithm>
 #include <cmath>

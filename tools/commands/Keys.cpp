@@ -1,6 +1,6 @@
 // The command keys. The device makes them, so that this program needs no library for it.
 
-#include "Commands.hpp"
+#include "commands/Commands.hpp"
 
 #include <iostream>
 
