@@ -31,6 +31,15 @@ bool mayChange(natsStatus status, jsErrCode code)
            code == JSClusterIncompleteErr || code == JSInsufficientResourcesErr;
 }
 
+/// The time to ask for, or one of the same second before it: libnats 3.4 writes a fraction without the zeros that it
+/// begins with, so that .05 becomes .5.
+std::int64_t askedTime(std::int64_t wanted)
+{
+    constexpr std::int64_t second = 1000000000;
+    const std::int64_t fraction = wanted % second;
+    return fraction < second / 10 ? wanted - fraction : wanted;
+}
+
 /// Asks until there is an answer that lasts, or it is time.
 template <typename Question>
 natsStatus persist(Moment until, jsErrCode& code, const Question& question)
@@ -164,7 +173,7 @@ Place::Place(const KeptStream& stream, const Settings& settings, Moment until)
                                             js_DeliverByStartTime};
     config.DeliverPolicy = policies[static_cast<int>(settings.start)];
     config.OptStartSeq = settings.startIndex;
-    config.OptStartTime = settings.startTime;
+    config.OptStartTime = askedTime(settings.startTime);
 
     jsConsumerInfo* made = nullptr;
     jsErrCode code{};

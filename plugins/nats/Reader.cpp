@@ -22,12 +22,14 @@ std::string headerOf(natsMsg* message, const char* name)
     return natsMsgHeader_Get(message, name, &value) == NATS_OK && value != nullptr ? value : "";
 }
 
-/// The place of a message in its stream, of which the subject for acknowledging it tells:
-/// $JS.ACK.stream.place.deliveries.sequence.... 0 for one of no stream.
-std::uint64_t placeOf(const std::string& reply)
+enum Token { Sequence = 5, Time = 7 };
+
+/// What the subject for acknowledging a message tells of it:
+/// $JS.ACK.stream.place.deliveries.sequence.sequence of the place.time.... 0 for one of no stream.
+std::uint64_t numberOf(const std::string& reply, Token wanted)
 {
     std::size_t begin = 0;
-    for (int token = 0; token < 5 && begin != std::string::npos; ++token) {
+    for (int token = 0; token < wanted && begin != std::string::npos; ++token) {
         begin = reply.find('.', begin);
         begin += begin == std::string::npos ? 0 : 1;
     }
@@ -147,7 +149,7 @@ void Reader::handleMessage(MessagePointer message)
     }
     const char* const given = natsMsg_GetReply(message.get());
     const std::string reply = given == nullptr ? "" : given;
-    const std::uint64_t number = placeOf(reply);
+    const std::uint64_t number = numberOf(reply, Sequence);
     if (number == 0) {
         return; // not of a stream
     }
@@ -156,6 +158,11 @@ void Reader::handleMessage(MessagePointer message)
     const auto [entry, isNew] = open.try_emplace(number, Open{reply, now});
     if (!isNew) { // it waits here
         entry->second.touched = now;
+        return;
+    }
+    if (settings.start == Start::Time &&
+        static_cast<std::int64_t>(numberOf(reply, Time)) < settings.startTime) {
+        pass(number); // askedTime() was earlier
         return;
     }
     const auto label =
