@@ -125,9 +125,3 @@ read 3 counts *' env "PATH=$scratch/installed/bin:$PATH" "PKG_CONFIG_PATH=$folde
     bash -e <(pieces sh docs/plugin-authors.md 3)
 [[ -e $("${pkgconfig[@]}" --variable=plugindir brenixcore)/loopback.so ]]
 cd ..
-
-echo "== the Debian package has the same files, and says what it needs"
-cpack --config "$build/CPackConfig.cmake" -B deb >>log 2>&1
-dpkg-deb --extract deb/*.deb deb/root
-diff <(cd installed && find . ! -type d | sort) <(cd deb/root/usr && find . ! -type d | sort)
-expect '*libc6 (>= *libsndfile1 (>= *libstdc++6 (>= *' dpkg-deb --field deb/*.deb Depends
