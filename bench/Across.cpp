@@ -284,28 +284,32 @@ private:
 template <typename Peer>
 void move(const std::string& name, std::size_t elements)
 {
-    benchmark::RegisterBenchmark(name.c_str(), [=](benchmark::State& state) {
-        std::vector<double> out(elements);
-        std::iota(out.begin(), out.end(), 1.0);
-        std::vector<double> in(elements);
-        Peer peer(elements);
-        constexpr benchmark::IterationCount before =
-            100; // until the memory that moves has been used
-        std::thread writer([&, count = before + state.max_iterations] {
-            for (benchmark::IterationCount i = 0; i < count; ++i) {
-                peer.send(out.data());
-            }
-        });
-        for (benchmark::IterationCount i = 0; i < before; ++i) {
-            peer.receive(in.data());
-        }
-        for (auto _ : state) {
-            peer.receive(in.data());
-        }
-        writer.join();
-        require(in == out, "the blocks came changed");
-        state.SetBytesProcessed(state.iterations() * static_cast<int64_t>(peer.bytes));
-    })->UseRealTime();
+    benchmark::RegisterBenchmark(name.c_str(),
+                                 [=](benchmark::State& state) {
+                                     std::vector<double> out(elements);
+                                     std::iota(out.begin(), out.end(), 1.0);
+                                     std::vector<double> in(elements);
+                                     Peer peer(elements);
+                                     constexpr benchmark::IterationCount before =
+                                         500; // by when as many are on their way as may be
+                                     std::thread writer([&, count = before + state.max_iterations] {
+                                         for (benchmark::IterationCount i = 0; i < count; ++i) {
+                                             peer.send(out.data());
+                                         }
+                                     });
+                                     for (benchmark::IterationCount i = 0; i < before; ++i) {
+                                         peer.receive(in.data());
+                                     }
+                                     for (auto _ : state) {
+                                         peer.receive(in.data());
+                                     }
+                                     writer.join();
+                                     require(in == out, "the blocks came changed");
+                                     state.SetBytesProcessed(state.iterations() *
+                                                             static_cast<int64_t>(peer.bytes));
+                                 })
+        ->UseRealTime()
+        ->MinTime(0.3);
 }
 
 } // namespace
