@@ -83,7 +83,7 @@ void Queue::notifyDevice(Lock& lock)
 
 void Queue::wakeDevice() noexcept
 {
-    if (phase != Phase::Closed && hasAsked.exchange(false)) {
+    if (phase != Phase::Closed && hasAsked && hasAsked.exchange(false)) {
         device.wake();
     }
 }
