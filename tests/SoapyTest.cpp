@@ -226,16 +226,21 @@ TEST(SoapyTest, WhatIsNotTransmittedAsItWasWrittenIsTold)
 
 TEST(SoapyTest, CloseWaitsUntilAllIsSent)
 {
-    for (const bool isQuiet : {false, true}) {
+    for (const char* arguments : {"rate=1000", "rate=1000,quiet=1", "rate=1000,quiet=1,tx=xw"}) {
+        const bool isQuiet = arguments != "rate=1000"s;
+        const bool ranDry = std::string_view(arguments).ends_with("xw");
         Channel channel("soapy");
-        channel.start({{"Device", script + (isQuiet ? "rate=1000,quiet=1" : "rate=1000")},
-                       {"Mode", "write"}});
+        channel.start({{"Device", script + arguments}, {"Mode", "write"}});
+        if (ranDry) { // and tells that when it has got more
+            ASSERT_EQ(write(channel, std::vector<float>(6)), 6);
+        }
         const std::vector<float> seconds(isQuiet ? 600 : 40000); // 0.3 or 20
         ASSERT_EQ(write(channel, seconds), seconds.size());
         const auto begin = std::chrono::steady_clock::now();
         EXPECT_EQ(channel.close(), 1);
         const std::chrono::duration<double> took = std::chrono::steady_clock::now() - begin;
         EXPECT_TRUE(isQuiet ? took.count() > 0.2 : took.count() < 10) << took.count();
+        EXPECT_EQ(channel.property<std::uint64_t>("Underflows", "uint64"), ranDry ? 1 : 0);
     }
 }
 

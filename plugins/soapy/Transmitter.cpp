@@ -90,8 +90,10 @@ bool Transmitter::write()
     }
     const int sent = radio.write(rest.data(), pairs, 0);
     if (sent > 0) {
-        tellDry();
         noteSent(sent);
+        if (isDry) {
+            tellDry({});
+        }
     } else if (sent == SOAPY_SDR_UNDERFLOW) {
         noteDry(0, 0);
     } else if (sent != SOAPY_SDR_TIMEOUT && sent != 0) {
@@ -107,6 +109,10 @@ void Transmitter::noteSent(int pairs)
     hasSent = true;
     isStuck = false;
     lastTaken = Clock::now();
+    if (lastTaken > end) {
+        begin = lastTaken;
+        isTold = false;
+    }
     const std::chrono::duration<double> length(pairs / radio.rate());
     end = std::max(end, lastTaken) + std::chrono::duration_cast<Clock::duration>(length);
 }
@@ -153,22 +159,34 @@ void Transmitter::followStatus()
     }
 }
 
+/// A status comes late: the radio may have got more since, and sends that.
 void Transmitter::noteDry(int flags, long long time)
 {
-    if (hasSent && !std::exchange(isDry, true)) {
-        drySince = (flags & SOAPY_SDR_HAS_TIME) != 0 ? std::optional(time) : std::nullopt;
+    if (!hasSent || isDry) {
+        return;
+    }
+    const auto now = Clock::now();
+    const auto clocksDiffer = callTime + (now - begin) / 10000;
+    const bool sends = now + clocksDiffer < end;
+    if (sends && isTold) {
+        return; // some say it again and again
+    }
+    isDry = true;
+    drySince = (flags & SOAPY_SDR_HAS_TIME) != 0 ? std::optional(time) : std::nullopt;
+    if (sends) {
+        tellDry(now - begin);
     }
 }
 
-/// The radio has run dry in the midst of what is sent.
-void Transmitter::tellDry()
+/// The radio has run dry in the midst of what is sent, and got more so long ago.
+void Transmitter::tellDry(std::chrono::nanoseconds ago)
 {
-    if (!std::exchange(isDry, false)) {
-        return;
-    }
+    isDry = false;
+    isTold = true;
     const auto clock = drySince ? radio.clock() : std::nullopt;
-    if (clock && *clock >= *drySince) {
-        const auto nanoseconds = static_cast<double>(*clock - *drySince);
+    const std::int64_t length = clock ? *clock - ago.count() - *drySince : -1;
+    if (length >= 0) {
+        const auto nanoseconds = static_cast<double>(length);
         silence += static_cast<std::uint64_t>(std::llround(nanoseconds * radio.rate() / 1e9));
     } else {
         ++untimed;
@@ -186,13 +204,14 @@ void Transmitter::tellDry()
 void Transmitter::finish()
 {
     constexpr std::chrono::milliseconds underway{100}; // on the way to the radio
-    if (hasSent && !isDry) {
+    const auto isSending = [&] { return hasSent && Clock::now() < (isDry ? end : end + underway); };
+    if (isSending()) {
         const int result = radio.write(rest.data(), 0, SOAPY_SDR_END_BURST);
         if (result == SOAPY_SDR_STREAM_ERROR) {
             throw radio.failure(result);
         }
     }
-    while (hasSent && !isDry && !hasEnded && Clock::now() < end + underway) {
+    while (!hasEnded && isSending()) {
         wait(std::min(end + underway, Clock::now() + callTime));
         followStatus();
     }

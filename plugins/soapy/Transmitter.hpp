@@ -36,7 +36,7 @@ private:
     void noteSent(int pairs);
     void noteStuck();
     void noteDry(int flags, long long time);
-    void tellDry();
+    void tellDry(std::chrono::nanoseconds ago);
     void followStatus();
     void finish();
     std::string notSent();
@@ -58,8 +58,10 @@ private:
     bool isStuck = false;        ///< and that was told
     Clock::time_point lastTaken; ///< when the radio took something, or had nothing to take
     Clock::time_point end;       ///< when the radio has sent all that it took, by its rate
+    Clock::time_point begin;     ///< when it got something and had nothing, by its rate
     bool hasEnded = false;       ///< the radio says that it has sent all
     bool isDry = false;          ///< it had nothing to send, which is told if there is more
+    bool isTold = false;         ///< that it had run dry before that
     std::optional<std::int64_t> drySince; ///< by the radio's clock
     std::uint64_t underflows = 0;
     std::uint64_t silence = 0;   ///< counts

@@ -2,7 +2,7 @@
 // I counts up and Q down: d 1000 pairs and their time, n without it, a with an overflow behind them, o overflow, c
 // corruption, s silence for 4 seconds (each of which loses 250 pairs), e error, l what was transmitted. Argument tx,
 // transmitting: w takes all, p half, t nothing, z nothing any more, u all and then runs dry for 250 pairs, v the same
-// without time, c all and then says that it was damaged, e error. With quiet=1 it does not say that
+// without time, x the same but says so behind the next write, c all and then says that it was damaged, e error. With quiet=1 it does not say that
 // a burst has ended.
 
 #include <SoapySDR/Device.hpp>
@@ -180,7 +180,9 @@ public:
             return SOAPY_SDR_TIMEOUT;
         }
         count = letter == 'p' ? (count + 1) / 2 : count;
-        dry = letter == 'u' || letter == 'v' || letter == 'c' ? letter : ' ';
+        const bool isDry = letter == 'u' || letter == 'v' || letter == 'c';
+        dry = std::exchange(late, letter == 'x' ? 'v' : ' ');
+        dry = isDry ? letter : dry;
         const std::lock_guard lock(mutex);
         const auto* const bytes = static_cast<const char*>(buffers[0]);
         loop.insert(loop.end(), bytes, bytes + count * pairSize());
@@ -246,6 +248,7 @@ private:
     double number = 0;     ///< of the next pair
     long silence = 0;      ///< microseconds
     char dry = ' ';
+    char late = ' ';
     bool hasEnded = false;
     std::mutex mutex;
     std::deque<char> loop; ///< what was transmitted, which another thread may receive
