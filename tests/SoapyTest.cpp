@@ -100,6 +100,7 @@ TEST(SoapyTest, WhatIsReceivedHasItsTimeAndWhatIsLostIsToldToTheCount)
         {"rx=dnnddood,clock=900000000000", 5500, 500, "500 counts were lost: the radio overflowed"},
         {"rx=dadad", 2500, 500, "lost: the radio overflowed; 500 since open."},
         {"rx=dddcd", 3250, 250, "lost: what came from the radio was damaged"},
+        {"rx=ddj", 27000, 25000, "lost: the radio's time jumped"},
         {"rx=dsd", 1250, 250, "lost: the radio was silent"},
         {"rx=nnn", 2000, 0, ""},
     };

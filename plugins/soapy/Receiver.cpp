@@ -88,6 +88,10 @@ void Receiver::take(bytes::OwnedProperty data, std::size_t counts, int flags, lo
     if (const double set = radio.rate(); set != rate) {
         rate = set;
         stamp.reset(); // nobody knows with which count that began
+        settled = steady_clock::now() + std::chrono::nanoseconds(second);
+    }
+    if (gap == nullptr && hasTime && hasJumped(time)) {
+        noteGap("the radio's time jumped");
     }
     if (gap != nullptr) {
         closeGap(hasTime, time);
@@ -116,6 +120,14 @@ void Receiver::take(bytes::OwnedProperty data, std::size_t counts, int flags, lo
 std::int64_t Receiver::passed() const
 {
     return durationOf(stamp->counts, rate);
+}
+
+/// Whether counts are missing, of which the driver says nothing else. Some take the time from the system's clock.
+bool Receiver::hasJumped(std::int64_t time) const
+{
+    constexpr std::int64_t inaccurate = second / 100;
+    return stamp && steady_clock::now() >= settled &&
+           time - stamp->time - passed() > std::max(inaccurate, durationOf(10, rate));
 }
 
 /// A radio's clock begins anywhere. One that is right already is better than the comparison.

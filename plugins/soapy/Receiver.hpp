@@ -30,6 +30,7 @@ private:
     };
 
     void take(brenixplugin::OwnedProperty data, std::size_t counts, int flags, long long time);
+    bool hasJumped(std::int64_t time) const;
     void compareClocks();
     std::int64_t sinceEpoch(std::int64_t time, std::size_t counts);
     void noteGap(const char* reason);
@@ -43,8 +44,9 @@ private:
     brenixcore::plugin::DeviceHost& host;
     brenixcore::plugin::DeviceStreams& streams;
 
-    double rate;                        ///< of the counts since the stamp
-    std::optional<Stamp> stamp;         ///< nothing where the driver tells no time
+    double rate;                                   ///< of the counts since the stamp
+    std::optional<Stamp> stamp;                    ///< nothing where the driver tells no time
+    std::chrono::steady_clock::time_point settled; ///< when no more may come at another rate
     std::optional<std::int64_t> offset; ///< from the radio's clock to the time since 1970
     const char* gap = nullptr;          ///< why counts are missing behind those that came last
     std::uint64_t overflows = 0;

@@ -1,9 +1,9 @@
 // A driver of SoapySDR, "script", whose radio does what its arguments say, a letter a call. Argument rx, receiving, where
-// I counts up and Q down: d 1000 pairs and their time, n without it, a with an overflow behind them, o overflow, c
-// corruption, s silence for 4 seconds (each of which loses 250 pairs), e error, l what was transmitted. Argument tx,
-// transmitting: w takes all, p half, t nothing, z nothing any more, u all and then runs dry for 250 pairs, v the same
-// without time, x the same but says so behind the next write, c all and then says that it was damaged, e error. With quiet=1 it does not say that
-// a burst has ended.
+// I counts up and Q down: d 1000 pairs and their time, n without it, a with an overflow behind them, j after 25000 that
+// it says nothing of, o overflow, c corruption, s silence for 4 seconds (each of which loses 250 pairs), e error, l what
+// was transmitted. Argument tx, transmitting: w takes all, p half, t nothing, z nothing any more, u all and then runs
+// dry for 250 pairs, v the same without time, x the same but says so behind the next write, c all and then says that it
+// was damaged, e error. With quiet=1 it does not say that a burst has ended.
 
 #include <SoapySDR/Device.hpp>
 #include <SoapySDR/Registry.hpp>
@@ -118,13 +118,15 @@ public:
                    long long& time, long timeout) override
     {
         const char letter = next(SOAPY_SDR_RX);
-        flags = letter == 'd' || letter == 'a' ? SOAPY_SDR_HAS_TIME : 0;
+        flags = letter == 'd' || letter == 'a' || letter == 'j' ? SOAPY_SDR_HAS_TIME : 0;
+        number += letter == 'j' ? 25000 : 0;
         time = 1000000000000 + std::llround(number * 1e9 / rate);
         switch (letter) {
         case 'a':
             flags |= SOAPY_SDR_END_ABRUPT;
             [[fallthrough]];
         case 'd':
+        case 'j':
         case 'n':
             count = std::min<size_t>(count, 1000);
             for (size_t i = 0; i < count; ++i, ++number) {
