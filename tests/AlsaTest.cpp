@@ -326,13 +326,14 @@ TEST(AlsaTest, WhatACardDoesNotHaveIsRefused)
     Channel channel("alsa");
     channel.start({{"Card", "record"}, {"Mode", "write"}});
     ASSERT_EQ(channel.write({1, 2}), 2);
-    EXPECT_EQ(channel.asyncError(),
-              "brenix:Device:wrongType|Data to play must be int16, but is double. 2 elements of "
-              "another type were not played on card record.");
+    const std::string wrongType = "Data to play must be int16, but is double. 2 elements of "
+                                  "another type were not played on card record.";
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:wrongType|" + wrongType);
     ASSERT_EQ(write(channel, "int16", ramp(1, 2).data(), 1), 1);
     EXPECT_EQ(channel.close(), 1);
     EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|The last frame for card record has 1 of "
-                                    "2 samples and was not played.");
+                                    "2 samples and was not played. " +
+                                        wrongType);
 }
 
 TEST(AlsaTest, WhatIsListedIsFound)

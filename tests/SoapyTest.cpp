@@ -215,14 +215,14 @@ TEST(SoapyTest, WhatIsNotTransmittedAsItWasWrittenIsTold)
     Channel channel("soapy");
     channel.start({{"Device", script + "tx=w"}, {"Mode", "write"}});
     ASSERT_EQ(channel.write({1, 2}), 2);
-    EXPECT_EQ(channel.asyncError(),
-              "brenix:Device:wrongType|Data to transmit must be float, but is double. 2 elements "
-              "of another type were not sent by radio " +
-                  script + "tx=w.");
+    const std::string wrongType = "Data to transmit must be float, but is double. 2 elements of "
+                                  "another type were not sent by radio " +
+                                  script + "tx=w.";
+    EXPECT_EQ(channel.asyncError(), "brenix:Device:wrongType|" + wrongType);
     ASSERT_EQ(write(channel, std::vector<float>(1)), 1);
-    EXPECT_EQ(channel.close(), 1);
+    EXPECT_EQ(channel.close(), 1); // of errors that nobody has read, only the last is kept
     EXPECT_EQ(channel.asyncError(), "brenix:Device:failed|The last I for radio " + script +
-                                        "tx=w has no Q. 1 elements were not sent.");
+                                        "tx=w has no Q. 1 elements were not sent. " + wrongType);
 }
 
 TEST(SoapyTest, CloseWaitsUntilAllIsSent)

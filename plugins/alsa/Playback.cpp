@@ -17,7 +17,7 @@ Playback::Playback(std::shared_ptr<Card> ownCard, const Settings& what, DeviceHo
                    DeviceStreams& itsStreams, Event& wakeUp)
     : shared(std::move(ownCard)), card(*shared), name(what.name), channels(what.channels),
       type(*bytes::findType(what.format.name)), frameSize(channels * type.size), host(deviceHost),
-      streams(itsStreams), event(wakeUp)
+      streams(itsStreams), event(wakeUp), told(deviceHost)
 {
 }
 
@@ -59,11 +59,10 @@ bool Playback::fetch()
         if (!found) {
             wrongType += packet->counts;
             const std::string typeName(type.name);
-            const std::string message =
-                "Data to play must be " + typeName + ", but is " + bytes::describe(next.get()) +
-                ". " + std::to_string(wrongType) +
-                " elements of another type were not played on card " + name + ".";
-            host.raise("error", "brenix:Device:wrongType", message.c_str());
+            told.raise(bytes::Told::wrongType, "brenix:Device:wrongType",
+                       "Data to play must be " + typeName + ", but is " +
+                           bytes::describe(next.get()) + ". " + std::to_string(wrongType) +
+                           " elements of another type were not played on card " + name + ".");
         } else if (torn.empty()) {
             data = std::move(next);
             rest = asio::buffer(found->data(), found->size());
@@ -151,9 +150,9 @@ void Playback::tellSilence()
     ranDry = false;
     silence += frames;
     host.updateProperty(makeScalar("Underruns", ++underruns));
-    const std::string message = "Card " + name + " ran dry: " + std::to_string(frames) +
-                                " frames of silence; " + std::to_string(silence) + " since open.";
-    host.raise("error", "brenix:Device:dataLost", message.c_str());
+    told.raise(bytes::Told::silence, "brenix:Device:dataLost",
+               "Card " + name + " ran dry: " + std::to_string(frames) + " frames of silence; " +
+                   std::to_string(silence) + " since open.");
 }
 
 /// Waits for output, or for the card to take what there is.
@@ -212,7 +211,8 @@ std::string Playback::notPlayed()
     const std::int64_t inCard = running ? left.value_or(byClock) : written;
     const std::uint64_t frames = static_cast<std::uint64_t>(inCard) + rest.size() / frameSize +
                                  discardOutput(streams) / channels;
-    return frames == 0 ? std::string() : ' ' + std::to_string(frames) + " frames were not played.";
+    return (frames == 0 ? "" : ' ' + std::to_string(frames) + " frames were not played.") +
+           told.besides();
 }
 
 } // namespace alsa

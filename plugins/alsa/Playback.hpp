@@ -5,6 +5,7 @@
 #include "Card.hpp"
 #include "Elements.hpp"
 #include "Event.hpp"
+#include "Told.hpp"
 #include "brenixcore/plugin/Plugin.hpp"
 
 #include <asio/buffer.hpp>
@@ -29,7 +30,8 @@ public:
     /// Works until the channel closes and all is played.
     void work();
 
-    /// After the work has failed or was left behind: a sentence on what was not played, if anything is.
+    /// After the work has failed or was left behind: sentences on what was not played, if anything is, and on what was
+    /// told before.
     std::string notPlayed();
 
 private:
@@ -69,6 +71,7 @@ private:
     std::int64_t silence = 0;   ///< frames
     std::uint64_t underruns = 0;
     std::uint64_t wrongType = 0; ///< counts
+    bytes::Told told;
 };
 
 } // namespace alsa

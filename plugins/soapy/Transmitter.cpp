@@ -19,7 +19,7 @@ using namespace brenixcore::plugin;
 Transmitter::Transmitter(Radio& ownRadio, DeviceHost& deviceHost, DeviceStreams& itsStreams,
                          Wait waitUntil)
     : radio(ownRadio), type(radio.elementType()), pairSize(2 * type.size), host(deviceHost),
-      streams(itsStreams), wait(std::move(waitUntil))
+      streams(itsStreams), wait(std::move(waitUntil)), told(deviceHost)
 {
 }
 
@@ -28,7 +28,7 @@ void Transmitter::run()
     try {
         transmit();
     } catch (const std::exception& error) {
-        throw std::runtime_error(error.what() + notSent());
+        throw std::runtime_error(error.what() + notSent() + told.besides());
     }
 }
 
@@ -59,11 +59,11 @@ bool Transmitter::fetch()
         const auto found = type.find(next.get());
         if (!found) {
             wrongType += packet->counts;
-            const std::string message =
-                "Data to transmit must be " + std::string(type.name) + ", but is " +
-                bytes::describe(next.get()) + ". " + std::to_string(wrongType) +
-                " elements of another type were not sent by radio " + radio.name() + ".";
-            host.raise("error", "brenix:Device:wrongType", message.c_str());
+            told.raise(bytes::Told::wrongType, "brenix:Device:wrongType",
+                       "Data to transmit must be " + std::string(type.name) + ", but is " +
+                           bytes::describe(next.get()) + ". " + std::to_string(wrongType) +
+                           " elements of another type were not sent by radio " + radio.name() +
+                           ".");
             continue;
         }
         data = std::move(next);
@@ -128,7 +128,7 @@ void Transmitter::noteStuck()
         throw std::runtime_error(message);
     }
     if (!std::exchange(isStuck, true)) {
-        host.raise("error", "brenix:Device:timeout", message.c_str());
+        host.raise("error", "brenix:Device:timeout", (message + told.besides()).c_str());
     }
 }
 
@@ -149,10 +149,9 @@ void Transmitter::followStatus()
         } else if (status == SOAPY_SDR_STREAM_ERROR) {
             throw radio.failure(status);
         } else if (status < 0) {
-            const std::string message =
-                "Radio " + radio.name() +
-                " may not have sent all that it took: " + SoapySDR_errToStr(status) + ".";
-            host.raise("error", "brenix:Device:dataLost", message.c_str());
+            told.raise(bytes::Told::damage, "brenix:Device:dataLost",
+                       "Radio " + radio.name() + " may not have sent all that it took: " +
+                           SoapySDR_errToStr(status) + ".");
         } else if ((flags & SOAPY_SDR_END_BURST) != 0) {
             hasEnded = true;
         }
@@ -197,7 +196,7 @@ void Transmitter::tellDry(std::chrono::nanoseconds ago)
     if (untimed > 0) {
         message += "; it did not tell how long " + std::to_string(untimed) + " of them were";
     }
-    host.raise("error", "brenix:Device:dataLost", (message + ".").c_str());
+    told.raise(bytes::Told::silence, "brenix:Device:dataLost", message + ".");
 }
 
 /// Waits until all is sent.

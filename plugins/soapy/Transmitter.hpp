@@ -3,6 +3,7 @@
 #define BRENIX_PLUGINS_SOAPY_TRANSMITTER_HPP
 
 #include "Radio.hpp"
+#include "Told.hpp"
 
 #include <chrono>
 #include <cstdint>
@@ -67,6 +68,7 @@ private:
     std::uint64_t silence = 0;   ///< counts
     std::uint64_t untimed = 0;   ///< underflows of which nobody knows how long they were
     std::uint64_t wrongType = 0; ///< elements
+    bytes::Told told;
 };
 
 } // namespace soapy
