@@ -193,12 +193,15 @@ void Radio::start()
 void Radio::stop() noexcept
 {
     if (auto* const used = std::exchange(stream, nullptr)) {
-        try {
-            device->deactivateStream(used);
-            device->closeStream(used);
-        } catch (const std::exception&) { // it is gone
-            return;
-        }
+        const auto attempt = [&](auto call) {
+            try {
+                call();
+            } catch (const std::exception&) { // it is gone
+                return;
+            }
+        };
+        attempt([&] { device->deactivateStream(used); });
+        attempt([&] { device->closeStream(used); });
     }
 }
 

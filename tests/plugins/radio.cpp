@@ -94,6 +94,9 @@ public:
                                   const std::vector<size_t>& /*channels*/,
                                   const SoapySDR::Kwargs& /*arguments*/) override
     {
+        if (++streams > 2) {
+            throw std::runtime_error("it has no more streams");
+        }
         isShort = format == "CS16";
         script[direction] = value(direction == SOAPY_SDR_RX ? "rx" : "tx");
         place[direction] = 0;
@@ -102,7 +105,7 @@ public:
         }
         return reinterpret_cast<SoapySDR::Stream*>(this);
     }
-    void closeStream(SoapySDR::Stream* /*stream*/) override {}
+    void closeStream(SoapySDR::Stream* /*stream*/) override { --streams; }
     size_t getStreamMTU(SoapySDR::Stream* /*stream*/) const override { return 4096; }
     int activateStream(SoapySDR::Stream* /*stream*/, int /*flags*/, long long /*time*/,
                        size_t /*count*/) override
@@ -111,7 +114,7 @@ public:
     }
     int deactivateStream(SoapySDR::Stream* /*stream*/, int /*flags*/, long long /*time*/) override
     {
-        return 0;
+        return value("serial") == "2" ? throw std::runtime_error("it is not active") : 0;
     }
 
     int readStream(SoapySDR::Stream* /*stream*/, void* const* buffers, size_t count, int& flags,
@@ -252,6 +255,7 @@ private:
     char dry = ' ';
     char late = ' ';
     bool hasEnded = false;
+    std::atomic<int> streams = 0; ///< that are not closed
     std::mutex mutex;
     std::deque<char> loop; ///< what was transmitted, which another thread may receive
 };
