@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <filesystem>
 #include <fstream>
 #include <stdexcept>
 #include <system_error>
@@ -14,6 +15,11 @@ namespace hdf5
 
 Replay::Replay(const std::string& fileName, const std::string& datasetName) : name(fileName)
 {
+    std::error_code unknown; // then opening tells it
+    const auto status = std::filesystem::status(fileName, unknown);
+    if (exists(status) && !is_regular_file(status)) { // to open a pipe waits for its writer
+        throw std::runtime_error("Could not open " + name + ": it is no regular file");
+    }
     if (!std::ifstream(fileName)) {
         throw std::runtime_error("Could not open " + name + ": " +
                                  std::generic_category().message(errno));
