@@ -1,6 +1,7 @@
 #include "OpenFile.hpp"
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -219,8 +220,14 @@ bool OpenFile::lengthen(std::uint64_t needed)
     if (needed <= length) {
         return true;
     }
+    rlimit most{};
+    getrlimit(RLIMIT_FSIZE, &most);
     for (const std::uint64_t newLength :
-         {needed + ahead, needed}) { // it may not be allowed to be that long
+         {needed + ahead, needed}) {     // it may not be allowed to be that long
+        if (newLength > most.rlim_cur) { // the system would answer with a signal
+            errno = EFBIG;
+            continue;
+        }
         if (::ftruncate(file, static_cast<off_t>(newLength)) == 0) {
             length = newLength;
             return !hasSuperblock || putSuperblock();
