@@ -81,10 +81,7 @@ public:
             format.channels = recording.channels();
             counts = recording.counts();
             gapCount = recording.gaps().size();
-            if (first > counts) {
-                Options::fail("First", "must be at most " + std::to_string(counts) +
-                                           ", the counts of " + fileName);
-            }
+            checkFirst(recording);
             if (isPaced && !(notes.rate > 0)) {
                 Options::fail("Pace", "needs SampleRate: " + fileName + " does not tell it");
             }
@@ -114,7 +111,13 @@ public:
             host->updateProperty(makeScalar("Gaps", static_cast<unsigned long>(gaps)));
             isRecording = true;
         } else {
-            replay.emplace(fileName, format.dataset);
+            Replay recording(fileName, format.dataset);
+            if (&recording.type() != format.type || recording.channels() != format.channels) {
+                throw std::runtime_error("Could not open " + fileName + ": its dataset " +
+                                         format.dataset + " has changed since init");
+            }
+            checkFirst(recording);
+            replay.emplace(std::move(recording));
         }
     }
 
@@ -197,6 +200,14 @@ public:
     }
 
 private:
+    void checkFirst(const Replay& recording) const
+    {
+        if (first > recording.counts()) {
+            Options::fail("First", "must be at most " + std::to_string(recording.counts()) +
+                                       ", the counts of " + fileName);
+        }
+    }
+
     void readFormat(Options& options)
     {
         format.type = &bytes::readElementType(options, "double");

@@ -385,6 +385,21 @@ TEST_F(Hdf5Test, WhatIsWrongIsSaid)
         EXPECT_EQ(channel.error(), unexpected + error);
     }
 
+    const auto expectChanged = [this](Option first, const char* made, const std::string& error) {
+        python("f.create_dataset('data', data=n.zeros(3))", "w");
+        Channel reader("hdf5");
+        ASSERT_EQ(reader.init({{"FileName", file}, first}), 1) << reader.error();
+        python(made, "w");
+        EXPECT_EQ(reader.open(), 0) << made;
+        EXPECT_EQ(reader.error(), unexpected + error);
+    };
+    const std::string other =
+        "Could not open " + file + ": its dataset data has changed since init";
+    expectChanged({"First", 3}, "f['data'] = n.zeros(2)",
+                  "Option First: must be at most 2, the counts of " + file + ".");
+    expectChanged({"First", 0}, "f['data'] = n.zeros((3, 2))", other);
+    expectChanged({"First", 0}, "f['data'] = n.zeros(3, dtype='<f4')", other);
+
     Channel writer("hdf5");
     record(writer, {"Channels", 2});
     Channel second("hdf5");
