@@ -207,10 +207,10 @@ void Pipeline::look()
             const Owned<GError> ownedError(error);
             const Owned<char> ownedDetail(detail);
             problem = std::string(GST_MESSAGE_SRC_NAME(message.get())) + ": " + error->message;
-            if (detail != nullptr) { // its last line says what the system said
-                const std::string all = detail;
-                const auto last = all.find_last_of('\n');
-                problem += " (" + all.substr(last == std::string::npos ? 0 : last + 1) + ")";
+            const std::string all = detail == nullptr ? "" : detail;
+            // The first line of the detail is a place in the source, the last what the system said.
+            if (const auto last = all.find_last_of('\n'); last != std::string::npos) {
+                problem += " (" + all.substr(last + 1) + ")";
             }
         }
     }
