@@ -187,6 +187,12 @@ TEST_F(GstreamerTest, ErrorsNameTheirElement)
     EXPECT_EQ(missing.error(), unexpected + "disk: Resource not found. (No such file "
                                             "\"/nonexistent/a\")");
 
+    Channel silent("gstreamer"); // without its uri, this element fails with no message
+    EXPECT_EQ(silent.init({{"Pipeline", "uridecodebin3"}}), 1);
+    EXPECT_EQ(silent.open(), 0);
+    EXPECT_EQ(silent.error(),
+              unexpected + "An element refused to start and told no reason: uridecodebin3");
+
     Channel failing("gstreamer");
     failing.start({{"Pipeline", "audiotestsrc ! identity name=late error-after=3"}});
     EXPECT_EQ(failing.asyncError(),

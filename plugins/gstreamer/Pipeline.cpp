@@ -16,19 +16,18 @@ namespace
 constexpr const char* endName = "brenix-end";
 
 /// A change of state on a thread of its own, for it may wait for a device or for another machine, even for ever.
-/// The flag is set when it is done.
-std::shared_ptr<std::atomic<bool>> change(GstElement* pipeline, GstState state,
-                                          const std::shared_ptr<Signal>& signal)
+std::shared_ptr<std::atomic<Change>> change(GstElement* pipeline, GstState state,
+                                            const std::shared_ptr<Signal>& signal)
 {
-    auto done = std::make_shared<std::atomic<bool>>(false);
-    std::thread([done, signal, state,
+    auto progress = std::make_shared<std::atomic<Change>>(Change::underWay);
+    std::thread([progress, signal, state,
                  held = Owned<GstElement>(GST_ELEMENT(gst_object_ref(pipeline)))]() mutable {
-        gst_element_set_state(held.get(), state);
+        const auto result = gst_element_set_state(held.get(), state);
         held.reset();
-        *done = true;
+        *progress = result == GST_STATE_CHANGE_FAILURE ? Change::failed : Change::done;
         signal->set();
     }).detach();
-    return done;
+    return progress;
 }
 
 void set(gpointer data)
@@ -100,8 +99,8 @@ Format formatOf(const GstCaps* caps)
     return format;
 }
 
-Pipeline::Pipeline(const std::string& description, const std::string& caps, bool writes)
-    : isWritten(writes)
+Pipeline::Pipeline(const std::string& itsDescription, const std::string& caps, bool writes)
+    : description(itsDescription), isWritten(writes)
 {
     const std::string end = endName;
     const std::string text = writes ? "appsrc name=" + end + " ! " + description
@@ -156,17 +155,18 @@ void Pipeline::start()
 {
     isRunning = true;
     const auto end = std::chrono::steady_clock::now() + patience;
-    const auto done = change(pipeline.get(), GST_STATE_PLAYING, told);
+    starting = change(pipeline.get(), GST_STATE_PLAYING, told);
     for (;;) {
         look();
         if (told->hasData) { // what fails from here on fails behind what came
             return;
         }
+        const bool isOver = *starting != Change::underWay;
         check();
         // A pipeline that is written to has to wait for something written.
         const bool isDone =
-            *done && (isWritten || gst_element_get_state(pipeline.get(), nullptr, nullptr, 0) !=
-                                       GST_STATE_CHANGE_ASYNC);
+            isOver && (isWritten || gst_element_get_state(pipeline.get(), nullptr, nullptr, 0) !=
+                                        GST_STATE_CHANGE_ASYNC);
         if (isDone || ended || std::chrono::steady_clock::now() >= end) {
             return;
         }
@@ -178,11 +178,12 @@ bool Pipeline::stop()
 {
     isRunning = false;
     const auto end = std::chrono::steady_clock::now() + patience;
-    const auto done = change(pipeline.get(), GST_STATE_NULL, told);
-    while (!*done && std::chrono::steady_clock::now() < end) {
+    const auto stopping = change(pipeline.get(), GST_STATE_NULL, told);
+    const auto isDone = [&] { return *stopping != Change::underWay; };
+    while (!isDone() && std::chrono::steady_clock::now() < end) {
         told->wait(end);
     }
-    if (!*done) { // its thread has the last reference, and releases it if it ever can
+    if (!isDone()) { // its thread has the last reference, and releases it if it ever can
         ours.reset();
         pipeline.reset();
         return false;
@@ -218,7 +219,11 @@ void Pipeline::look()
 
 void Pipeline::check()
 {
+    const bool hasFailed = *starting == Change::failed; // before the look for what it told
     look();
+    if (hasFailed && problem.empty()) {
+        problem = "An element refused to start and told no reason: " + description;
+    }
     if (!problem.empty()) {
         throw std::runtime_error(problem);
     }

@@ -76,6 +76,9 @@ private:
     bool isSet = false;
 };
 
+/// How far a change of state is.
+enum class Change { underWay, done, failed };
+
 class Pipeline
 {
 public:
@@ -91,7 +94,7 @@ public:
     /// Stops it. Returns false where it has not stopped in time, and is left behind.
     bool stop();
 
-    /// Throws the error of an element, if there was one.
+    /// Throws the error of an element, if there was one, or of one that failed to start. Not before start().
     void check();
 
     /// Whether the end of the stream has come to all sinks. Looks at messages as check() does.
@@ -104,10 +107,12 @@ public:
 private:
     void look();
 
+    const std::string description;
     const bool isWritten;
     const std::shared_ptr<Signal> told = std::make_shared<Signal>();
     Owned<GstElement> pipeline;
-    Owned<GstElement> ours; ///< our end
+    Owned<GstElement> ours;                        ///< our end
+    std::shared_ptr<std::atomic<Change>> starting; ///< since start()
     std::string problem;
     bool ended = false;
     bool isRunning = false; ///< for which it was started
