@@ -193,6 +193,14 @@ TEST_F(GstreamerTest, ErrorsNameTheirElement)
     EXPECT_EQ(silent.error(),
               unexpected + "An element refused to start and told no reason: uridecodebin3");
 
+    for (int i = 0; i < 50; ++i) { // it fails while open waits
+        Channel early("gstreamer");
+        EXPECT_EQ(early.init({{"Pipeline", "audiotestsrc ! identity name=early error-after=1"}}),
+                  1);
+        EXPECT_EQ(early.open(), 0);
+        EXPECT_EQ(early.error(), unexpected + "early: Failed after iterations as requested.");
+    }
+
     Channel failing("gstreamer");
     failing.start({{"Pipeline", "audiotestsrc ! identity name=late error-after=3"}});
     EXPECT_EQ(failing.asyncError(),

@@ -35,10 +35,33 @@ void set(gpointer data)
     (*static_cast<std::shared_ptr<Signal>*>(data))->set();
 }
 
-GstBusSyncReply tell(GstBus* /*bus*/, GstMessage* /*message*/, gpointer data)
+/// What an error says, and the name of its element.
+std::string describe(GstMessage* message)
 {
-    set(data);
-    return GST_BUS_PASS;
+    GError* error = nullptr;
+    char* detail = nullptr;
+    gst_message_parse_error(message, &error, &detail);
+    const Owned<GError> ownedError(error);
+    const Owned<char> ownedDetail(detail);
+    const std::string text = std::string(GST_MESSAGE_SRC_NAME(message)) + ": " + error->message;
+    const std::string all = detail == nullptr ? "" : detail;
+    // The first line of the detail is a place in the source, the last what the system said.
+    const auto last = all.find_last_of('\n');
+    return last == std::string::npos ? text : text + " (" + all.substr(last + 1) + ")";
+}
+
+/// Reads a message itself: the bus would put it into its queue only after whoever waits was told.
+GstBusSyncReply tell(GstBus* /*bus*/, GstMessage* message, gpointer data)
+{
+    const Owned<GstMessage> owned(message);
+    Signal& signal = **static_cast<std::shared_ptr<Signal>*>(data);
+    if (GST_MESSAGE_TYPE(message) == GST_MESSAGE_EOS) {
+        signal.hasEnded = true;
+    } else if (GST_MESSAGE_TYPE(message) == GST_MESSAGE_ERROR) {
+        signal.fail(describe(message));
+    }
+    signal.set();
+    return GST_BUS_DROP;
 }
 
 void forget(gpointer data)
@@ -157,17 +180,16 @@ void Pipeline::start()
     const auto end = std::chrono::steady_clock::now() + patience;
     starting = change(pipeline.get(), GST_STATE_PLAYING, told);
     for (;;) {
-        look();
         if (told->hasData) { // what fails from here on fails behind what came
             return;
         }
         const bool isOver = *starting != Change::underWay;
         check();
         // A pipeline that is written to has to wait for something written.
-        const bool isDone =
-            isOver && (isWritten || gst_element_get_state(pipeline.get(), nullptr, nullptr, 0) !=
-                                        GST_STATE_CHANGE_ASYNC);
-        if (isDone || ended || std::chrono::steady_clock::now() >= end) {
+        const auto state = gst_element_get_state(pipeline.get(), nullptr, nullptr, 0);
+        const bool isUp = state != GST_STATE_CHANGE_ASYNC && state != GST_STATE_CHANGE_FAILURE;
+        const bool isDone = isOver && (isWritten || isUp); // what failed since is about to tell it
+        if (isDone || told->hasEnded || std::chrono::steady_clock::now() >= end) {
             return;
         }
         told->wait(end);
@@ -191,36 +213,10 @@ bool Pipeline::stop()
     return true;
 }
 
-void Pipeline::look()
-{
-    const Owned<GstBus> bus(gst_element_get_bus(pipeline.get()));
-    for (;;) {
-        const Owned<GstMessage> message(gst_bus_pop(bus.get()));
-        if (!message) {
-            return;
-        }
-        if (GST_MESSAGE_TYPE(message.get()) == GST_MESSAGE_EOS) {
-            ended = true;
-        } else if (GST_MESSAGE_TYPE(message.get()) == GST_MESSAGE_ERROR && problem.empty()) {
-            GError* error = nullptr;
-            char* detail = nullptr;
-            gst_message_parse_error(message.get(), &error, &detail);
-            const Owned<GError> ownedError(error);
-            const Owned<char> ownedDetail(detail);
-            problem = std::string(GST_MESSAGE_SRC_NAME(message.get())) + ": " + error->message;
-            const std::string all = detail == nullptr ? "" : detail;
-            // The first line of the detail is a place in the source, the last what the system said.
-            if (const auto last = all.find_last_of('\n'); last != std::string::npos) {
-                problem += " (" + all.substr(last + 1) + ")";
-            }
-        }
-    }
-}
-
 void Pipeline::check()
 {
     const bool hasFailed = *starting == Change::failed; // before the look for what it told
-    look();
+    std::string problem = told->problem();
     if (hasFailed && problem.empty()) {
         problem = "An element refused to start and told no reason: " + description;
     }
@@ -232,7 +228,7 @@ void Pipeline::check()
 bool Pipeline::hasEnded()
 {
     check();
-    return ended;
+    return told->hasEnded;
 }
 
 } // namespace gstreamer

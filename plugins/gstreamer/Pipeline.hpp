@@ -13,6 +13,7 @@
 #include <memory>
 #include <mutex>
 #include <string>
+#include <utility>
 
 namespace gstreamer
 {
@@ -60,6 +61,20 @@ public:
         changed.notify_all();
     }
 
+    /// Keeps what an element failed with first.
+    void fail(std::string text)
+    {
+        const std::lock_guard lock(mutex);
+        if (firstProblem.empty()) {
+            firstProblem = std::move(text);
+        }
+    }
+    std::string problem()
+    {
+        const std::lock_guard lock(mutex);
+        return firstProblem;
+    }
+
     /// Waits for set() since the last wait.
     void wait(std::chrono::steady_clock::time_point end)
     {
@@ -68,12 +83,14 @@ public:
         isSet = false;
     }
 
-    std::atomic<bool> hasData = false; ///< whether a buffer has come to our end
+    std::atomic<bool> hasData = false;  ///< whether a buffer has come to our end
+    std::atomic<bool> hasEnded = false; ///< whether the end of the stream has come to all sinks
 
 private:
     std::mutex mutex;
     std::condition_variable changed;
     bool isSet = false;
+    std::string firstProblem;
 };
 
 /// How far a change of state is.
@@ -97,7 +114,7 @@ public:
     /// Throws the error of an element, if there was one, or of one that failed to start. Not before start().
     void check();
 
-    /// Whether the end of the stream has come to all sinks. Looks at messages as check() does.
+    /// Whether the end of the stream has come to all sinks. Throws as check() does.
     bool hasEnded();
 
     GstElement* end() const { return ours.get(); }
@@ -105,17 +122,13 @@ public:
     Signal& signal() const { return *told; }
 
 private:
-    void look();
-
     const std::string description;
     const bool isWritten;
     const std::shared_ptr<Signal> told = std::make_shared<Signal>();
     Owned<GstElement> pipeline;
     Owned<GstElement> ours;                        ///< our end
     std::shared_ptr<std::atomic<Change>> starting; ///< since start()
-    std::string problem;
-    bool ended = false;
-    bool isRunning = false; ///< for which it was started
+    bool isRunning = false;                        ///< for which it was started
 };
 
 } // namespace gstreamer
