@@ -178,6 +178,16 @@ void Pipeline::start()
 {
     isRunning = true;
     const auto end = std::chrono::steady_clock::now() + patience;
+    try {
+        start(end);
+    } catch (...) {
+        stop(end); // the caller waits no longer for what fails
+        throw;
+    }
+}
+
+void Pipeline::start(std::chrono::steady_clock::time_point end)
+{
     starting = change(pipeline.get(), GST_STATE_PLAYING, told);
     for (;;) {
         if (told->hasData) { // what fails from here on fails behind what came
@@ -196,10 +206,9 @@ void Pipeline::start()
     }
 }
 
-bool Pipeline::stop()
+bool Pipeline::stop(std::chrono::steady_clock::time_point end)
 {
     isRunning = false;
-    const auto end = std::chrono::steady_clock::now() + patience;
     const auto stopping = change(pipeline.get(), GST_STATE_NULL, told);
     const auto isDone = [&] { return *stopping != Change::underWay; };
     while (!isDone() && std::chrono::steady_clock::now() < end) {

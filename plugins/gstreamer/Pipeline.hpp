@@ -105,11 +105,13 @@ public:
     Pipeline& operator=(const Pipeline&) = delete;
     ~Pipeline();
 
-    /// Starts it, and waits until that is done, or the patience has run out: it may go on meanwhile.
+    /// Starts it, and waits until that is done, or the patience has run out: it may go on meanwhile. Of one that
+    /// fails, the patience includes the stop.
     void start();
 
     /// Stops it. Returns false where it has not stopped in time, and is left behind.
-    bool stop();
+    bool stop(std::chrono::steady_clock::time_point end = std::chrono::steady_clock::now() +
+                                                          patience);
 
     /// Throws the error of an element, if there was one, or of one that failed to start. Not before start().
     void check();
@@ -122,6 +124,8 @@ public:
     Signal& signal() const { return *told; }
 
 private:
+    void start(std::chrono::steady_clock::time_point end);
+
     const std::string description;
     const bool isWritten;
     const std::shared_ptr<Signal> told = std::make_shared<Signal>();
