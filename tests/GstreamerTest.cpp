@@ -1,8 +1,11 @@
 // The device gstreamer beside gst-launch-1.0 and sox.
 
 #include "Driver.hpp"
+#include "brenixcore/plugin/Inspect.hpp"
 
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 
 #include <cstdio>
 #include <cstdlib>
@@ -231,6 +234,20 @@ TEST_F(GstreamerTest, CloseDoesNotHang)
     const std::string error = slow.error(coderChannelGetLastAsyncError);
     EXPECT_NE(error.find("CloseTimeout"), std::string::npos) << error;
     EXPECT_NE(error.find(" elements were not taken."), std::string::npos) << error;
+}
+
+TEST_F(GstreamerTest, FindDoesNotHang)
+{
+    sockaddr_un address{AF_UNIX, {}};
+    ASSERT_LT(file.size(), sizeof address.sun_path);
+    file.copy(address.sun_path, file.size());
+    const int silent = socket(AF_UNIX, SOCK_STREAM, 0); // until the program ends
+    ASSERT_EQ(bind(silent, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    ASSERT_EQ(listen(silent, 9), 0);
+    setenv("PULSE_SERVER", ("unix:" + file).c_str(), 1);
+    EXPECT_EQ(brenixcore::plugin::findDevices("gstreamer").message,
+              "GStreamer has not found out within 3 seconds what is there; a sound server may not "
+              "answer.");
 }
 
 } // namespace

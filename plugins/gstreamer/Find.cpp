@@ -2,10 +2,16 @@
 
 #include "Pipeline.hpp"
 
+#include <future>
+#include <stdexcept>
 #include <string>
+#include <thread>
+#include <utility>
 
 namespace gstreamer
 {
+
+using brenixcore::plugin::Found;
 
 namespace
 {
@@ -51,16 +57,14 @@ std::string describe(GstElement* element)
     return text;
 }
 
-} // namespace
-
-void findSources(std::vector<brenixcore::plugin::Found>& found)
+std::vector<Found> look()
 {
-    prepare();
+    std::vector<Found> found;
     const Owned<GstDeviceMonitor> monitor(gst_device_monitor_new());
     gst_device_monitor_add_filter(monitor.get(), "Audio/Source", nullptr);
     gst_device_monitor_add_filter(monitor.get(), "Video/Source", nullptr);
     if (gst_device_monitor_start(monitor.get()) == FALSE) {
-        return; // there is no provider that could see any
+        return found; // there is no provider that could see any
     }
     GList* const devices = gst_device_monitor_get_devices(monitor.get());
     for (const GList* node = devices; node != nullptr; node = node->next) {
@@ -77,6 +81,26 @@ void findSources(std::vector<brenixcore::plugin::Found>& found)
     }
     g_list_free_full(devices, gst_object_unref);
     gst_device_monitor_stop(monitor.get());
+    return found;
+}
+
+} // namespace
+
+void findSources(std::vector<Found>& found)
+{
+    prepare();
+    // On a thread of its own: a sound server that does not answer keeps it for a minute.
+    std::packaged_task<std::vector<Found>()> task(look);
+    auto looked = task.get_future();
+    std::thread(std::move(task)).detach();
+    if (looked.wait_for(patience) != std::future_status::ready) {
+        throw std::runtime_error("GStreamer has not found out within " +
+                                 std::to_string(patience.count()) +
+                                 " seconds what is there; a sound server may not answer.");
+    }
+    for (Found& source : looked.get()) {
+        found.push_back(std::move(source));
+    }
 }
 
 } // namespace gstreamer

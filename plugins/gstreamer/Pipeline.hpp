@@ -18,7 +18,7 @@
 namespace gstreamer
 {
 
-/// How long a pipeline may take to start, and to stop.
+/// How long a pipeline may take to start, and to stop, and a look for devices.
 constexpr std::chrono::seconds patience{3};
 
 struct Release {
