@@ -6,6 +6,7 @@
 #include <atomic>
 #include <stdexcept>
 #include <thread>
+#include <utility>
 
 namespace gstreamer
 {
@@ -122,8 +123,8 @@ Format formatOf(const GstCaps* caps)
     return format;
 }
 
-Pipeline::Pipeline(const std::string& itsDescription, const std::string& caps, bool writes)
-    : description(itsDescription), isWritten(writes)
+Pipeline::Pipeline(std::string itsDescription, const std::string& caps, bool writes)
+    : description(std::move(itsDescription)), isWritten(writes)
 {
     const std::string end = endName;
     const std::string text = writes ? "appsrc name=" + end + " ! " + description

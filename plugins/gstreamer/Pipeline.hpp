@@ -100,7 +100,7 @@ class Pipeline
 {
 public:
     /// Makes the elements. Throws std::invalid_argument with what is wrong in the description.
-    Pipeline(const std::string& description, const std::string& caps, bool writes);
+    Pipeline(std::string description, const std::string& caps, bool writes);
     Pipeline(const Pipeline&) = delete;
     Pipeline& operator=(const Pipeline&) = delete;
     ~Pipeline();
