@@ -120,9 +120,10 @@ TEST(SoapyTest, WhatIsReceivedHasItsTimeAndWhatIsLostIsToldToTheCount)
             expectBlocks<std::int16_t>(channel, last, arguments != "rx=nnn"s,
                                        isAhead ? 100'000'000'000 : 0); // of its clock
         }
-        Channel::waitUntil([&] { // it is told behind the packet that ends the gap
-            return channel.property<std::uint64_t>("LostCounts", "uint64") == lost &&
-                   (lost == 0 || channel.asyncError().find(error) != std::string::npos);
+        // It is told behind the packet that ends the gap.
+        Channel::waitUntil([&, sum = lost, text = error] {
+            return channel.property<std::uint64_t>("LostCounts", "uint64") == sum &&
+                   (sum == 0 || channel.asyncError().find(text) != std::string::npos);
         });
         EXPECT_EQ(channel.close(), 1);
     }
