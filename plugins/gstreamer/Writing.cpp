@@ -26,7 +26,8 @@ void Writing::run()
     try {
         write();
     } catch (const std::exception& failure) {
-        const std::uint64_t lost = left() + discardOutput(streams);
+        const std::uint64_t lost =
+            dropped + rest.size() / format.type->size + left() + discardOutput(streams);
         throw std::runtime_error(
             std::string(failure.what()) +
             (lost > 0 ? " At least " + std::to_string(lost) + " elements were not taken." : "") +
@@ -100,10 +101,9 @@ void Writing::append(std::span<unsigned char> elements)
             gst_util_uint64_scale(frames, GST_SECOND, rate) - GST_BUFFER_PTS(buffer);
     }
     if (gst_app_src_push_buffer(GST_APP_SRC(pipeline.end()), buffer) != GST_FLOW_OK) {
+        dropped = whole / format.type->size;
         pipeline.check(); // why, if it tells
-        throw std::runtime_error("The pipeline takes nothing more, and " +
-                                 std::to_string(whole / format.type->size) +
-                                 " elements were lost on their way to it.");
+        throw std::runtime_error("The pipeline takes nothing more.");
     }
 }
 
@@ -118,9 +118,9 @@ void Writing::end()
         }
         pipeline.signal().wait(steady_clock::now() + std::chrono::milliseconds(100));
     }
-    if (!rest.empty()) {
+    if (const auto torn = std::exchange(rest, {}); !torn.empty()) {
         throw std::runtime_error("The last frame has " +
-                                 std::to_string(rest.size() / format.type->size) + " of " +
+                                 std::to_string(torn.size() / format.type->size) + " of " +
                                  std::to_string(format.channels) + " samples and was not written.");
     }
 }

@@ -41,6 +41,7 @@ private:
 
     std::vector<unsigned char> rest; ///< of a frame that has not all of its samples
     std::uint64_t frames = 0;
+    std::uint64_t dropped = 0; ///< elements that the pipeline refused
     std::uint64_t refused = 0; ///< counts of another type
     std::string besides;       ///< a sentence that tells of them
     std::uint64_t lastLeft = 0;
