@@ -34,15 +34,15 @@ std::string describe(GstElement* element)
     guint count = 0;
     GParamSpec** const list = g_object_class_list_properties(G_OBJECT_GET_CLASS(element), &count);
     for (guint i = 0; i < count; ++i) {
-        const GParamSpec* const spec = list[i];
-        const std::string name = spec->name;
-        if ((spec->flags & G_PARAM_READWRITE) != G_PARAM_READWRITE || name == "name" ||
+        const GParamSpec* const parameter = list[i];
+        const std::string name = parameter->name;
+        if ((parameter->flags & G_PARAM_READWRITE) != G_PARAM_READWRITE || name == "name" ||
             name == "parent") {
             continue;
         }
         GValue value = G_VALUE_INIT;
-        g_value_init(&value, spec->value_type);
-        g_object_get_property(G_OBJECT(element), spec->name, &value);
+        g_value_init(&value, parameter->value_type);
+        g_object_get_property(G_OBJECT(element), parameter->name, &value);
         if (g_param_value_defaults(list[i], &value) == FALSE) {
             const Owned<char> written(gst_value_serialize(&value));
             if (G_VALUE_HOLDS_STRING(&value) && g_value_get_string(&value) != nullptr) {

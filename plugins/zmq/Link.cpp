@@ -146,10 +146,6 @@ void Link::connect()
 
 bool Link::wait(WakeUp& wakeUp, int events, milliseconds time, bool isEmpty)
 {
-    const auto now = Clock::now();
-    const auto atMost = [&](Clock::time_point when) {
-        time = std::clamp(std::chrono::ceil<milliseconds>(when - now), milliseconds(0), time);
-    };
     std::optional<Clock::time_point> next;
     if (!refusals.isEmpty()) {
         next = refusals.getNextTelling();
@@ -158,7 +154,8 @@ bool Link::wait(WakeUp& wakeUp, int events, milliseconds time, bool isEmpty)
         next = std::min(next.value_or(*nextConnect), *nextConnect);
     }
     if (next) {
-        atMost(*next);
+        time = std::clamp(std::chrono::ceil<milliseconds>(*next - Clock::now()), milliseconds(0),
+                          time);
     }
     // Not zmq_poll(), which asks the system four times more often.
     std::array<pollfd, 4> places = {pollfd{wakeUp.getHandle(), POLLIN, 0},
